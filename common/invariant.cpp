@@ -1,0 +1,12 @@
+#include "common/invariant.h"
+
+#include <cstdlib>
+
+#include "common/output.h"
+
+void require(bool holds, const invariant &broken) {
+  if (holds) return;
+  complain<"Assertion failed: (%s), function %s, file %s, line %d.\n">(broken.expression, broken.function,
+                                                                       broken.file, broken.line);
+  std::abort();
+}

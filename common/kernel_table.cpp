@@ -1,0 +1,52 @@
+#include "common/kernel_table.h"
+
+#include <cerrno>
+#include <cstring>
+
+#include "common/output.h"
+#include "platform/sysctl.h"
+
+namespace {
+
+// The ENOMEM failure that ends a fetch, counted over size queries and reads together.
+constexpr int last_retry = 11;
+
+}  // namespace
+
+int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const void *new_value,
+                 std::size_t new_length) {
+  *buffer = nullptr;
+  int retries = 0;
+  for (;;) {
+    if (sysctlbyname(name, nullptr, length, new_value, new_length) != 0) {
+      const int error = errno;
+      if (error == ENOMEM && ++retries < last_retry) continue;
+      complain<"sysctl for len failed, %s\n">(strerror(error));
+      return error;
+    }
+    if (*length == 0) return 0;
+    void *block = std::malloc(*length);
+    if (!block) {
+      complain<"sysctl malloc failed\n">();
+      return ENOMEM;
+    }
+    if (sysctlbyname(name, block, length, new_value, new_length) == 0) {
+      *buffer = block;
+      return 0;
+    }
+    const int error = errno;
+    std::free(block);
+    if (error == ENOMEM && ++retries < last_retry) continue;
+    complain<"sysctl for buf failed, %s\n">(strerror(error));
+    return error;
+  }
+}
+
+int kernel_table::fetch(const char *name) {
+  void *buffer = nullptr;
+  length_ = 0;
+  const int error = sysctl_fetch(name, &buffer, &length_, nullptr, 0);
+  buffer_.reset(static_cast<std::byte *>(buffer));
+  if (error) length_ = 0;
+  return error;
+}

@@ -1,0 +1,29 @@
+#include "common/memory.h"
+
+#include <new>
+
+#include "common/output.h"
+
+namespace {
+
+[[noreturn]] void end_without_memory() {
+  complain<"malloc failed">();
+  std::exit(exit_status::out_of_memory);
+}
+
+}  // namespace
+
+void *xmalloc(std::size_t size) {
+  void *block = std::malloc(size ? size : 1);
+  if (!block) end_without_memory();
+  return block;
+}
+
+void *xrealloc(void *block, std::size_t size) {
+  void *resized = std::realloc(block, size ? size : 1);
+  if (resized) return resized;
+  complain<"realloc failed">();
+  std::exit(exit_status::out_of_memory);
+}
+
+void make_new_fail_fast() { std::set_new_handler(end_without_memory); }

@@ -1,0 +1,186 @@
+#include "common/output.h"
+
+#include <fcntl.h>
+#include <limits.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+
+#include "platform/descriptor.h"
+
+namespace {
+
+char report_storage[output::buffer_size];
+char diagnostics_storage[4 * 1024];
+
+// Holds SIGINT back for its lifetime.
+class interrupt_hold {
+ public:
+  interrupt_hold() {
+    sigset_t interrupt;
+    sigemptyset(&interrupt);
+    sigaddset(&interrupt, SIGINT);
+    sigprocmask(SIG_BLOCK, &interrupt, &before_);
+  }
+  ~interrupt_hold() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
+  interrupt_hold(const interrupt_hold &) = delete;
+  interrupt_hold &operator=(const interrupt_hold &) = delete;
+
+  // The signals that were held back before.
+  const sigset_t &before() const { return before_; }
+
+ private:
+  sigset_t before_;
+};
+
+// Waits until `fd` takes bytes, or for `timeout`, with the signals of `held` held back meanwhile. A signal that is
+// let through runs its handler here.
+bool wait_for_room(int fd, const timespec *timeout, const sigset_t *held) {
+  pollfd room{.fd = fd, .events = POLLOUT, .revents = 0};
+  return ppoll(&room, 1, timeout, held) > 0;
+}
+
+timespec time_left(const timespec &deadline) {
+  timespec now;
+  clock_gettime(CLOCK_MONOTONIC, &now);
+  timespec left{.tv_sec = deadline.tv_sec - now.tv_sec, .tv_nsec = deadline.tv_nsec - now.tv_nsec};
+  if (left.tv_nsec < 0) {
+    left.tv_nsec += 1'000'000'000;
+    --left.tv_sec;
+  }
+  return left.tv_sec < 0 ? timespec{} : left;
+}
+
+// The signal's own end where a reader has gone, also when the caller had it ignored or held back.
+void end_by_broken_pipe() {
+  signal(SIGPIPE, SIG_DFL);
+  sigset_t broken_pipe;
+  sigemptyset(&broken_pipe);
+  sigaddset(&broken_pipe, SIGPIPE);
+  sigprocmask(SIG_UNBLOCK, &broken_pipe, nullptr);
+  raise(SIGPIPE);
+}
+
+}  // namespace
+
+constinit output report{report_storage, output::failure::fatal};
+constinit output diagnostics{diagnostics_storage, output::failure::ignored};
+
+void output::redirect(int fd) {
+  flush();
+  dup2(fd, fd_);
+  ::close(fd);
+  attach(fd_);
+}
+
+void output::attach(int fd) {
+  fd_ = fd;
+  struct stat status {};
+  fstat(fd, &status);
+  is_terminal_ = S_ISCHR(status.st_mode) && isatty(fd);
+  is_pipe_ = S_ISFIFO(status.st_mode);
+  const bool has_reader = is_terminal_ || is_pipe_ || S_ISSOCK(status.st_mode);
+  may_block_ = has_reader && !platform::make_writes_nonblocking(fd);
+}
+
+void output::close() {
+  flush();
+  if (fd_ < 0) return;
+  const int fd = fd_;
+  fd_ = -1;
+  if (::close(fd) < 0 && errno != EINTR) fail(errno);
+}
+
+// How much the next write may carry of the bytes up to `upto`.
+std::size_t output::next_piece(const char *upto) const {
+  const auto all = static_cast<std::size_t>(upto - begin_);
+  if (!is_pipe_ || all <= PIPE_BUF) return all;
+  const auto *last = static_cast<const char *>(memrchr(begin_, '\n', PIPE_BUF));
+  return last ? static_cast<std::size_t>(last + 1 - begin_) : PIPE_BUF;
+}
+
+// Writes the bytes up to `upto`, lines_end_ or end_, and moves what follows to the buffer's front.
+void output::drain(const char *upto) {
+  int error = 0;
+  {
+    const interrupt_hold hold;
+    while (begin_ < upto && !error) {
+      if (may_block_) wait_for_room(fd_, nullptr, &hold.before());
+      const ssize_t written = write(fd_, begin_, next_piece(upto));
+      if (written > 0) {
+        begin_ += written;
+      } else if (written == 0) {
+        error = EIO;
+      } else if (errno == EAGAIN) {
+        wait_for_room(fd_, nullptr, &hold.before());
+      } else if (errno != EINTR) {
+        error = errno;
+      }
+    }
+    if (error) begin_ = end_;
+    const auto rest = static_cast<std::size_t>(end_ - begin_);
+    std::memmove(storage_, begin_, rest);
+    begin_ = storage_;
+    end_ = storage_ + rest;
+    lines_end_.store(storage_, std::memory_order_release);
+  }
+  if (error) fail(error);
+}
+
+// Makes room for a row that goes on after the whole lines are out, if need be in a larger buffer.
+void output::make_room(std::size_t size) {
+  drain(lines_end_.load(std::memory_order_relaxed));
+  if (size <= static_cast<std::size_t>(limit_ - end_)) return;
+  const auto row = static_cast<std::size_t>(end_ - begin_);
+  const std::size_t capacity = 2 * (row + size);
+  std::unique_ptr<char[]> larger(new char[capacity + format::slack]);
+  std::memcpy(larger.get(), begin_, row);
+  const interrupt_hold hold;
+  grown_ = std::move(larger);
+  storage_ = begin_ = grown_.get();
+  end_ = storage_ + row;
+  limit_ = storage_ + capacity;
+  lines_end_.store(storage_, std::memory_order_release);
+}
+
+void output::fail(int error) {
+  if (on_failure_ == failure::ignored) return;
+  if (error == EPIPE) end_by_broken_pipe();
+  complain<"write error: %s\n">(strerror(error));
+  std::exit(exit_status::output_failed);
+}
+
+int output::abandon() noexcept {
+  timespec deadline;
+  clock_gettime(CLOCK_MONOTONIC, &deadline);
+  deadline.tv_nsec += 100'000'000;
+  const char *const upto = lines_end_.load(std::memory_order_acquire);
+  bool wait = may_block_;
+  while (begin_ < upto) {
+    const timespec left = time_left(deadline);
+    if (wait && !wait_for_room(fd_, &left, nullptr)) return 0;
+    const ssize_t written = write(fd_, begin_, next_piece(upto));
+    if (written > 0) {
+      begin_ += written;
+    } else if (written < 0 && errno == EAGAIN) {
+      wait = true;
+    } else if (written == 0 || errno != EINTR) {
+      return written == 0 ? EIO : errno;
+    }
+  }
+  return 0;
+}
+
+void attach_standard_outputs() {
+  for (int fd = STDIN_FILENO; fd <= STDERR_FILENO; ++fd) {
+    if (fcntl(fd, F_GETFD) < 0 && errno == EBADF) open("/dev/null", O_RDONLY);
+  }
+  report.attach(STDOUT_FILENO);
+  diagnostics.attach(STDERR_FILENO);
+}

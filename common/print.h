@@ -1,0 +1,368 @@
+// Printing by printf formats that are read when the program is compiled.
+//
+//   print<"\tPort[%2u] %-22s (fd %d)\t">(port, name, fd);
+//
+// gives the bytes of printf for the same format. The number and types of the arguments are checked by the
+// compiler; what is left for run time is one check for room and straight-line appends into a buffer. Nothing is
+// allocated and no locale is consulted.
+//
+// Conversions: %d (signed), %u %x %o (unsigned), %c (char), %s (text), %f %g (double) and %%. Flags "-" and "0",
+// width and precision as numbers. 64-bit integers need "ll" or "q", all others must not have it, as in C.
+//
+// Texts are whatever converts to std::string_view, and any type with a member `printable()` that returns
+// format::text_view or format::small_text. Texts marked foreign come from outside the program (the kernel, a
+// process, a name service): where the reader is a terminal, each of their control characters (C0, DEL, C1)
+// shows as "?", one for one, so that a process name cannot drive the terminal.
+
+#ifndef TARVELCTL_COMMON_PRINT_H
+#define TARVELCTL_COMMON_PRINT_H
+
+#include <algorithm>
+#include <array>
+#include <bit>
+#include <charconv>
+#include <concepts>
+#include <cstdint>
+#include <cstring>
+#include <string_view>
+#include <type_traits>
+#include <utility>
+
+namespace format {
+
+// A format text as a template argument.
+template <std::size_t N>
+struct text {
+  char chars[N];
+  consteval text(const char (&source)[N]) { std::copy_n(source, N, chars); }
+};
+
+inline constexpr std::size_t no_precision = SIZE_MAX;
+
+// One conversion, with the literal text in front of it.
+struct piece {
+  std::size_t literal = 0;  // offset into parsed_text::literals
+  std::size_t literal_size = 0;
+  std::size_t width = 0;
+  std::size_t precision = no_precision;
+  char kind = 0;  // the conversion's letter; 0 for the literal text after the last one
+  bool left = false;
+  bool zero = false;
+  bool wide = false;  // "ll" or "q": a 64-bit argument
+};
+
+template <std::size_t N>
+struct parsed_text {
+  std::array<char, N> literals{};  // all literal text, with %% reduced to %
+  std::size_t literals_size = 0;
+  std::array<piece, N> pieces{};  // one per conversion, then the tail
+  std::size_t conversions = 0;
+};
+
+// Never defined: a call to it while a format is read stops the compiler here, with the reason in the call.
+void malformed_format(const char *reason);
+
+template <std::size_t N>
+consteval parsed_text<N> parse(const text<N> &format) {
+  parsed_text<N> parsed;
+  piece current;
+  const char *at = format.chars;
+  const auto number = [&at] {
+    std::size_t value = 0;
+    while (*at >= '0' && *at <= '9') value = value * 10 + static_cast<std::size_t>(*at++ - '0');
+    return value;
+  };
+  while (*at) {
+    if (*at != '%' || *++at == '%') {
+      parsed.literals[parsed.literals_size++] = *at++;
+      ++current.literal_size;
+      continue;
+    }
+    for (; *at == '-' || *at == '0'; ++at) (*at == '-' ? current.left : current.zero) = true;
+    current.width = number();
+    if (*at == '.') {
+      ++at;
+      current.precision = number();
+    }
+    if (*at == 'q') {
+      current.wide = true;
+      ++at;
+    } else if (*at == 'l') {
+      if (*++at != 'l') malformed_format("a single l is not portable");
+      current.wide = true;
+      ++at;
+    }
+    if (*at == 0 || std::string_view("duxocsfg").find(*at) == std::string_view::npos) {
+      malformed_format("unknown conversion");
+    }
+    current.kind = *at++;
+    parsed.pieces[parsed.conversions++] = current;
+    current = {};
+    current.literal = parsed.literals_size;
+  }
+  parsed.pieces[parsed.conversions] = current;
+  return parsed;
+}
+
+// A text to print. `data` need not be terminated.
+struct text_view {
+  const char *data;
+  std::size_t size;
+  bool foreign;
+};
+
+// A short text made for printing, with its storage.
+template <std::size_t Capacity>
+struct small_text {
+  char chars[Capacity];
+  std::size_t size = 0;
+  bool foreign = false;
+
+  std::string_view view() const { return {chars, size}; }
+};
+
+// Bytes that any step may write past what it appends; every sink's room() leaves as many.
+inline constexpr std::size_t slack = 32;
+
+inline char *put_blanks(char *to, std::size_t count) {
+  std::memset(to, ' ', slack);  // a constant size is two stores
+  if (count > slack) std::memset(to + slack, ' ', count - slack);
+  return to + count;
+}
+
+inline unsigned decimal_digits(std::uint64_t value) {
+  static constexpr auto powers = [] {
+    std::array<std::uint64_t, 20> table{};
+    std::uint64_t power = 1;
+    for (auto &entry : table) {
+      entry = power;
+      power *= 10;
+    }
+    return table;
+  }();
+  value |= 1;
+  const unsigned guess = static_cast<unsigned>(std::bit_width(value)) * 1233 >> 12;
+  return guess + (value >= powers[guess]);
+}
+
+// Writes exactly `digits` decimal digits of `value`.
+inline char *put_digits(char *to, std::uint64_t value, unsigned digits) {
+  static constexpr auto pairs = [] {
+    std::array<char, 200> table{};
+    for (std::size_t i = 0; i < 100; ++i) {
+      table[2 * i] = static_cast<char>('0' + i / 10);
+      table[2 * i + 1] = static_cast<char>('0' + i % 10);
+    }
+    return table;
+  }();
+  char *const end = to + digits;
+  char *at = end;
+  for (; at - to >= 2; value /= 100) {
+    at -= 2;
+    std::memcpy(at, &pairs[value % 100 * 2], 2);
+  }
+  if (at > to) *to = static_cast<char>('0' + value % 10);
+  return end;
+}
+
+// Longest text of a double in the conversions above: "%f" of the largest one, with six decimals.
+inline constexpr std::size_t double_size = 320;
+
+// As "%.2f". Multiplied by 100, a double below 2^53 is a 60-bit integer shifted right: the digits, and which way
+// to round, come from integer arithmetic. Ties are exact in binary and go to the even digit.
+inline char *put_hundredths(char *to, double value) {
+  const auto bits = std::bit_cast<std::uint64_t>(value);
+  const auto exponent = static_cast<unsigned>(bits >> 52 & 0x7ff);
+  constexpr unsigned integral = 1075;  // from this exponent on a double has no fraction bits
+  if (exponent >= integral) {
+    return std::to_chars(to, to + double_size, value, std::chars_format::fixed, 2).ptr;
+  }
+  const std::uint64_t mantissa = (bits & 0xfffffffffffff) | (exponent ? std::uint64_t{1} << 52 : 0);
+  const unsigned shift = integral - std::max(exponent, 1U);
+  std::uint64_t hundredths = 0;
+  if (shift < 64) {
+    const std::uint64_t scaled = mantissa * 100;
+    const std::uint64_t half = std::uint64_t{1} << (shift - 1);
+    const std::uint64_t rest = scaled & (2 * half - 1);
+    hundredths = scaled >> shift;
+    hundredths += rest > half || (rest == half && (hundredths & 1));
+  }
+  if (bits >> 63) *to++ = '-';
+  const std::uint64_t whole = hundredths / 100;
+  to = put_digits(to, whole, decimal_digits(whole));
+  *to++ = '.';
+  return put_digits(to, hundredths % 100, 2);
+}
+
+// Hides what a terminal would obey.
+inline void hide_controls(char *text, std::size_t size) {
+  for (char *end = text + size; text != end; ++text) {
+    const auto code = static_cast<unsigned char>(*text);
+    if (code < 0x20 || (code >= 0x7f && code < 0xa0)) *text = '?';
+  }
+}
+
+// What a conversion shows of a text.
+template <piece P>
+std::size_t shown_size(std::size_t size) {
+  if constexpr (P.precision == no_precision) return size;
+  return std::min(P.precision, size);
+}
+
+// The bytes that `piece` may need for an argument, beside its literal text.
+template <piece P, class T>
+std::size_t bound(const T &argument) {
+  if constexpr (P.kind == 's') {
+    return std::max(P.width, shown_size<P>(argument.size));
+  } else {
+    return std::max(P.width, std::floating_point<T> ? double_size : 24);
+  }
+}
+
+template <piece P>
+char *put_padded(char *to, const char *text, std::size_t size) {
+  const std::size_t padding = P.width > size ? P.width - size : 0;
+  if (!P.left && padding) to = put_blanks(to, padding);
+  if (size) std::memcpy(to, text, size);  // an empty text may have no address
+  to += size;
+  return P.left && padding ? put_blanks(to, padding) : to;
+}
+
+template <piece P>
+char *put_text(char *to, text_view text, bool guarded) {
+  const std::size_t size = shown_size<P>(text.size);
+  char *const end = put_padded<P>(to, text.data, size);
+  if (text.foreign && guarded) {
+    const std::size_t padding = P.width > size ? P.width - size : 0;
+    hide_controls(P.left ? to : to + padding, size);
+  }
+  return end;
+}
+
+template <piece P>
+char *put_decimal(char *to, std::uint64_t magnitude, bool negative) {
+  const unsigned digits = decimal_digits(magnitude);
+  const std::size_t size = digits + negative;
+  if constexpr (P.width == 0) {
+    if (negative) *to++ = '-';
+    return put_digits(to, magnitude, digits);
+  }
+  const std::size_t padding = P.width > size ? P.width - size : 0;
+  if (!P.left) to = put_blanks(to, padding);
+  if (negative) *to++ = '-';
+  to = put_digits(to, magnitude, digits);
+  return P.left ? put_blanks(to, padding) : to;
+}
+
+template <piece P, std::unsigned_integral T>
+char *put_power_of_two(char *to, T value) {
+  char digits[24];
+  const char *end = std::to_chars(digits, digits + sizeof digits, value, P.kind == 'x' ? 16 : 8).ptr;
+  const auto size = static_cast<std::size_t>(end - digits);
+  if (P.zero && P.width > size) {
+    std::memset(to, '0', P.width - size);
+    to += P.width - size;
+    std::memcpy(to, digits, size);
+    return to + size;
+  }
+  return put_padded<P>(to, digits, size);
+}
+
+template <piece P>
+char *put_double(char *to, double value) {
+  constexpr int precision = P.precision == no_precision ? 6 : static_cast<int>(P.precision);
+  char digits[double_size];
+  const char *end;
+  if constexpr (P.kind == 'f' && precision == 2) {
+    end = put_hundredths(digits, value);
+  } else {
+    constexpr auto style = P.kind == 'f' ? std::chars_format::fixed : std::chars_format::general;
+    end = std::to_chars(digits, digits + sizeof digits, value, style, precision).ptr;
+  }
+  return put_padded<P>(to, digits, static_cast<std::size_t>(end - digits));
+}
+
+// Appends one argument. `guarded`: the reader is a terminal.
+template <piece P, class T>
+char *put(char *to, const T &argument, bool guarded) {
+  if constexpr (P.kind == 's') {
+    if constexpr (std::same_as<T, text_view>) {
+      return put_text<P>(to, argument, guarded);
+    } else {
+      return put_text<P>(to, {argument.chars, argument.size, argument.foreign}, guarded);
+    }
+  } else if constexpr (P.kind == 'c') {
+    return put_padded<P>(to, &argument, 1);
+  } else if constexpr (P.kind == 'f' || P.kind == 'g') {
+    return put_double<P>(to, argument);
+  } else if constexpr (P.kind == 'd') {
+    const auto value = static_cast<std::int64_t>(argument);
+    const auto magnitude = static_cast<std::uint64_t>(value);
+    return put_decimal<P>(to, value < 0 ? 0 - magnitude : magnitude, value < 0);
+  } else if constexpr (P.kind == 'u') {
+    return put_decimal<P>(to, argument, false);
+  } else {
+    return put_power_of_two<P>(to, argument);
+  }
+}
+
+// The form in which an argument is handed to put(): numbers as they are, texts as views or small texts.
+template <class T>
+auto prepare(const T &argument) {
+  if constexpr (std::is_arithmetic_v<T>) {
+    return argument;
+  } else if constexpr (requires { argument.printable(); }) {
+    return argument.printable();
+  } else {
+    const std::string_view text = argument;
+    return text_view{text.data(), text.size(), false};
+  }
+}
+
+template <piece P, class T>
+consteval bool accepts() {
+  constexpr bool integer_width = P.wide ? sizeof(T) == 8 : sizeof(T) <= 4;
+  switch (P.kind) {
+    case 'd': return std::signed_integral<T> && integer_width && !P.zero && P.precision == no_precision;
+    case 'u': return std::unsigned_integral<T> && integer_width && !P.zero && P.precision == no_precision;
+    case 'x':
+    case 'o': return std::unsigned_integral<T> && integer_width && P.precision == no_precision;
+    case 'c': return std::same_as<T, char>;
+    case 'f':
+    case 'g': return std::floating_point<T> && !P.zero;
+    default: return !std::is_arithmetic_v<T> && !P.zero;
+  }
+}
+
+template <text F>
+inline constexpr auto parsed = parse(F);
+
+template <text F, std::size_t... I, class Sink, class... Args>
+void emit(std::index_sequence<I...>, Sink &sink, const Args &...args) {
+  constexpr const auto &format = parsed<F>;
+  constexpr auto literal = [](char *to, const piece &piece) {
+    std::memcpy(to, parsed<F>.literals.data() + piece.literal, piece.literal_size);
+    return to + piece.literal_size;
+  };
+  static_assert((accepts<format.pieces[I], Args>() && ...), "an argument does not fit its conversion");
+  char *to = sink.room((format.literals_size + ... + bound<format.pieces[I]>(args)));
+  [[maybe_unused]] const bool guarded = sink.is_terminal();
+  ((to = literal(to, format.pieces[I]), to = put<format.pieces[I]>(to, args, guarded)), ...);
+  to = literal(to, format.pieces[sizeof...(I)]);
+  constexpr bool ends_line = sizeof(F.chars) > 1 && F.chars[sizeof(F.chars) - 2] == '\n';
+  sink.commit(to, ends_line);
+}
+
+// Prints to a sink, an object with
+//   char *room(std::size_t n)        returns where to append; n + slack bytes may be written there
+//   void commit(char *end, bool)     takes what was appended up to `end`; true when a line ends there
+//   bool is_terminal() const         whether foreign texts must be guarded
+template <text F, class Sink, class... Args>
+void print_to(Sink &sink, const Args &...args) {
+  static_assert(parsed<F>.conversions == sizeof...(Args), "as many arguments as conversions");
+  emit<F>(std::index_sequence_for<Args...>{}, sink, prepare(args)...);
+}
+
+}  // namespace format
+
+#endif

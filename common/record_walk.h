@@ -1,0 +1,52 @@
+// Walking a table record by record: every bounds check of the decoders is here.
+
+#ifndef TARVELCTL_COMMON_RECORD_WALK_H
+#define TARVELCTL_COMMON_RECORD_WALK_H
+
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <span>
+#include <type_traits>
+
+// A position in a table, which never leaves it. A step that does not fit leaves the position where it is.
+class record_walk {
+ public:
+  explicit record_walk(std::span<const std::byte> table) : rest_(table) {}
+
+  bool at_end() const { return rest_.empty(); }
+  std::size_t remaining() const { return rest_.size(); }
+
+  // Copies the record here, which may lie at any address, and steps over it. False where too few bytes remain.
+  template <class Record>
+  bool take(Record &record) {
+    static_assert(std::is_trivially_copyable_v<Record>);
+    if (rest_.size() < sizeof record) return false;
+    std::memcpy(&record, rest_.data(), sizeof record);
+    rest_ = rest_.subspan(sizeof record);
+    return true;
+  }
+
+  // Points `bytes` at the next `count` bytes and steps over them. False where fewer remain. A count is computed in
+  // 64 bits, so that what a table claims cannot wrap around.
+  bool take(std::uint64_t count, std::span<const std::byte> &bytes) {
+    if (rest_.size() < count) return false;
+    bytes = rest_.first(static_cast<std::size_t>(count));
+    rest_ = rest_.subspan(static_cast<std::size_t>(count));
+    return true;
+  }
+
+ private:
+  std::span<const std::byte> rest_;
+};
+
+// The record at `index` of an array of records, by value.
+template <class Record>
+Record record_at(std::span<const std::byte> records, std::size_t index) {
+  static_assert(std::is_trivially_copyable_v<Record>);
+  Record record;
+  std::memcpy(&record, records.data() + index * sizeof record, sizeof record);
+  return record;
+}
+
+#endif

@@ -1,0 +1,33 @@
+// Texts that come from outside the program.
+
+#ifndef TARVELCTL_COMMON_TEXT_H
+#define TARVELCTL_COMMON_TEXT_H
+
+#include <algorithm>
+#include <cstddef>
+#include <cstring>
+#include <string_view>
+
+#include "common/print.h"
+
+// A text from the kernel, a process or a name service, to be printed as data from strangers (common/print.h).
+struct foreign_text {
+  std::string_view text;
+
+  format::text_view printable() const { return {text.data(), text.size(), true}; }
+};
+
+// A text field of a kernel record: it ends at the first NUL or with the field.
+template <std::size_t Width>
+struct text_field {
+  char bytes[Width];
+
+  std::string_view view() const { return {bytes, strnlen(bytes, Width)}; }
+
+  // At most the first `length` bytes of the text.
+  foreign_text first(std::size_t length) const { return {view().substr(0, std::min(length, Width))}; }
+
+  format::text_view printable() const { return foreign_text{view()}.printable(); }
+};
+
+#endif

@@ -1,0 +1,71 @@
+// Named kernel variables as files: kern.tarvel.stats.flow is /proc/sys/kern/tarvel/stats/flow.
+
+#include "platform/sysctl.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+
+#include "platform/linux/kernel_file.h"
+
+namespace {
+
+// Writes the path of a variable, terminated. False for a name that no variable has: a "/" in it would reach
+// other files.
+bool variable_path(std::string_view name, char (&path)[256]) {
+  constexpr std::string_view prefix = "sys/";
+  if (name.empty() || name.find('/') != name.npos || prefix.size() + name.size() >= sizeof path) return false;
+  char *end = std::copy(prefix.begin(), prefix.end(), path);
+  *std::replace_copy(name.begin(), name.end(), end, '.', '/') = '\0';
+  return true;
+}
+
+// Reads to the end, because files below /proc do not state their size.
+int measure(platform::kernel_file &file, std::size_t *length) {
+  char scratch[16 * 1024];
+  std::size_t total = 0;
+  for (;;) {
+    const long got = file.read(scratch, sizeof scratch);
+    if (got < 0) return -1;
+    total += static_cast<std::size_t>(got);
+    if (static_cast<std::size_t>(got) < sizeof scratch) break;
+  }
+  *length = total;
+  return 0;
+}
+
+}  // namespace
+
+extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, const void *new_value,
+                            std::size_t new_length) {
+  if (new_value || new_length) {
+    errno = EPERM;
+    return -1;
+  }
+  char path[256];
+  if (!variable_path(name, path)) {
+    errno = ENOENT;
+    return -1;
+  }
+  platform::kernel_file file(path);
+  if (!file.is_open()) return -1;
+  if (!old_length) return 0;
+  if (!old_value) {
+    if (file.stated_size() == 0) return measure(file, old_length);
+    *old_length = file.stated_size();
+    return 0;
+  }
+  const long got = file.read(old_value, *old_length);
+  if (got < 0) return -1;
+  if (static_cast<std::size_t>(got) == *old_length) {
+    char beyond;
+    const long more = file.read(&beyond, 1);
+    if (more < 0) return -1;
+    if (more > 0) {
+      errno = ENOMEM;
+      return -1;
+    }
+  }
+  *old_length = static_cast<std::size_t>(got);
+  return 0;
+}

@@ -1,0 +1,48 @@
+// What the front end and the commands know of each other.
+
+#ifndef TARVELCTL_TARVELCTL_COMMAND_H
+#define TARVELCTL_TARVELCTL_COMMAND_H
+
+#include <getopt.h>
+
+#include <cstdint>
+
+// Runs a command. Entry 0 of `argv` is the command word as typed, entries 1 to `argc` - 1 are its arguments; the
+// vector need not end with a null entry. The option scanner stands at entry 1.
+//
+// Returns 0 when the run is complete and may be repeated, anything else when no further run is wanted. The result
+// does not become the exit status.
+using command_handler = int (*)(int argc, char **argv);
+
+// A row of the command table.
+struct command_entry {
+  const char *name;
+  command_handler handler;
+  int min_args;            // command word and arguments must number more
+  const char *usage_text;  // shown behind the name, or null
+  const option *options;   // ended by a record without a name
+  const std::uint32_t *option_flags;
+};
+
+// The commands, ended by a row without a name.
+extern const command_entry command_table[];
+
+// What the front end found on the command line. Set before a handler runs, then left alone.
+extern const char *progname;
+extern int refresh_interval;  // seconds; 0: run once
+extern bool output_redirected;
+
+// The front end: runs the command line. Ends the process.
+[[noreturn]] void run_command_line(int argc, char **argv);
+
+// A long-option array without options, and its flags.
+extern const option no_options[];
+extern const std::uint32_t no_option_flags[];
+
+// The commands, a file each.
+int cmd_provider(int argc, char **argv);
+
+extern const option provider_options[];
+extern const std::uint32_t provider_option_flags[];
+
+#endif
