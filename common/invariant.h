@@ -3,8 +3,8 @@
 #ifndef TARVELCTL_COMMON_INVARIANT_H
 #define TARVELCTL_COMMON_INVARIANT_H
 
-// Where an invariant of a kernel table is checked, and the check, as users and their scripts know them. The line
-// is a name, not a position in today's source.
+// Where an invariant of a kernel table is checked, and the check, as users and their scripts know them. The
+// line is a name, not a position in today's source.
 struct invariant {
   const char *function;
   const char *file;
@@ -12,8 +12,8 @@ struct invariant {
   const char *expression;
 };
 
-// Ends the process by abort(), with the invariant named on standard error, unless `holds`. The report printed so
-// far reaches its destination first.
+// Ends the process by abort(), with the invariant named on standard error, unless `holds`. The report printed
+// so far reaches its destination first.
 void require(bool holds, const invariant &broken);
 
 #endif

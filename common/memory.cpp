@@ -26,4 +26,6 @@ void *xrealloc(void *block, std::size_t size) {
   std::exit(exit_status::out_of_memory);
 }
 
-void make_new_fail_fast() { std::set_new_handler(end_without_memory); }
+void make_new_fail_fast() {
+  std::set_new_handler(end_without_memory);
+}

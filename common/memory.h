@@ -11,8 +11,8 @@
 // process ends with "malloc failed" (no line end) on standard error and status 255.
 void *xmalloc(std::size_t size);
 
-// Returns `block`, or a new block where it is null, resized to `size` bytes, never null. Where there is no memory
-// the process ends with "realloc failed" (no line end) on standard error and status 255.
+// Returns `block`, or a new block where it is null, resized to `size` bytes, never null. Where there is no
+// memory the process ends with "realloc failed" (no line end) on standard error and status 255.
 void *xrealloc(void *block, std::size_t size);
 
 // Makes operator new end the process as xmalloc does. Called once at the start of a program.

@@ -39,8 +39,8 @@ class interrupt_hold {
   sigset_t before_;
 };
 
-// Waits until `fd` takes bytes, or for `timeout`, with the signals of `held` held back meanwhile. A signal that is
-// let through runs its handler here.
+// Waits until `fd` takes bytes, or for `timeout`, with the signals of `held` held back meanwhile. A signal
+// that is let through runs its handler here.
 bool wait_for_room(int fd, const timespec *timeout, const sigset_t *held) {
   pollfd room{.fd = fd, .events = POLLOUT, .revents = 0};
   return ppoll(&room, 1, timeout, held) > 0;

@@ -1,8 +1,8 @@
 // Where reports and diagnostics go.
 //
-// A report is buffered and written in whole lines, so that whoever reads along, and whatever ends the process,
-// never meets a torn row: a pipe gets pieces of at most PIPE_BUF bytes that end where a line ends, everything
-// else larger pieces. A diagnostic is written at once, after what the report has so far.
+// A report is buffered and written in whole lines, so that whoever reads along, and whatever ends the
+// process, never meets a torn row: a pipe gets pieces of at most PIPE_BUF bytes that end where a line ends,
+// everything else larger pieces. A diagnostic is written at once, after what the report has so far.
 
 #ifndef TARVELCTL_COMMON_OUTPUT_H
 #define TARVELCTL_COMMON_OUTPUT_H

@@ -13,8 +13,8 @@
 // Bit of an option flags word: the option may be left out.
 inline constexpr std::uint32_t option_is_optional = 1;
 
-// Writes one usage line per option to standard error. `options` ends with a record without a name; `flags` has a
-// word for each record before it.
+// Writes one usage line per option to standard error. `options` ends with a record without a name; `flags`
+// has a word for each record before it.
 void print_options_usage(const option *options, const std::uint32_t *flags);
 
 namespace colour {
@@ -22,19 +22,20 @@ inline constexpr char cyan[] = "\033[36m";
 inline constexpr char red[] = "\033[31m";
 }  // namespace colour
 
-// Returns `text` itself, or, where the report goes to a terminal, the text in a colour. The result is valid until
-// the next call; more than 1023 bytes of it are cut.
+// Returns `text` itself, or, where the report goes to a terminal, the text in a colour. The result is valid
+// until the next call; more than 1023 bytes of it are cut.
 const char *highlight(const char *text, const char *colour);
 
 // Prints "label=value<NAME,NAME>" without line end, or just "<NAME,NAME>" where `label` is null.
 //
 // `bit_names` is a string in the kernel's %b convention: a first byte for the base of the value (8 octal, any
-// other hexadecimal), then for each named bit its number from 1 (least significant) to 32 as one byte and its name
-// in characters above 32. Names appear in the order of the string.
+// other hexadecimal), then for each named bit its number from 1 (least significant) to 32 as one byte and its
+// name in characters above 32. Names appear in the order of the string.
 void print_flags(const char *label, std::uint32_t value, const char *bit_names);
 
 // Stores the short name of process `pid` in `buffer`, cut to `size` - 1 bytes and terminated, and returns it.
-// `with_pid` appends "." and the id where there is room behind the full name. A process that cannot be queried is
+// `with_pid` appends "." and the id where there is room behind the full name. A process that cannot be
+// queried is
 // "<unknown>." and the id, whatever `with_pid` says.
 foreign_text pid_to_name(int pid, char *buffer, std::size_t size, bool with_pid);
 

@@ -3,11 +3,12 @@
 //   print<"\tPort[%2u] %-22s (fd %d)\t">(port, name, fd);
 //
 // gives the bytes of printf for the same format. The number and types of the arguments are checked by the
-// compiler; what is left for run time is one check for room and straight-line appends into a buffer. Nothing is
-// allocated and no locale is consulted.
+// compiler; what is left for run time is one check for room and straight-line appends into a buffer. Nothing
+// is allocated and no locale is consulted.
 //
-// Conversions: %d (signed), %u %x %o (unsigned), %c (char), %s (text), %f %g (double) and %%. Flags "-" and "0",
-// width and precision as numbers. 64-bit integers need "ll" or "q", all others must not have it, as in C.
+// Conversions: %d (signed), %u %x %o (unsigned), %c (char), %s (text), %f %g (double) and %%. Flags "-" and
+// "0", width and precision as numbers. 64-bit integers need "ll" or "q", all others must not have it, as in
+// C.
 //
 // Texts are whatever converts to std::string_view, and any type with a member `printable()` that returns
 // format::text_view or format::small_text. Texts marked foreign come from outside the program (the kernel, a
@@ -168,8 +169,8 @@ inline char *put_digits(char *to, std::uint64_t value, unsigned digits) {
 // Longest text of a double in the conversions above: "%f" of the largest one, with six decimals.
 inline constexpr std::size_t double_size = 320;
 
-// As "%.2f". Multiplied by 100, a double below 2^53 is a 60-bit integer shifted right: the digits, and which way
-// to round, come from integer arithmetic. Ties are exact in binary and go to the even digit.
+// As "%.2f". Multiplied by 100, a double below 2^53 is a 60-bit integer shifted right: the digits, and which
+// way to round, come from integer arithmetic. Ties are exact in binary and go to the even digit.
 inline char *put_hundredths(char *to, double value) {
   const auto bits = std::bit_cast<std::uint64_t>(value);
   const auto exponent = static_cast<unsigned>(bits >> 52 & 0x7ff);
@@ -323,14 +324,20 @@ template <piece P, class T>
 consteval bool accepts() {
   constexpr bool integer_width = P.wide ? sizeof(T) == 8 : sizeof(T) <= 4;
   switch (P.kind) {
-    case 'd': return std::signed_integral<T> && integer_width && !P.zero && P.precision == no_precision;
-    case 'u': return std::unsigned_integral<T> && integer_width && !P.zero && P.precision == no_precision;
+    case 'd':
+      return std::signed_integral<T> && integer_width && !P.zero && P.precision == no_precision;
+    case 'u':
+      return std::unsigned_integral<T> && integer_width && !P.zero && P.precision == no_precision;
     case 'x':
-    case 'o': return std::unsigned_integral<T> && integer_width && P.precision == no_precision;
-    case 'c': return std::same_as<T, char>;
+    case 'o':
+      return std::unsigned_integral<T> && integer_width && P.precision == no_precision;
+    case 'c':
+      return std::same_as<T, char>;
     case 'f':
-    case 'g': return std::floating_point<T> && !P.zero;
-    default: return !std::is_arithmetic_v<T> && !P.zero;
+    case 'g':
+      return std::floating_point<T> && !P.zero;
+    default:
+      return !std::is_arithmetic_v<T> && !P.zero;
   }
 }
 

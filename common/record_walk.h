@@ -17,7 +17,8 @@ class record_walk {
   bool at_end() const { return rest_.empty(); }
   std::size_t remaining() const { return rest_.size(); }
 
-  // Copies the record here, which may lie at any address, and steps over it. False where too few bytes remain.
+  // Copies the record here, which may lie at any address, and steps over it. False where too few bytes
+  // remain.
   template <class Record>
   bool take(Record &record) {
     static_assert(std::is_trivially_copyable_v<Record>);
@@ -27,8 +28,8 @@ class record_walk {
     return true;
   }
 
-  // Points `bytes` at the next `count` bytes and steps over them. False where fewer remain. A count is computed in
-  // 64 bits, so that what a table claims cannot wrap around.
+  // Points `bytes` at the next `count` bytes and steps over them. False where fewer remain. A count is
+  // computed in 64 bits, so that what a table claims cannot wrap around.
   bool take(std::uint64_t count, std::span<const std::byte> &bytes) {
     if (rest_.size() < count) return false;
     bytes = rest_.first(static_cast<std::size_t>(count));

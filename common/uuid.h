@@ -9,11 +9,14 @@
 
 #include "common/print.h"
 
-// 16 bytes, compared byte by byte and printed in upper-case canonical form, 36 characters. All zero is the null UUID.
+// 16 bytes, compared byte by byte and printed in upper-case canonical form, 36 characters. All zero is the
+// null UUID.
 struct uuid {
   uuid_t bytes;
 
-  friend bool operator==(const uuid &a, const uuid &b) { return std::memcmp(a.bytes, b.bytes, sizeof a.bytes) == 0; }
+  friend bool operator==(const uuid &a, const uuid &b) {
+    return std::memcmp(a.bytes, b.bytes, sizeof a.bytes) == 0;
+  }
 
   format::small_text<UUID_STR_LEN> printable() const {
     format::small_text<UUID_STR_LEN> text;

@@ -9,9 +9,10 @@ extern "C" {
 
 // Reads the kernel variable `name`, such as "kern.tarvel.stats.flow".
 //
-// Without a buffer (`old_value` null) stores in `*old_length` the number of bytes that the variable holds now.
-// With one, `*old_length` is its size on entry and the number of bytes delivered on success; nothing is ever
-// written past it. Each call is a snapshot of its own: the variable may grow, shrink or vanish in between.
+// Without a buffer (`old_value` null) stores in `*old_length` the number of bytes that the variable holds
+// now. With one, `*old_length` is its size on entry and the number of bytes delivered on success; nothing is
+// ever written past it. Each call is a snapshot of its own: the variable may grow, shrink or vanish in
+// between.
 //
 // Returns 0, or -1 with the reason in errno:
 //   ENOENT   there is no such variable

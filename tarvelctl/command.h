@@ -7,11 +7,11 @@
 
 #include <cstdint>
 
-// Runs a command. Entry 0 of `argv` is the command word as typed, entries 1 to `argc` - 1 are its arguments; the
-// vector need not end with a null entry. The option scanner stands at entry 1.
+// Runs a command. Entry 0 of `argv` is the command word as typed, entries 1 to `argc` - 1 are its arguments;
+// the vector need not end with a null entry. The option scanner stands at entry 1.
 //
-// Returns 0 when the run is complete and may be repeated, anything else when no further run is wanted. The result
-// does not become the exit status.
+// Returns 0 when the run is complete and may be repeated, anything else when no further run is wanted. The
+// result does not become the exit status.
 using command_handler = int (*)(int argc, char **argv);
 
 // A row of the command table.

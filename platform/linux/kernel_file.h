@@ -1,8 +1,8 @@
 // Files that stand for the kernel's own, on Linux.
 //
-// The environment variable TARVEL_ROOT puts a directory in front of every path, so that a simulated or captured
-// kernel can be looked at. Once it is set nothing falls back to the live machine. It is ignored where the
-// process runs with more rights than its caller.
+// The environment variable TARVEL_ROOT puts a directory in front of every path, so that a simulated or
+// captured kernel can be looked at. Once it is set nothing falls back to the live machine. It is ignored
+// where the process runs with more rights than its caller.
 
 #ifndef TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
 #define TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
@@ -15,8 +15,8 @@ namespace platform {
 // An open kernel file, closed when it goes out of scope.
 class kernel_file {
  public:
-  // Opens "/proc/" + `path` below the root for reading. Only regular files count: a directory is EISDIR, and a
-  // device or a pipe, which might block or never end, is EINVAL.
+  // Opens "/proc/" + `path` below the root for reading. Only regular files count: a directory is EISDIR, and
+  // a device or a pipe, which might block or never end, is EINVAL.
   explicit kernel_file(std::string_view path);
   ~kernel_file();
   kernel_file(const kernel_file &) = delete;
@@ -25,7 +25,8 @@ class kernel_file {
   // False when opening failed; errno says why.
   bool is_open() const { return fd_ >= 0; }
 
-  // The size that the file system states: 0 for the files of a real /proc, whose size is what a read delivers.
+  // The size that the file system states: 0 for the files of a real /proc, whose size is what a read
+  // delivers.
   std::size_t stated_size() const { return stated_size_; }
 
   // Reads on until `size` bytes are there or the file ends. Returns the number read, or -1 with errno set.
