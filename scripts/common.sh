@@ -1,0 +1,31 @@
+# shellcheck shell=bash disable=SC2034
+# What the scripts share; sourced, not run. Leaves the caller in the top folder of the repository.
+
+cd "$(dirname "${BASH_SOURCE[0]}")/.." || exit
+
+build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev libbenchmark-dev python3)
+lint_packages=(clang-format clang-tidy shellcheck)
+
+# Installs those of the named Debian packages that are missing. Silent when none is, and on systems whose packages
+# have other names.
+require_packages() {
+  command -v dpkg-query >/dev/null || return 0
+  local package missing=()
+  for package; do
+    [[ $(dpkg-query -W -f='${db:Status-Status}' "$package" 2>/dev/null) == installed ]] || missing+=("$package")
+  done
+  [[ ${#missing[@]} -gt 0 ]] || return 0
+  local as_root=(env)
+  [[ $(id -u) -eq 0 ]] || as_root=(sudo env)
+  echo "Installing ${missing[*]}"
+  "${as_root[@]}" DEBIAN_FRONTEND=noninteractive apt-get -qq update
+  "${as_root[@]}" DEBIAN_FRONTEND=noninteractive apt-get -qq install --no-install-recommends "${missing[@]}" >/dev/null
+}
+
+# Configures a preset and builds it, or those of its targets that are named.
+build() {
+  local preset=$1
+  shift
+  cmake --preset "$preset" --log-level=WARNING >/dev/null
+  cmake --build --preset "$preset" ${1:+--target "$@"}
+}
