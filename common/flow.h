@@ -78,7 +78,7 @@ struct tv_stats_flow_adv {
   std::uint32_t sfa_entries_count;
 
   // Bytes of the entries behind the header.
-  std::uint64_t entries_size() const;
+  std::uint64_t trailing_size() const;
 };
 
 struct tv_stats_flow_adv_entry {
@@ -89,7 +89,7 @@ struct tv_stats_flow_adv_entry {
   std::uint32_t sfae_flags;
 };
 
-inline std::uint64_t tv_stats_flow_adv::entries_size() const {
+inline std::uint64_t tv_stats_flow_adv::trailing_size() const {
   return std::uint64_t{sfa_entries_count} * sizeof(tv_stats_flow_adv_entry);
 }
 

@@ -20,7 +20,7 @@ struct tv_stats_netns {
   std::uint8_t reserved_19[13];
 
   // Bytes of the ranges behind the head.
-  std::uint64_t entries_size() const;
+  std::uint64_t trailing_size() const;
 };
 
 struct tv_stats_netns_range {
@@ -33,7 +33,7 @@ struct tv_stats_netns_range {
   std::uint8_t reserved_20[12];
 };
 
-inline std::uint64_t tv_stats_netns::entries_size() const {
+inline std::uint64_t tv_stats_netns::trailing_size() const {
   return std::uint64_t{entry_count} * sizeof(tv_stats_netns_range);
 }
 

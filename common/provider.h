@@ -46,7 +46,7 @@ struct nexus_provider_record {
   std::uint8_t reserved_260[4];
 
   // Bytes of the instance UUIDs behind the fixed part.
-  std::uint64_t instances_size() const { return std::uint64_t{instance_count} * sizeof(uuid); }
+  std::uint64_t trailing_size() const { return std::uint64_t{instance_count} * sizeof(uuid); }
 };
 
 static_assert(sizeof(nexus_provider_parameters) == 192);

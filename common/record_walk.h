@@ -15,6 +15,7 @@ class record_walk {
   explicit record_walk(std::span<const std::byte> table) : rest_(table) {}
 
   bool at_end() const { return rest_.empty(); }
+  const std::byte *position() const { return rest_.data(); }
   std::size_t remaining() const { return rest_.size(); }
 
   // Copies the record here, which may lie at any address, and steps over it. False where too few bytes
@@ -28,6 +29,17 @@ class record_walk {
     return true;
   }
 
+  // Copies the record here and points `trailing` at the record.trailing_size() bytes behind it, then steps
+  // over both. False where the two do not fit in whole.
+  template <class Record>
+  bool take(Record &record, std::span<const std::byte> &trailing) {
+    const record_walk before = *this;
+    if (take(record) && take(record.trailing_size(), trailing)) return true;
+    *this = before;
+    return false;
+  }
+
+ private:
   // Points `bytes` at the next `count` bytes and steps over them. False where fewer remain. A count is
   // computed in 64 bits, so that what a table claims cannot wrap around.
   bool take(std::uint64_t count, std::span<const std::byte> &bytes) {
@@ -37,7 +49,6 @@ class record_walk {
     return true;
   }
 
- private:
   std::span<const std::byte> rest_;
 };
 

@@ -55,7 +55,7 @@ int cmd_provider(int argc, char **argv) {
   record_walk walk(table.bytes());
   nexus_provider_record record;
   std::span<const std::byte> instances;
-  while (walk.take(record) && walk.take(record.instances_size(), instances)) {
+  while (walk.take(record, instances)) {
     print_provider(record, instances, details);
   }
   if (!walk.at_end()) complain<"Buffer too short\n">();
