@@ -314,6 +314,8 @@ auto prepare(const T &argument) {
     return argument;
   } else if constexpr (requires { argument.printable(); }) {
     return argument.printable();
+  } else if constexpr (requires { argument.chars; }) {
+    return argument;  // a small text
   } else {
     const std::string_view text = argument;
     return text_view{text.data(), text.size(), false};
@@ -368,6 +370,35 @@ template <text F, class Sink, class... Args>
 void print_to(Sink &sink, const Args &...args) {
   static_assert(parsed<F>.conversions == sizeof...(Args), "as many arguments as conversions");
   emit<F>(std::index_sequence_for<Args...>{}, sink, prepare(args)...);
+}
+
+// A sink for a text of its own, on the stack.
+template <std::size_t Size>
+struct scratch {
+  char chars[Size + slack];
+  char *end = chars;
+
+  char *room(std::size_t) { return chars; }
+  void commit(char *to, bool) { end = to; }
+  bool is_terminal() const { return false; }
+};
+
+template <text F>
+consteval bool texts_are_bounded() {
+  return std::all_of(parsed<F>.pieces.begin(), parsed<F>.pieces.end(),
+                     [](const piece &p) { return p.kind != 's' || p.precision < 64; });
+}
+
+// A text of at most `Capacity` - 1 bytes; what does not fit is cut. Texts in it have a precision.
+template <text F, std::size_t Capacity, class... Args>
+small_text<Capacity> text_of(const Args &...args) {
+  static_assert(texts_are_bounded<F>(), "%s needs a precision here");
+  scratch<sizeof(F.chars) + sizeof...(Args) * double_size> all;
+  print_to<F>(all, args...);
+  small_text<Capacity> result;
+  result.size = std::min(static_cast<std::size_t>(all.end - all.chars), Capacity - 1);
+  std::memcpy(result.chars, all.chars, result.size);
+  return result;
 }
 
 }  // namespace format

@@ -1,0 +1,52 @@
+#include "common/channel_snapshot.h"
+
+#include "common/memory.h"
+#include "common/output.h"
+
+bool channel_snapshot_fetch(channel_snapshot &snapshot) {
+  if (snapshot.table_.fetch(channel_list_node) != 0 || snapshot.table_.empty()) return false;
+  if (snapshot.frame()) return true;
+  snapshot = {};
+  complain<"Buffer too short\n">();
+  return false;
+}
+
+// Finds the groups and their channels. False where the table ends too early.
+bool channel_snapshot::frame() {
+  record_walk walk(table_.bytes());
+  while (!walk.at_end()) {
+    const std::byte *const header_at = walk.position();
+    nexus_channel_header header;
+    if (!walk.take(header)) return false;
+    ++nexus_count_;
+    if (header.channel_count == 0) append({header_at, nullptr, 0});
+    for (std::uint32_t i = 0; i < header.channel_count; ++i) {
+      const std::byte *const entry_at = walk.position();
+      channel_entry entry;
+      std::span<const std::byte> rings;
+      if (!walk.take(entry, rings)) return false;
+      append({header_at, entry_at, sizeof entry + rings.size()});
+    }
+  }
+  return true;
+}
+
+void channel_snapshot::append(const channel_ref &ref) {
+  if (ref_count_ == capacity_) {
+    capacity_ = capacity_ ? 2 * capacity_ : 10;
+    void *const grown = xrealloc(refs_.release(), capacity_ * sizeof ref);
+    refs_.reset(static_cast<channel_ref *>(grown));
+  }
+  refs_[ref_count_++] = ref;
+}
+
+const channel_ref *channel_snapshot_find(const channel_snapshot &snapshot, const uuid &channel) {
+  uuid_index &index = snapshot.by_channel_;
+  if (index.empty()) {
+    for (std::uint32_t i = 0; i < snapshot.ref_count_; ++i) {
+      if (snapshot.refs_[i].entry) index.add(snapshot.refs_[i].channel().channel_uuid, i);
+    }
+  }
+  const std::uint32_t found = index.find(channel);
+  return found == uuid_index::none ? nullptr : &snapshot.refs_[found];
+}

@@ -1,0 +1,64 @@
+// One snapshot of the channel table, framed.
+
+#ifndef TARVELCTL_COMMON_CHANNEL_SNAPSHOT_H
+#define TARVELCTL_COMMON_CHANNEL_SNAPSHOT_H
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <span>
+
+#include "common/channel.h"
+#include "common/kernel_table.h"
+#include "common/record_walk.h"
+#include "common/uuid_index.h"
+
+// Where the bytes of a channel lie in the table that holds them.
+struct channel_ref {
+  const std::byte *header;  // of the channel's nexus group
+  const std::byte *entry;   // null for a nexus without channels
+  std::size_t entry_size;   // ring blocks included
+
+  nexus_channel_header nexus() const {
+    return record_at<nexus_channel_header>({header, sizeof(nexus_channel_header)}, 0);
+  }
+  channel_entry channel() const { return record_at<channel_entry>({entry, entry_size}, 0); }
+
+  // The ring blocks, ring_stats records back to back: transmit, then receive.
+  std::span<const std::byte> rings() const {
+    return {entry + sizeof(channel_entry), entry_size - sizeof(channel_entry)};
+  }
+};
+
+// A fetched table with a ref for each of its channels and one for each nexus without any, in table order. It
+// is either complete or empty.
+class channel_snapshot {
+ public:
+  std::uint32_t nexus_count() const { return nexus_count_; }
+  std::span<const channel_ref> refs() const { return {refs_.get(), ref_count_}; }
+  bool empty() const { return nexus_count_ == 0; }
+
+ private:
+  friend bool channel_snapshot_fetch(channel_snapshot &snapshot);
+  friend const channel_ref *channel_snapshot_find(const channel_snapshot &snapshot, const uuid &channel);
+
+  bool frame();
+  void append(const channel_ref &ref);
+
+  kernel_table table_;
+  std::uint32_t nexus_count_ = 0;
+  std::unique_ptr<channel_ref[], c_free> refs_;
+  std::uint32_t ref_count_ = 0;
+  std::uint32_t capacity_ = 0;
+  mutable uuid_index by_channel_;  // made when it is first asked
+};
+
+// Fills an empty snapshot from the kernel. Returns false, with the snapshot empty, when the table cannot be
+// fetched (the fetch has said why), holds nothing, or ends inside a group ("Buffer too short\n" on standard
+// error).
+bool channel_snapshot_fetch(channel_snapshot &snapshot);
+
+// Returns the first ref, in table order, of the channel, or null. It belongs to the snapshot.
+const channel_ref *channel_snapshot_find(const channel_snapshot &snapshot, const uuid &channel);
+
+#endif

@@ -1,0 +1,59 @@
+#include "common/uuid_index.h"
+
+#include <unistd.h>
+
+#include <utility>
+
+namespace {
+
+// Drawn once for the process: whoever chooses the UUIDs of a table must not be able to choose their slots.
+struct hash_key {
+  std::uint64_t halves[2] = {0x9e3779b97f4a7c15, 0xc2b2ae3d27d4eb4f};
+
+  hash_key() {
+    if (getentropy(halves, sizeof halves) != 0) return;  // then the slots are only hard to choose
+  }
+};
+
+std::uint64_t hash(const uuid &key) {
+  static const hash_key secret;
+  std::uint64_t halves[2];
+  std::memcpy(halves, key.bytes, sizeof halves);
+  __extension__ using wide = unsigned __int128;
+  const wide product = static_cast<wide>(halves[0] ^ secret.halves[0]) * (halves[1] ^ secret.halves[1]);
+  const std::uint64_t folded =
+      static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
+  const wide again = static_cast<wide>(folded ^ secret.halves[1]) * 0x9e3779b97f4a7c15;
+  return static_cast<std::uint64_t>(again) ^ static_cast<std::uint64_t>(again >> 64);
+}
+
+}  // namespace
+
+// The slot that holds `key`, or the free one where it belongs. There is a free one.
+std::size_t uuid_index::slot_of(const uuid &key) const {
+  const std::size_t mask = slots_.size() - 1;
+  std::size_t at = hash(key) & mask;
+  while (slots_[at].position != none && !(slots_[at].key == key)) at = (at + 1) & mask;
+  return at;
+}
+
+std::uint32_t uuid_index::find(const uuid &key) const {
+  return slots_.empty() ? none : slots_[slot_of(key)].position;
+}
+
+bool uuid_index::add(const uuid &key, std::uint32_t position) {
+  if (2 * used_ >= slots_.size()) grow();
+  slot &place = slots_[slot_of(key)];
+  if (place.position != none) return false;
+  place = {key, position};
+  ++used_;
+  return true;
+}
+
+void uuid_index::grow() {
+  std::vector<slot> before(slots_.empty() ? 64 : 2 * slots_.size());
+  std::swap(before, slots_);
+  for (const slot &old : before) {
+    if (old.position != none) slots_[slot_of(old.key)] = old;
+  }
+}
