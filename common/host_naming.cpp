@@ -1,0 +1,148 @@
+// Names of hosts and services, by the system's databases or as numbers.
+
+#include <arpa/inet.h>
+#include <netdb.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <string_view>
+
+#include "common/flow_naming.h"
+
+namespace {
+
+constexpr std::string_view unspecified = "*";
+
+// Cuts `name` to what the text holds. Names come from strangers.
+template <std::size_t Capacity>
+format::small_text<Capacity> named(std::string_view name) {
+  format::small_text<Capacity> text;
+  text.size = std::min(name.size(), Capacity - 1);
+  text.foreign = true;
+  std::memcpy(text.chars, name.data(), text.size);
+  return text;
+}
+
+// The official name of a host, or null.
+const char *look_up_host(const void *address, socklen_t size, int family) {
+  const hostent *host = gethostbyaddr(address, size, family);
+  return host ? host->h_name : nullptr;
+}
+
+const char *look_up_ipv4(const ipv4_address &address) {
+  in_addr in;
+  std::memcpy(&in, address.bytes, sizeof in);
+  if (inet_lnaof(in) == 0) {
+    const netent *network = getnetbyaddr(inet_netof(in), AF_INET);
+    if (network && network->n_name) return network->n_name;
+  }
+  return look_up_host(&in, sizeof in, AF_INET);
+}
+
+// The domain of this host, empty where it has none. It is read once, when an IPv6 name is first looked up.
+std::string_view local_domain() {
+  static char domain[256];
+  static bool attempted = false;
+  if (!attempted) {
+    attempted = true;
+    char host[256];
+    if (gethostname(host, sizeof host) == 0) {
+      host[sizeof host - 1] = '\0';
+      const char *dot = std::strchr(host, '.');
+      if (dot) std::strcpy(domain, dot + 1);
+    }
+  }
+  return domain;
+}
+
+// The name without the local domain.
+std::string_view short_name(std::string_view name) {
+  const std::string_view domain = local_domain();
+  const std::size_t dot = name.find('.');
+  if (dot == name.npos || name.substr(dot + 1) != domain) return name;
+  return name.substr(0, dot);
+}
+
+// The kernel embeds the scope of these addresses in bytes 2 and 3.
+bool may_embed_scope(const ipv6_address &address) {
+  const std::uint8_t *bytes = address.bytes;
+  if (bytes[0] == 0xfe) return (bytes[1] & 0xc0) == 0x80;
+  const unsigned scope = bytes[1] & 0x0f;
+  return bytes[0] == 0xff && (scope == 1 || scope == 2);
+}
+
+ipv6_host_text numeric_with_scope(const ipv6_address &address, unsigned scope) {
+  sockaddr_in6 socket_address{};
+  socket_address.sin6_family = AF_INET6;
+  std::memcpy(&socket_address.sin6_addr, address.bytes, sizeof address.bytes);
+  std::memset(&socket_address.sin6_addr.s6_addr[2], 0, 2);
+  socket_address.sin6_scope_id = scope;
+  char host[NI_MAXHOST];
+  const int error = getnameinfo(reinterpret_cast<const sockaddr *>(&socket_address), sizeof socket_address,
+                                host, sizeof host, nullptr, 0, NI_NUMERICHOST);
+  return named<sizeof(ipv6_host_text::chars)>(error ? "?" : host);
+}
+
+ipv6_host_text numeric(const ipv6_address &address) {
+  const unsigned scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
+  if (scope && may_embed_scope(address)) return numeric_with_scope(address, scope);
+  ipv6_host_text text;
+  text.size = static_cast<std::size_t>(put_ipv6_address(text.chars, address) - text.chars);
+  return text;
+}
+
+// Host and service joined, with `end` behind them.
+template <class Host>
+endpoint_text join(const Host &host, std::uint16_t port, const char *protocol, bool numerical,
+                   std::string_view end) {
+  constexpr std::size_t named_host = 33;
+  constexpr std::size_t numerical_host = 37;
+  const std::string_view host_text = host.view().substr(0, numerical ? numerical_host : named_host);
+  const servent *service = port && !numerical ? getservbyport(port, protocol) : nullptr;
+  endpoint_text text;
+  if (port && !service) {
+    text = format::text_of<"%.37s.%d%.1s", 80>(host_text, static_cast<int>(ntohs(port)), end);
+  } else {
+    const std::string_view service_text = service ? std::string_view(service->s_name) : unspecified;
+    text = format::text_of<"%.37s.%.15s%.1s", 80>(host_text, service_text, end);
+  }
+  text.foreign = !numerical;
+  return text;
+}
+
+}  // namespace
+
+ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {
+  constexpr std::size_t size = sizeof(ipv4_host_text::chars);
+  static constexpr ipv4_address any{};
+  if (std::memcmp(address.bytes, any.bytes, sizeof any.bytes) == 0) return named<size>(unspecified);
+  const char *name = numerical ? nullptr : look_up_ipv4(address);
+  if (name) return named<size>(name);
+  ipv4_host_text text;
+  text.size = static_cast<std::size_t>(put_ipv4_address(text.chars, address) - text.chars);
+  return text;
+}
+
+ipv6_host_text ipv6_host_name(const ipv6_address &address, bool numerical) {
+  constexpr std::size_t size = sizeof(ipv6_host_text::chars);
+  static constexpr ipv6_address any{};
+  if (!numerical) local_domain();
+  if (std::memcmp(address.bytes, any.bytes, sizeof any.bytes) == 0) return named<size>(unspecified);
+  const char *name = numerical ? nullptr : look_up_host(address.bytes, sizeof address.bytes, AF_INET6);
+  return name ? named<size>(short_name(name)) : numeric(address);
+}
+
+endpoint_text ipv4_endpoint_name(const ipv4_address &address, std::uint16_t port, const char *protocol,
+                                 bool numerical) {
+  return join(ipv4_host_name(address, numerical), port, protocol, numerical, " ");
+}
+
+endpoint_text ipv6_endpoint_name(const ipv6_address &address, std::uint16_t port, const char *protocol,
+                                 bool numerical) {
+  const std::string_view name = protocol;
+  if (name == "tcp6") protocol = "tcp";
+  if (name == "udp6") protocol = "udp";
+  return join(ipv6_host_name(address, numerical), port, protocol, numerical, "");
+}

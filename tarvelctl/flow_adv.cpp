@@ -1,0 +1,54 @@
+// flow-adv: the flow advisories of each flow switch.
+
+#include "common/flow.h"
+#include "common/invariant.h"
+#include "common/kernel_table.h"
+#include "common/output.h"
+#include "common/output_helpers.h"
+#include "common/record_walk.h"
+#include "tarvelctl/command.h"
+#include "tarvelctl/netstat_options.h"
+#include "tarvelctl/reports.h"
+
+namespace {
+
+constexpr char advisory_flag_names[] =
+    "\20"
+    "\1VALID"
+    "\2CONTROLLED";
+
+void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk entries) {
+  char name[256];
+  print<" - %s\n">(pid_to_name(advisories.sfa_pid, name, sizeof name, true));
+  print<"\tNexus UUID: %s\n">(advisories.sfa_nx_uuid);
+  print<"\tNetif     : %s\n">(advisories.sfa_if_name);
+  print<"\tFlowAdvIdx               Flow UUID                 Flags\n">();
+  require(advisories.sfa_entries_count <= tv_stats_flow_adv::max_entries,
+          {"__tv_stats_flow_adv_print", "tarvelctl/tarvelctl", 729, "sfa->sfa_entries_count <= 512"});
+  tv_stats_flow_adv_entry entry;
+  for (int i = 0; entries.take(entry); ++i) {
+    print<"\t    [%3d] : %s ">(i, entry.sfae_flow_uuid);
+    print_flags("flags", entry.sfae_flags, advisory_flag_names);
+    print<"\n">();
+  }
+}
+
+}  // namespace
+
+int list_flow_advisories() {
+  kernel_table table;
+  if (const int error = table.fetch(flow_adv_node)) return error;
+  record_walk walk(table.bytes());
+  tv_stats_flow_adv advisories;
+  std::span<const std::byte> entries;
+  while (walk.take(advisories, entries)) {
+    if (!netstat_options.selects(advisories.sfa_nx_uuid, advisories.sfa_pid)) continue;
+    __tv_stats_flow_adv_print(advisories, record_walk(entries));
+  }
+  require(walk.at_end(), {"cmd_flow_adv", "tarvelctl/tarvelctl", 766, "scan == (buffer + length)"});
+  return 0;
+}
+
+int cmd_flow_adv(int /*argc*/, char ** /*argv*/) {
+  return list_flow_advisories();
+}

@@ -1,0 +1,65 @@
+// flow-route: the routes of the flow switches, with gateway and link-layer address of the next hop.
+
+#include "common/flow.h"
+#include "common/flow_naming.h"
+#include "common/invariant.h"
+#include "common/kernel_table.h"
+#include "common/output.h"
+#include "common/record_walk.h"
+#include "tarvelctl/command.h"
+#include "tarvelctl/netstat_options.h"
+#include "tarvelctl/reports.h"
+
+namespace {
+
+constexpr flag_letter route_flag_letters[] = {
+    {0x10, 'o'},  {tv_stats_flow_route::has_gateway, 'g'}, {0x40, 'r'}, {tv_stats_flow_route::has_mac, 'i'},
+    {0x100, 'd'},
+};
+
+// IPv6 names are cut where the next column begins, but for the gateway's.
+void print_addresses(const tv_stats_flow_route &route) {
+  const bool numerical = netstat_options.numerical;
+  const bool has_gateway = route.sfr_flags & route.has_gateway;
+  if (route.sfr_remote.family == address_family::ipv6) {
+    print<"%-40.40s ">(ipv6_host_name(route.sfr_local.ipv6, numerical));
+    print<"%-40.40s ">(ipv6_host_name(route.sfr_remote.ipv6, numerical));
+    if (has_gateway) print<"%-40s">(ipv6_host_name(route.sfr_gateway.ipv6, numerical));
+  } else if (route.sfr_remote.family == address_family::ipv4) {
+    print<"%-40s ">(ipv4_host_name(route.sfr_local.ipv4, numerical));
+    print<"%-40s ">(ipv4_host_name(route.sfr_remote.ipv4, numerical));
+    if (has_gateway) print<"%-40s">(ipv4_host_name(route.sfr_gateway.ipv4, numerical));
+  } else {
+    return;
+  }
+  if (!has_gateway) print<"%-40s">("-");
+}
+
+void print_route(const tv_stats_flow_route &route) {
+  print_addresses(route);
+  if (route.sfr_flags & route.has_mac) {
+    print<" %s">(link_layer_address_text(route.sfr_mac));
+  } else {
+    print<" %-17s">("-");
+  }
+  print<" %8s %6u %6lld %5u %5u  %s\n">(route.sfr_if_name, route.sfr_refs, route.sfr_expire, route.sfr_bidx,
+                                        route.sfr_ibidx,
+                                        letters_of_flags(route.sfr_flags, route_flag_letters));
+}
+
+}  // namespace
+
+int cmd_flow_route(int argc, char **argv) {
+  take_numerical_option(argc, argv);
+  kernel_table table;
+  if (const int error = table.fetch(flow_route_node)) return error;
+  if (table.empty()) return 0;
+
+  print<"%-40s %-40s %-40s %-17s %8s %6s %6s %5s %5s %6s\n">("Local Address", "Remote Address",
+                                                             "Gateway Address", "MAC Address", "NetIf",
+                                                             "Refs", "Expire", "bidx", "ibidx", "Flags");
+  record_walk walk(table.bytes());
+  for (tv_stats_flow_route route; walk.take(route);) print_route(route);
+  require(walk.at_end(), {"cmd_flow_route", "tarvelctl/tarvelctl", 933, "sfr == (buffer + length)"});
+  return 0;
+}
