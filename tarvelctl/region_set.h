@@ -1,0 +1,39 @@
+// The memory regions that the process has seen, each once.
+
+#ifndef TARVELCTL_TARVELCTL_REGION_SET_H
+#define TARVELCTL_TARVELCTL_REGION_SET_H
+
+#include <cstdint>
+#include <memory>
+#include <span>
+
+#include "common/arena.h"
+#include "common/memory.h"
+#include "common/uuid_index.h"
+
+// Regions by UUID, with type and memory as they were when each was first seen. It only grows.
+class region_set {
+ public:
+  struct item {
+    ::uuid uuid;
+    std::uint32_t id;         // region type
+    std::uint64_t mem_total;  // bytes
+    std::uint64_t mem_wired;  // bytes
+  };
+
+  // Adds the region unless its UUID is there. Where there is no memory the process ends with a message and
+  // status 255.
+  void add(const tv_stats_region &region);
+
+  std::span<const item> items() const { return {items_.get(), count_}; }
+
+ private:
+  void grow();
+
+  std::unique_ptr<item[], c_free> items_;
+  std::uint32_t count_ = 0;
+  std::uint32_t capacity_ = 0;
+  uuid_index by_uuid_;
+};
+
+#endif
