@@ -1,0 +1,159 @@
+// netns: port reservations, of one namespace or of all.
+
+#include "common/netns.h"
+
+#include <arpa/inet.h>
+#include <netinet/in.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+
+#include "common/kernel_table.h"
+#include "common/output.h"
+#include "common/output_helpers.h"
+#include "common/record_walk.h"
+#include "tarvelctl/command.h"
+
+const option netns_options[] = {
+    {"all", no_argument, nullptr, 'a'},
+    {"ip", required_argument, nullptr, 'i'},
+    {"proto", required_argument, nullptr, 'p'},
+    {},
+};
+const std::uint32_t netns_option_flags[] = {option_is_optional, option_is_optional, option_is_optional};
+
+namespace {
+
+// What one run asks for.
+struct netns_request {
+  bool all = false;
+  bool global = false;
+  int family = 0;  // 4, 6 or 0 for none
+  std::uint8_t ipv4[4] = {};
+  std::uint8_t ipv6[16] = {};
+  std::uint8_t protocol = 0;  // tcp, udp or 0 for none
+
+  // The address bytes that a record must have; none for the global namespace.
+  std::span<const std::uint8_t> key() const {
+    if (global) return {};
+    return family == 6 ? std::span<const std::uint8_t>(ipv6) : std::span<const std::uint8_t>(ipv4);
+  }
+};
+
+// Which family an address text looks like: 4, 6 or 0. The first six characters tell.
+int netns_address_family(std::string_view text) {
+  const std::size_t at = text.substr(0, 6).find_first_of(".:");
+  if (at == text.npos) return 0;
+  return text[at] == '.' ? 4 : 6;
+}
+
+void take_address(netns_request &request, const char *text) {
+  if (std::string_view(text) == "global") {
+    request.global = true;
+    return;
+  }
+  const int family = netns_address_family(text);
+  const bool parsed = (family == 4 && inet_pton(AF_INET, text, request.ipv4) == 1) ||
+                      (family == 6 && inet_pton(AF_INET6, text, request.ipv6) == 1);
+  request.family = parsed ? family : 0;
+}
+
+void take_protocol(netns_request &request, std::string_view name) {
+  if (name == "udp") request.protocol = tv_stats_netns::udp;
+  if (name == "tcp") request.protocol = tv_stats_netns::tcp;
+}
+
+// False where the option parser found something that it has reported.
+bool take_options(netns_request &request, int argc, char **argv) {
+  for (int result; (result = getopt_long(argc, argv, "ai:p:", netns_options, nullptr)) != -1;) {
+    switch (result) {
+      case 'a':
+        request.all = true;
+        break;
+      case 'i':
+        take_address(request, optarg);
+        break;
+      case 'p':
+        take_protocol(request, optarg);
+        break;
+      default:
+        return false;
+    }
+  }
+  return true;
+}
+
+void print_range(const tv_stats_netns_range &range) {
+  const int first = range.first_port;
+  const int last = range.last_port;
+  const auto ports = last ? format::text_of<"%d-%d", 16>(first, last) : format::text_of<"%d", 16>(first);
+  print<"%11s %10d %10d %10d\n">(ports, range.subsystem, range.bsd, range.listeners);
+}
+
+void __tv_stats_netns_print(const tv_stats_netns &netns, record_walk ranges) {
+  char text[INET6_ADDRSTRLEN];
+  const char *address = "global namespace";
+  if (netns.address_length == 4) address = inet_ntop(AF_INET, netns.address, text, sizeof text);
+  if (netns.address_length == 16) address = inet_ntop(AF_INET6, netns.address, text, sizeof text);
+  print<"%s port reservations for %s\n">(netns.protocol == netns.udp ? "udp" : "tcp", address);
+  print<"%11s %10s %10s %10s\n">("PORT(S)", "TARVEL", "BSD", "LISTENER");
+  for (tv_stats_netns_range range; ranges.take(range);) print_range(range);
+  print<"--------------------------------------------\n">();
+}
+
+// Fetches the table. Running out of memory counts as an empty table.
+int fetch(kernel_table &table) {
+  const int error = table.fetch(netns_node);
+  return error == ENOMEM ? 0 : error;
+}
+
+int print_all(const netns_request &request) {
+  if (request.family || request.global || request.protocol) {
+    print<"WARNING: With -a, any further namespace specifiers are ignored\n">();
+  }
+  kernel_table table;
+  if (const int error = fetch(table)) return error;
+  record_walk walk(table.bytes());
+  tv_stats_netns netns;
+  std::span<const std::byte> ranges;
+  while (walk.take(netns, ranges)) __tv_stats_netns_print(netns, record_walk(ranges));
+  if (!walk.at_end()) complain<"Buffer too short\n">();
+  return 0;
+}
+
+int print_one(const netns_request &request) {
+  if (request.family == 0 && !request.global) {
+    print<"Specify -a or a valid IP address\n">();
+    return EINVAL;
+  }
+  if (request.protocol == 0) {
+    print<"Specify -a or a valid L4 protocol name\n">();
+    return EINVAL;
+  }
+  kernel_table table;
+  if (const int error = fetch(table)) return error;
+  const std::span<const std::uint8_t> key = request.key();
+  record_walk walk(table.bytes());
+  tv_stats_netns netns;
+  std::span<const std::byte> ranges;
+  while (walk.take(netns, ranges)) {
+    if (netns.protocol != request.protocol || netns.address_length != key.size()) continue;
+    if (!std::equal(key.begin(), key.end(), netns.address)) continue;
+    __tv_stats_netns_print(netns, record_walk(ranges));
+    return 0;
+  }
+  if (!walk.at_end()) complain<"Buffer too short\n">();
+  return ENOENT;
+}
+
+}  // namespace
+
+int cmd_netns(int argc, char **argv) {
+  netns_request request;
+  if (!take_options(request, argc, argv)) {
+    print_options_usage(netns_options, netns_option_flags);
+    return EINVAL;
+  }
+  return request.all ? print_all(request) : print_one(request);
+}
