@@ -39,9 +39,24 @@ extern bool output_redirected;
 extern const option no_options[];
 extern const std::uint32_t no_option_flags[];
 
-// The commands, a file each.
+// The handlers and, where a command has options, their arrays.
+int cmd_channel(int argc, char **argv);
+int cmd_flow(int argc, char **argv);
+int cmd_flow_adv(int argc, char **argv);
+int cmd_flow_owner(int argc, char **argv);
+int cmd_flow_route(int argc, char **argv);
+int cmd_flow_switch(int argc, char **argv);
+int cmd_interface(int argc, char **argv);
+int cmd_memory(int argc, char **argv);
+int cmd_netns(int argc, char **argv);
+int cmd_netstat(int argc, char **argv);
 int cmd_provider(int argc, char **argv);
 
+extern const std::uint32_t channel_option_flags[];
+extern const option netns_options[];
+extern const std::uint32_t netns_option_flags[];
+extern const option netstat_long_options[];
+extern const std::uint32_t netstat_option_flags[];
 extern const option provider_options[];
 extern const std::uint32_t provider_option_flags[];
 
