@@ -14,8 +14,18 @@ constexpr char provider_list[] = "kern.tarvel.nexus_provider_list";
 
 // All commands, in the order of the usage text.
 const std::vector<std::string> command_names = {
+    "channel",
+    "flow",
+    "flow-adv",
+    "flow-owner",
+    "flow-route",
+    "flow-switch",
+    "interface",
+    "memory",
+    "netns",
     "provider",
     "list-providers",
+    "netstat",
 };
 
 std::string usage_text(const std::string &program = "tarvelctl") {
