@@ -1,0 +1,119 @@
+#include "lab/command_line.h"
+
+#include <charconv>
+#include <string_view>
+
+#include "common/output.h"
+
+namespace lab {
+
+namespace {
+
+constexpr std::uint32_t most_records = 10'000'000;
+
+struct number_option {
+  std::string_view name;
+  std::uint32_t sizes::*size;  // or null: the interval
+  std::uint32_t least;
+  std::uint32_t most;
+  const char *meaning;
+};
+
+constexpr number_option number_options[] = {
+    {"--providers", &sizes::providers, 0, most_records, "nexus providers (9)"},
+    {"--nexuses", &sizes::nexuses, 0, most_records, "nexus instances (about 3 for 2 providers)"},
+    {"--channels", &sizes::channels, 0, most_records, "channels (28)"},
+    {"--rings", &sizes::rings, 0, 1024, "rings of each channel (2)"},
+    {"--flows", &sizes::flows, 0, most_records, "flows (60)"},
+    {"--stacks", &sizes::stacks, 0, most_records, "user-space stacks (one per flow channel and switch)"},
+    {"--arenas", &sizes::arenas, 0, most_records, "memory arenas (10)"},
+    {"--namespaces", &sizes::namespaces, 0, most_records, "port namespaces (14)"},
+    {"--processes", &sizes::processes, 0, most_records, "processes (13)"},
+    {"--interval", nullptr, 10, 3'600'000, "milliseconds between two snapshots (1000)"},
+};
+
+struct command {
+  std::string_view name;
+  const char *synopsis;
+  const char *purpose;
+  int (*handler)(const options &);
+  bool needs_directory;
+  bool makes_world;  // takes sizes and a seed
+  bool moves_world;  // takes an interval
+  bool runs_command;
+};
+
+constexpr command commands[] = {
+    {"generate", "DIR [sizes] [--seed N]", "make one snapshot", generate, true, true, false, false},
+    {"simulate", "DIR [sizes] [--seed N] [--interval MS]", "make one and keep it moving until interrupted",
+     simulate, true, true, true, false},
+    {"run", "[DIR | [sizes] [--seed N] [--interval MS]] -- COMMAND...",
+     "run COMMAND on DIR, or on a simulation of its own", run, false, true, true, true},
+    {"capture", "DIR", "save the tables of the kernel in sight", capture, true, false, false, false},
+};
+
+int usage() {
+  complain<"usage:\n">();
+  for (const command &row : commands) {
+    complain<"  tarvellab %s %s\n\t%s\n">(row.name, row.synopsis, row.purpose);
+  }
+  complain<"sizes and their defaults:\n">();
+  for (const number_option &row : number_options) complain<"  %-12s N  %s\n">(row.name, row.meaning);
+  return exit_status::usage;
+}
+
+template <class Number>
+bool parse_number(const char *text, Number least, Number most, Number &number) {
+  const std::string_view view = text ? text : "";
+  const auto [end, error] = std::from_chars(view.data(), view.data() + view.size(), number);
+  return error == std::errc() && end == view.data() + view.size() && number >= least && number <= most;
+}
+
+// Takes one option with its value. False where the command does not know it or the value is no such number.
+bool take_option(const command &row, std::string_view name, const char *value, options &asked) {
+  if (name == "--seed")
+    return row.makes_world && parse_number<std::uint64_t>(value, 0, UINT64_MAX, asked.seed);
+  for (const number_option &known : number_options) {
+    if (known.name != name) continue;
+    if (known.size ? !row.makes_world : !row.moves_world) return false;
+    return parse_number(value, known.least, known.most, known.size ? asked.size.*known.size : asked.interval);
+  }
+  return false;
+}
+
+bool parse(const command &row, char **argument, options &asked) {
+  bool shaped = false;
+  for (; *argument; ++argument) {
+    const std::string_view word = *argument;
+    if (word == "--" && row.runs_command) {
+      asked.command = argument + 1;
+      break;
+    }
+    if (word.starts_with("--")) {
+      if (!take_option(row, word, argument[1], asked)) return false;
+      shaped = true;
+      ++argument;
+    } else if (word.empty() || !asked.directory.empty()) {
+      return false;
+    } else {
+      asked.directory = word;
+    }
+  }
+  if (row.needs_directory && asked.directory.empty()) return false;
+  if (!row.runs_command) return true;
+  // A directory is there already: nothing is left to choose about it.
+  return asked.command && *asked.command && !(shaped && !asked.directory.empty());
+}
+
+}  // namespace
+
+int run_command_line(int argc, char **argv) {
+  if (argc < 2) return usage();
+  for (const command &row : commands) {
+    options asked;
+    if (row.name == argv[1]) return parse(row, argv + 2, asked) ? row.handler(asked) : usage();
+  }
+  return usage();
+}
+
+}  // namespace lab

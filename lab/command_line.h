@@ -1,0 +1,34 @@
+// The command line of tarvellab.
+
+#ifndef TARVELCTL_LAB_COMMAND_LINE_H
+#define TARVELCTL_LAB_COMMAND_LINE_H
+
+#include <cstdint>
+#include <string>
+
+#include "lab/world.h"
+
+namespace lab {
+
+// What the user asked for.
+struct options {
+  sizes size;
+  std::uint64_t seed = 1;
+  std::uint32_t interval = 1000;  // milliseconds between two snapshots
+  std::string directory;          // empty: none given
+  char **command = nullptr;       // what stands behind "--", ended by a null entry
+};
+
+// Runs the command line. Returns the exit status: 0, 64 after a usage error, 1 after a failure, or, for
+// `run`, what the command ended with.
+int run_command_line(int argc, char **argv);
+
+// The commands, which return their exit status.
+int generate(const options &asked);
+int simulate(const options &asked);
+int run(const options &asked);
+int capture(const options &asked);
+
+}  // namespace lab
+
+#endif

@@ -1,0 +1,74 @@
+// kern.tarvel.nexus_provider_list
+
+#include <algorithm>
+#include <string>
+
+#include "common/provider.h"
+#include "lab/tables.h"
+
+namespace lab {
+
+namespace {
+
+struct provider_shape {
+  std::string_view name;
+  std::uint32_t type;
+  std::uint32_t subtype;
+  std::int32_t flags;
+  std::int32_t tx_slots;
+  std::int32_t rx_slots;
+  std::int32_t meta_size;
+  std::int32_t mhints;
+};
+
+// By nexus_kind.
+constexpr provider_shape shapes[] = {
+    {"com.example.multistack", nexus_type::flow_switch, flow_switch_subtype::multistack, 0, 512, 1024, 512,
+     1},
+    {"com.example.net-if", nexus_type::network_interface, 0, 0, 512, 512, 512, 0},
+    {"com.example.bridge", nexus_type::flow_switch, flow_switch_subtype::bridge, 0, 1024, 1024, 512, 0},
+    {"com.example.content-filter", nexus_type::user_pipe, 0, 0, 256, 256, 128, 0},
+    {"com.example.tunnel", nexus_type::kernel_pipe, 0, 0, 256, 512, 512, 2},
+    {"com.example.scratch", nexus_type::user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
+};
+
+nexus_provider_parameters parameters_of(const world &state, const provider &source) {
+  const provider_shape &shape = shapes[static_cast<int>(source.kind)];
+  std::string name(shape.name);
+  std::string suffix = interface_name(source.kind, source.ordinal);
+  if (suffix.empty() && source.ordinal) suffix = std::to_string(source.ordinal);
+  if (!suffix.empty()) name.append(".").append(suffix);
+  nexus_provider_parameters made{};
+  set_text(made.name, name);
+  made.name_length = static_cast<std::uint32_t>(name.size());
+  made.type = shape.type;
+  made.flags = shape.flags;
+  made.tx_rings = static_cast<std::int32_t>((state.size.rings + 1) / 2);
+  made.rx_rings = static_cast<std::int32_t>(state.size.rings / 2);
+  made.tx_slots = shape.tx_slots;
+  made.rx_slots = shape.rx_slots;
+  made.buf_size = 2048;
+  made.meta_size = shape.meta_size;
+  made.subtype = shape.subtype;
+  made.mhints = shape.mhints;
+  made.ifindex = static_cast<std::int32_t>(interface_index(source.kind, source.ordinal));
+  return made;
+}
+
+}  // namespace
+
+void write_providers(const world &state, table_file &file) {
+  for (const provider &source : state.providers) {
+    const auto instances = std::span(state.nexuses).subspan(source.first_nexus, source.nexus_count);
+    nexus_provider_record record{};
+    record.provider_uuid = source.id;
+    record.parameters = parameters_of(state, source);
+    record.instance_count = static_cast<std::uint32_t>(std::ranges::count(instances, true, &nexus::alive));
+    file.put(record);
+    for (const nexus &instance : instances) {
+      if (instance.alive) file.put(instance.id);
+    }
+  }
+}
+
+}  // namespace lab

@@ -1,0 +1,201 @@
+// run: a command on a kernel of its own.
+//
+// The simulation is a child in a process group of its own, so that what a terminal sends to the group of the
+// command leaves it alone. It ends with this process, however that ends.
+
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <string_view>
+#include <system_error>
+
+#include "common/output.h"
+#include "lab/command_line.h"
+#include "lab/root_directory.h"
+#include "lab/simulation.h"
+
+namespace lab {
+
+namespace {
+
+constexpr int passed_on[] = {SIGINT, SIGTERM, SIGHUP, SIGQUIT};
+constexpr int not_found = 127;
+constexpr int not_executable = 126;
+
+// A new directory for temporary files, removed with all that is in it.
+class temporary_directory {
+ public:
+  temporary_directory() {
+    const char *parent = secure_getenv("TMPDIR");
+    std::error_code error;
+    path_ =
+        std::filesystem::absolute(parent && *parent ? parent : "/tmp", error).string() + "/tarvellab-XXXXXX";
+    if (!mkdtemp(path_.data())) {
+      complain_about(path_, errno);
+      path_.clear();
+    }
+  }
+  ~temporary_directory() { remove(); }
+  temporary_directory(const temporary_directory &) = delete;
+  temporary_directory &operator=(const temporary_directory &) = delete;
+
+  void remove() const {
+    std::error_code ignored;
+    if (!path_.empty()) std::filesystem::remove_all(path_, ignored);
+  }
+
+  // Empty where it could not be made.
+  const std::string &path() const { return path_; }
+
+ private:
+  std::string path_;
+};
+
+// A child process that simulates a kernel, from its first snapshot on. Ends with its owner.
+class simulator {
+ public:
+  simulator() = default;
+  ~simulator() {
+    if (pid_ <= 0) return;
+    kill(pid_, SIGKILL);
+    waitpid(pid_, nullptr, 0);
+  }
+  simulator(const simulator &) = delete;
+  simulator &operator=(const simulator &) = delete;
+
+  // False, with a message, where the first snapshot cannot be made.
+  bool start(const options &asked, const temporary_directory &directory) {
+    root_directory root(directory.path());
+    world state = make_world(asked.size, asked.seed);
+    if (!root.prepare(0700) || !root.publish(state)) return false;
+    const pid_t owner = getpid();
+    pid_ = fork();
+    if (pid_ < 0) return complain_about("fork", errno);
+    if (pid_ > 0) return true;
+    setpgid(0, 0);
+    prctl(PR_SET_PDEATHSIG, SIGTERM);
+    sigset_t stop;
+    sigemptyset(&stop);
+    sigaddset(&stop, SIGTERM);
+    if (getppid() == owner) keep_moving(state, root, asked.interval, stop);
+    // The owner stops its simulator in a harder way: here it is gone, and its directory left behind.
+    if (getppid() != owner) directory.remove();
+    _exit(EXIT_SUCCESS);
+  }
+
+ private:
+  pid_t pid_ = -1;
+};
+
+// Where a program of this name stands beside this one; otherwise empty.
+std::string beside_this_program(const char *name) {
+  std::error_code error;
+  std::filesystem::path self = std::filesystem::read_symlink("/proc/self/exe", error);
+  const std::string path = self.replace_filename(name).string();
+  return access(path.c_str(), X_OK) == 0 ? path : std::string();
+}
+
+// In the child: becomes the command.
+[[noreturn]] void become(char **command, const std::string &root) {
+  setenv("TARVEL_ROOT", root.c_str(), 1);
+  if (std::string_view(command[0]) == "tarvelctl") {
+    const std::string neighbour = beside_this_program(command[0]);
+    if (!neighbour.empty()) execv(neighbour.c_str(), command);
+  }
+  execvp(command[0], command);
+  const int error = errno;
+  complain_about(command[0], error);
+  _exit(error == ENOENT ? not_found : not_executable);
+}
+
+// Waits for the command's end and passes signals on meanwhile. Returns its wait status.
+int attend(pid_t command, const sigset_t &signals) {
+  for (;;) {
+    siginfo_t info;
+    const int signal = sigwaitinfo(&signals, &info);
+    if (signal == SIGCHLD) {
+      int status;
+      if (waitpid(command, &status, WNOHANG) == command) return status;
+    } else if (signal > 0 && info.si_code != SI_KERNEL) {
+      kill(command, signal);  // the terminal's own signals have reached the command already
+    }
+  }
+}
+
+// The exit status for a wait status; where a signal ended the command, the same one ends this process, when
+// all that was made is removed again.
+int end_like(int status) {
+  if (!WIFSIGNALED(status)) return WEXITSTATUS(status);
+  const int signal = WTERMSIG(status);
+  const rlimit no_core{};
+  setrlimit(RLIMIT_CORE, &no_core);  // the command's own core is the one that tells
+  ::signal(signal, SIG_DFL);
+  sigset_t set;
+  sigemptyset(&set);
+  sigaddset(&set, signal);
+  sigprocmask(SIG_UNBLOCK, &set, nullptr);
+  raise(signal);
+  return 128 + signal;
+}
+
+// Runs the command on `root` and returns its wait status.
+int run_command(char **command, const std::string &root, const sigset_t &signals, const sigset_t &before) {
+  const pid_t child = fork();
+  if (child < 0) {
+    complain_about("fork", errno);
+    return W_EXITCODE(EXIT_FAILURE, 0);
+  }
+  if (child == 0) {
+    sigprocmask(SIG_SETMASK, &before, nullptr);
+    become(command, root);
+  }
+  return attend(child, signals);
+}
+
+// A signal that came before there was a command to pass it on to, or 0.
+int early_signal(const sigset_t &signals) {
+  const timespec now{};
+  for (;;) {
+    const int signal = sigtimedwait(&signals, nullptr, &now);
+    if (signal != SIGCHLD) return std::max(signal, 0);
+  }
+}
+
+}  // namespace
+
+int run(const options &asked) {
+  sigset_t signals;
+  sigset_t before;
+  sigemptyset(&signals);
+  for (const int signal : passed_on) sigaddset(&signals, signal);
+  sigaddset(&signals, SIGCHLD);
+  sigprocmask(SIG_BLOCK, &signals, &before);
+  signal(SIGCHLD, SIG_DFL);  // a caller that ignores it would take the command's status with it
+
+  if (!asked.directory.empty()) {
+    std::error_code error;
+    const std::filesystem::path root = std::filesystem::canonical(asked.directory, error);
+    if (!error) return end_like(run_command(asked.command, root, signals, before));
+    complain_about(asked.directory, error.value());
+    return EXIT_FAILURE;
+  }
+  int status;
+  {
+    const temporary_directory directory;
+    simulator kernel;
+    if (directory.path().empty() || !kernel.start(asked, directory)) return EXIT_FAILURE;
+    const int early = early_signal(signals);
+    status = early ? W_EXITCODE(0, early) : run_command(asked.command, directory.path(), signals, before);
+  }
+  return end_like(status);
+}
+
+}  // namespace lab

@@ -1,0 +1,99 @@
+#include "lab/world.h"
+
+#include <algorithm>
+
+#include "lab/programs.h"
+
+namespace lab {
+
+namespace {
+
+// A machine of the usual size has these providers, a larger one has them several times over. So many
+// instances of each fit.
+struct provider_pattern {
+  nexus_kind kind;
+  std::uint32_t instances;
+};
+
+constexpr provider_pattern pattern[] = {
+    {nexus_kind::multistack, 1}, {nexus_kind::net_if, 1},      {nexus_kind::multistack, 1},
+    {nexus_kind::net_if, 1},     {nexus_kind::net_if, 1},      {nexus_kind::bridge, 1},
+    {nexus_kind::user_pipe, 3},  {nexus_kind::kernel_pipe, 3}, {nexus_kind::scratch_pipe, 2},
+};
+constexpr std::uint32_t pattern_instances = 14;
+constexpr std::uint32_t most_instances = 3;
+
+void start_processes(world &state) {
+  const std::uint32_t count = state.size.processes;
+  const std::uint32_t gap = std::clamp<std::uint32_t>(60'000 / std::max(count, 1U), 1, 60);
+  std::int32_t pid = 60;
+  for (std::uint32_t i = 0; i < count; ++i) {
+    pid += static_cast<std::int32_t>(state.random.between(1, gap));
+    state.processes.push_back({pid, i % program_count});
+    state.started.push_back(i);
+  }
+}
+
+// Deals out instances in turns: each provider gets one, then those that take more.
+void deal_instances(std::vector<provider> &providers, std::uint32_t count) {
+  if (providers.empty()) return;
+  for (std::uint32_t turn = 0; count; ++turn) {
+    for (std::size_t i = 0; i < providers.size() && count; ++i) {
+      if (turn % most_instances >= pattern[i % std::size(pattern)].instances) continue;
+      ++providers[i].nexus_count;
+      --count;
+    }
+  }
+}
+
+void register_providers(world &state) {
+  std::uint32_t of_kind[6] = {};
+  for (std::uint32_t i = 0; i < state.size.providers; ++i) {
+    const nexus_kind kind = pattern[i % std::size(pattern)].kind;
+    state.providers.push_back({state.random.identity(), kind, of_kind[static_cast<int>(kind)]++, 0, 0});
+  }
+  std::uint32_t count = state.size.nexuses;
+  if (count == none) count = (state.size.providers * pattern_instances + 8) / 9;
+  deal_instances(state.providers, count);
+  for (provider &owner : state.providers) {
+    owner.first_nexus = static_cast<std::uint32_t>(state.nexuses.size());
+    for (std::uint32_t i = 0; i < owner.nexus_count; ++i) {
+      // A provider's first instance has its ordinal, later ones follow the last provider's.
+      const std::uint32_t ordinal = i ? of_kind[static_cast<int>(owner.kind)]++ : owner.ordinal;
+      state.nexuses.push_back({state.random.identity(), owner.kind, true, ordinal});
+    }
+  }
+}
+
+}  // namespace
+
+world make_world(const sizes &size, std::uint64_t seed) {
+  world state{.size = size, .seed = seed, .random = random_source(seed)};
+  start_processes(state);
+  register_providers(state);
+  return state;
+}
+
+std::string interface_name(nexus_kind kind, std::uint32_t ordinal) {
+  static constexpr const char *prefixes[] = {"en", "en", "bridge"};
+  const auto row = static_cast<std::size_t>(kind);
+  return row < std::size(prefixes) ? prefixes[row] + std::to_string(ordinal) : std::string();
+}
+
+std::uint32_t interface_index(nexus_kind kind, std::uint32_t ordinal) {
+  if (kind > nexus_kind::bridge) return 0;
+  return kind == nexus_kind::bridge ? 5 + 2 * ordinal : 4 + 2 * ordinal;  // 1 to 3 are the system's own
+}
+
+// Pipes without a name come and go with those who talk through them.
+void advance(world &state, std::uint32_t /*milliseconds*/) {
+  state.started.clear();
+  state.ended.clear();
+  for (nexus &instance : state.nexuses) {
+    if (instance.kind != nexus_kind::scratch_pipe || !state.random.chance(1, 4)) continue;
+    instance.alive = !instance.alive;
+    if (instance.alive) instance.id = state.random.identity();
+  }
+}
+
+}  // namespace lab
