@@ -123,3 +123,15 @@ char *put_ipv6_address(char *to, const ipv6_address &address) {
   }
   return to;
 }
+
+format::small_text<16> address_text(const ipv4_address &address) {
+  format::small_text<16> text;
+  text.size = static_cast<std::size_t>(put_ipv4_address(text.chars, address) - text.chars);
+  return text;
+}
+
+format::small_text<46> address_text(const ipv6_address &address) {
+  format::small_text<46> text;
+  text.size = static_cast<std::size_t>(put_ipv6_address(text.chars, address) - text.chars);
+  return text;
+}

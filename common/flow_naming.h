@@ -40,6 +40,10 @@ format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6])
 char *put_ipv4_address(char *to, const ipv4_address &address);
 char *put_ipv6_address(char *to, const ipv6_address &address);
 
+// The same as texts.
+format::small_text<16> address_text(const ipv4_address &address);
+format::small_text<46> address_text(const ipv6_address &address);
+
 using ipv4_host_text = format::small_text<256>;
 using ipv6_host_text = format::small_text<50>;
 using endpoint_text = format::small_text<80>;

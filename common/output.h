@@ -49,7 +49,9 @@ class output {
   //
   // A write that fails ends the process: "write error: %s" and status 74, or quietly by SIGPIPE where the
   // reader has gone.
-  void flush() { drain(end_); }
+  void flush() {
+    if (end_ != begin_) drain(end_);
+  }
 
   // Flushes, closes the descriptor and reports what closing it says.
   void close();

@@ -51,6 +51,8 @@ int cmd_memory(int argc, char **argv);
 int cmd_netns(int argc, char **argv);
 int cmd_netstat(int argc, char **argv);
 int cmd_provider(int argc, char **argv);
+int cmd_show(int argc, char **argv);
+int cmd_tree(int argc, char **argv);
 
 extern const std::uint32_t channel_option_flags[];
 extern const option netns_options[];

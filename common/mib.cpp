@@ -1,0 +1,226 @@
+#include "common/mib.h"
+
+#include <algorithm>
+
+#include "common/channel.h"
+#include "common/flow.h"
+#include "common/invariant.h"
+#include "common/output.h"
+#include "common/provider.h"
+
+namespace {
+
+// A channel's record in the table, with its sort key.
+struct channel_position {
+  std::uint32_t port;
+  const std::byte *at;
+};
+
+// Ascending by port. Ports are compared by their 32-bit difference, so that they run in a circle: where they
+// all lie within one half of it, the first is the one behind the gap. Channels of one port keep the table's
+// order.
+void sort_by_port(std::vector<channel_position> &channels) {
+  const auto by_port = [](const channel_position &a, const channel_position &b) { return a.port < b.port; };
+  const auto gap = [](const channel_position &a, const channel_position &b) {
+    return b.port - a.port > 0x80000000;
+  };
+  std::stable_sort(channels.begin(), channels.end(), by_port);
+  const auto before_gap = std::adjacent_find(channels.begin(), channels.end(), gap);
+  if (before_gap != channels.end()) std::rotate(channels.begin(), before_gap + 1, channels.end());
+}
+
+// A key for the index of ports.
+uuid port_key(object_id parent, std::uint32_t port) {
+  uuid key{};
+  std::memcpy(key.bytes, &parent, sizeof parent);
+  std::memcpy(key.bytes + sizeof parent, &port, sizeof port);
+  return key;
+}
+
+}  // namespace
+
+int object_tree::scrape_tree() {
+  if (const int error = scrape_providers()) return error;
+  scrape_channels();
+  index_ports();
+  scrape_flows();
+  return 0;
+}
+
+int object_tree::scrape_providers() {
+  if (const int error = providers_.fetch(provider_list_node)) return error;
+  nodes_.push_back({.node = {.uuid = {}, .type = object_type::root}});
+  make_findable(root);
+  record_walk walk(providers_.bytes());
+  nexus_provider_record record;
+  std::span<const std::byte> instances;
+  for (const std::byte *at = walk.position(); walk.take(record, instances); at = walk.position()) {
+    const object_id provider =
+        append_child(root, {.uuid = record.provider_uuid,
+                            .type = object_type::nexus_provider,
+                            .payload = at + offsetof(nexus_provider_record, parameters)});
+    make_findable(provider);
+    record_walk uuids(instances);
+    for (uuid instance; uuids.take(instance);) {
+      make_findable(append_child(provider, {.uuid = instance, .type = object_type::nexus}));
+    }
+  }
+  if (!walk.at_end()) complain<"Buffer too short\n">();
+  return 0;
+}
+
+void object_tree::scrape_channels() {
+  if (channels_.fetch(channel_list_node) != 0) return;
+  record_walk walk(channels_.bytes());
+  while (!walk.at_end()) {
+    nexus_channel_header header;
+    if (walk.take(header)) {
+      if (header.channel_count == 0) continue;
+      if (scrape_group(walk, find_object(header.nexus_uuid), header.channel_count)) continue;
+    }
+    complain<"Buffer too short\n">();
+    return;
+  }
+}
+
+// Hangs the channels of a group under its nexus, in place of all that the node had, or steps over them where
+// there is no such node. A table that ends inside the group leaves the node with the channels before that, as
+// they come; the result is false then.
+bool object_tree::scrape_group(record_walk &walk, object_id nexus, std::uint32_t channel_count) {
+  std::vector<channel_position> channels;
+  bool whole = true;
+  for (std::uint32_t i = 0; i < channel_count && whole; ++i) {
+    const std::byte *const at = walk.position();
+    channel_entry channel;
+    std::span<const std::byte> rings;
+    whole = walk.take(channel, rings);
+    if (whole && nexus != no_object) channels.push_back({channel.port, at});
+  }
+  if (nexus == no_object) return whole;
+  if (whole) sort_by_port(channels);
+  release_children(nexus);
+  for (const channel_position &channel : channels) {
+    uuid channel_uuid;
+    std::memcpy(&channel_uuid, channel.at, sizeof channel_uuid);
+    make_findable(
+        append_child(nexus, {.uuid = channel_uuid, .type = object_type::channel, .payload = channel.at}));
+  }
+  return whole;
+}
+
+void object_tree::index_ports() {
+  for (object_id id = 0; id < nodes_.size(); ++id) {
+    if (nodes_[id].released || nodes_[id].node.type != object_type::channel) continue;
+    const object_node &channel = nodes_[id].node;
+    by_port_.add(port_key(channel.parent, channel.record<channel_entry>().port), id);
+  }
+}
+
+int object_tree::scrape_flows() {
+  if (const int error = flows_.fetch(flow_node_name)) return error;
+  require(flows_.size() % sizeof(tv_stats_flow) == 0,
+          {"scrape_flows", "common/mib", 223, "(length % sizeof (*sf)) == 0"});
+  nodes_.reserve(nodes_.size() + flows_.size() / sizeof(tv_stats_flow));
+  record_walk walk(flows_.bytes());
+  tv_stats_flow flow;
+  for (const std::byte *at = walk.position(); walk.take(flow); at = walk.position()) {
+    const object_id nexus = find_object(flow.sf_nx_uuid);
+    if (nexus == no_object) {
+      complain<"orphan flow orphan nx_uuid">();
+      continue;
+    }
+    const object_id channel = by_port_.find(port_key(nexus, flow.sf_nx_port));
+    if (channel != uuid_index::none)
+      append_child(channel, {.uuid = {}, .type = object_type::flow, .payload = at});
+  }
+  return 0;
+}
+
+// Adds a copy of `child` behind the children of `parent`. Siblings have ascending numbers.
+object_id object_tree::append_child(object_id parent, const object_node &child) {
+  const auto id = static_cast<object_id>(nodes_.size());
+  nodes_.push_back({.node = child});
+  nodes_[id].node.parent = parent;
+  object_node &above = nodes_[parent].node;
+  if (above.has_children()) {
+    nodes_[above.last_child].node.next_sibling = id;
+  } else {
+    above.first_child = id;
+  }
+  above.last_child = id;
+  return id;
+}
+
+// Takes everything below a node out of the tree.
+void object_tree::release_children(object_id top) {
+  object_id id = nodes_[top].node.first_child;
+  while (id != no_object) {
+    nodes_[id].released = true;
+    const object_node *node = &nodes_[id].node;
+    if (node->has_children()) {
+      id = node->first_child;
+      continue;
+    }
+    while (node->next_sibling == no_object && node->parent != top) node = &nodes_[node->parent].node;
+    id = node->next_sibling;
+  }
+  nodes_[top].node.first_child = nodes_[top].node.last_child = no_object;
+}
+
+// Adds a node to those that a search may find. Nodes with the same UUID are rare: a table made by the kernel
+// has none.
+void object_tree::make_findable(object_id id) {
+  const uuid &key = nodes_[id].node.uuid;
+  if (by_uuid_.add(key, id)) {
+    nodes_[id].found = id;
+    return;
+  }
+  entry &first = nodes_[by_uuid_.find(key)];
+  nodes_[id].next_same = first.next_same;
+  first.next_same = id;
+  if (first.found != no_object && !nodes_[first.found].released && precedes(id, first.found))
+    first.found = id;
+}
+
+object_id object_tree::find_object(const uuid &key) {
+  const object_id first_same = by_uuid_.find(key);
+  if (first_same == uuid_index::none) return no_object;
+  const object_id found = nodes_[first_same].found;
+  return found != no_object && !nodes_[found].released ? found : search(first_same);
+}
+
+// Finds the first of the nodes with one UUID anew, after the one known was taken out of the tree.
+object_id object_tree::search(object_id first_same) {
+  object_id found = no_object;
+  object_id *link = nullptr;
+  for (object_id id = first_same; id != no_object; id = nodes_[id].next_same) {
+    if (nodes_[id].released) {
+      if (link) *link = nodes_[id].next_same;
+    } else if (found == no_object || precedes(id, found)) {
+      found = id;
+    }
+    if (!nodes_[id].released || !link) link = &nodes_[id].next_same;
+  }
+  return nodes_[first_same].found = found;
+}
+
+// Whether `a` comes before `b` in depth-first pre-order.
+bool object_tree::precedes(object_id a, object_id b) const {
+  unsigned depth_a = depth(a);
+  unsigned depth_b = depth(b);
+  const bool a_is_higher = depth_a < depth_b;
+  for (; depth_a > depth_b; --depth_a) a = nodes_[a].node.parent;
+  for (; depth_b > depth_a; --depth_b) b = nodes_[b].node.parent;
+  if (a == b) return a_is_higher;
+  while (nodes_[a].node.parent != nodes_[b].node.parent) {
+    a = nodes_[a].node.parent;
+    b = nodes_[b].node.parent;
+  }
+  return a < b;
+}
+
+unsigned object_tree::depth(object_id id) const {
+  unsigned levels = 0;
+  for (; id != root; id = nodes_[id].node.parent) ++levels;
+  return levels;
+}

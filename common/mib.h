@@ -1,0 +1,101 @@
+// The kernel's objects as one tree: providers, their nexus instances, the channels of each and the flows that
+// use the channels' ports.
+
+#ifndef TARVELCTL_COMMON_MIB_H
+#define TARVELCTL_COMMON_MIB_H
+
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <vector>
+
+#include "common/kernel_table.h"
+#include "common/record_walk.h"
+#include "common/uuid_index.h"
+
+// What a node stands for, and what its payload is.
+enum class object_type : std::uint32_t {
+  root,            // the single root, with the null UUID; no payload
+  nexus_provider,  // nexus_provider_parameters
+  nexus,           // no payload
+  channel,         // channel_entry, its ring blocks behind it
+  flow,            // tv_stats_flow; has the null UUID
+};
+
+// "root", "nexus_provider", ..., or "???" for a value that is none.
+const char *object_type_name(object_type type);
+
+// A node, known by its number. Numbers are good as long as the tree.
+using object_id = std::uint32_t;
+inline constexpr object_id no_object = UINT32_MAX;
+
+struct object_node {
+  ::uuid uuid;
+  object_type type;
+  object_id parent = no_object;
+  object_id first_child = no_object;
+  object_id last_child = no_object;
+  object_id next_sibling = no_object;
+  const std::byte *payload = nullptr;  // in the table that it came from
+
+  bool has_children() const { return first_child != no_object; }
+
+  // The payload's record, or its fixed part.
+  template <class Record>
+  Record record() const {
+    Record value;
+    std::memcpy(&value, payload, sizeof value);
+    return value;
+  }
+};
+
+// The tree, as three snapshots taken one after the other give it. It owns the three tables, whose records are
+// its nodes' payloads. However deep a table makes the tree, walking and releasing it takes no more stack.
+class object_tree {
+ public:
+  static constexpr object_id root = 0;
+
+  // Builds the tree. Returns 0, or the error of the fetch when the provider table cannot be read; there is no
+  // tree then. What is wrong with the other tables is reported on standard error, and the tree has what could
+  // be read.
+  int scrape_tree();
+
+  const object_node &operator[](object_id id) const { return nodes_[id].node; }
+
+  // The first node with this UUID in depth-first pre-order, or no_object. Flows are not searched. The cost
+  // does not depend on the size of the tree.
+  object_id find_object(const uuid &key);
+
+  // Prints a node and all below it as nested JSON objects, without a line end behind the last brace.
+  void dump_object(object_id top) const;
+
+ private:
+  // A node and what the search needs. The nodes with one UUID are a list that starts at the first of them
+  // ever made, which also keeps the one that a search finds.
+  struct entry {
+    object_node node;
+    object_id next_same = no_object;
+    object_id found = no_object;
+    bool released = false;
+  };
+
+  int scrape_providers();
+  void scrape_channels();
+  bool scrape_group(record_walk &walk, object_id nexus, std::uint32_t channel_count);
+  void index_ports();
+  int scrape_flows();
+
+  object_id append_child(object_id parent, const object_node &child);
+  void release_children(object_id id);
+  void make_findable(object_id id);
+  object_id search(object_id first_same);
+  bool precedes(object_id a, object_id b) const;
+  unsigned depth(object_id id) const;
+
+  kernel_table providers_, channels_, flows_;
+  std::vector<entry> nodes_;
+  uuid_index by_uuid_;
+  uuid_index by_port_;  // channels, by the number of their parent and their port
+};
+
+#endif

@@ -1,0 +1,148 @@
+// The object tree as nested JSON objects, a member a line. Texts are printed as they are, without escapes.
+
+#include <arpa/inet.h>
+
+#include <algorithm>
+#include <iterator>
+#include <string_view>
+
+#include "common/channel.h"
+#include "common/flow.h"
+#include "common/flow_naming.h"
+#include "common/mib.h"
+#include "common/output.h"
+#include "common/output_helpers.h"
+#include "common/provider.h"
+
+namespace {
+
+using indent_text = std::string_view;
+
+// Three blanks a level, down to level 7; what lies deeper is indented as that.
+indent_text indent_of(unsigned level) {
+  constexpr indent_text deepest = "                     ";
+  return deepest.substr(0, std::min<std::size_t>(3 * level, deepest.size()));
+}
+
+void print_provider_payload(const object_node &node, indent_text indent) {
+  const auto p = node.record<nexus_provider_parameters>();
+  print<"%s\"name\":\"%s\",\n">(indent, p.shown_name());
+  print<"%s\"provider_type\":\"%s\",\n">(indent, provider_type_name(p.type, p.subtype));
+  print<"%s\"flags\":%d,\n">(indent, p.flags);
+  print<"%s\"anonymous\":%s,\n">(indent, p.flags & p.anonymous ? "true" : "false");
+  print<"%s\"format\":%d,\n">(indent, p.format);
+  print<"%s\"tx_rings\":%d,\n">(indent, p.tx_rings);
+  print<"%s\"rx_rings\":%d,\n">(indent, p.rx_rings);
+  print<"%s\"tx_slots\":%d,\n">(indent, p.tx_slots);
+  print<"%s\"rx_slots\":%d,\n">(indent, p.rx_slots);
+  print<"%s\"buf_size\":%d,\n">(indent, p.buf_size);
+  print<"%s\"meta_size\":%d,\n">(indent, p.meta_size);
+  print<"%s\"pipes\":%d,\n">(indent, p.pipes);
+  print<"%s\"mhints\":%d,\n">(indent, p.mhints);
+  print<"%s\"ifindex\":%d,\n">(indent, p.ifindex);
+}
+
+void print_channel_payload(const object_node &node, indent_text indent) {
+  const auto channel = node.record<channel_entry>();
+  char name[32];
+  print<"%s\"flags\":%d,\n">(indent, static_cast<int>(channel.flags));
+  print<"%s\"pid\":%d,\n">(indent, channel.pid);
+  print<"%s\"proc_name\":\"%s\",\n">(indent, pid_to_name(channel.pid, name, sizeof name, false));
+  print<"%s\"fd\":%d,\n">(indent, channel.fd);
+  print<"%s\"port\":%d,\n">(indent, static_cast<int>(channel.port));
+  print<"%s\"n_tx_rings\":%d,\n">(indent, static_cast<int>(channel.n_tx_rings));
+  print<"%s\"n_rx_rings\":%d,\n">(indent, static_cast<int>(channel.n_rx_rings));
+}
+
+template <class Address>
+void print_endpoint(indent_text indent, const char *side, const Address &address, std::uint16_t port) {
+  print<"%s\"%s_addr\":\"%s\",\n">(indent, side, address_text(address));
+  print<"%s\"%s_port\":%d,\n">(indent, side, static_cast<int>(ntohs(port)));
+}
+
+void print_endpoints(const tv_stats_flow &flow, indent_text indent) {
+  const socket_address &local = flow.sf_local;
+  const socket_address &remote = flow.sf_remote;
+  if (local.family == address_family::ipv6) {
+    print_endpoint(indent, "local", local.ipv6, local.port);
+    print_endpoint(indent, "remote", remote.ipv6, remote.port);
+  } else if (local.family == address_family::ipv4) {
+    print_endpoint(indent, "local", local.ipv4, local.port);
+    print_endpoint(indent, "remote", remote.ipv4, remote.port);
+  }
+}
+
+void print_flow_payload(const object_node &node, indent_text indent) {
+  const auto flow = node.record<tv_stats_flow>();
+  const tv_flow_endpoint_stats &in = flow.sf_rstats;
+  const tv_flow_endpoint_stats &out = flow.sf_lstats;
+  print_endpoints(flow, indent);
+  print<"%s\"protocol\":\"%s\",\n">(indent, proto_name(flow.sf_protocol));
+  print<"%s\"in_bytes\":%llu,\n">(indent, in.bytes);
+  print<"%s\"out_bytes\":%llu,\n">(indent, out.bytes);
+  print<"%s\"in_packets\":%llu,\n">(indent, in.packets);
+  print<"%s\"out_packets\":%llu,\n">(indent, out.packets);
+  print<"%s\"interface\":\"%s\",\n">(indent, flow.sf_if_name);
+  print<"%s\"flags\":\"%s\",\n">(indent, flow_flags_text(flow.sf_flags));
+  print<"%s\"local_state\":\"%s\",\n">(indent, flow_state_name(out.state));
+  print<"%s\"remote_state\":\"%s\",\n">(indent, flow_state_name(in.state));
+  print<"%s\"process\":\"%s\",\n">(indent, flow.sf_proc_name);
+  print<"%s\"pid\":%d,\n">(indent, flow.sf_pid);
+}
+
+// What the types differ in, by object_type.
+constexpr struct {
+  const char *name;
+  void (*print_payload)(const object_node &node, indent_text indent);
+} node_ops[] = {
+    {"root", nullptr},
+    {"nexus_provider", print_provider_payload},
+    {"nexus", nullptr},
+    {"channel", print_channel_payload},
+    {"flow", print_flow_payload},
+};
+
+// Everything of a node before its children.
+void open_node(const object_node &node, indent_text indent) {
+  print<"%s{\n">(indent);
+  print<"%s\"uuid\":\"%s\",\n">(indent, node.uuid);
+  print<"%s\"type\":\"%s\",\n">(indent, object_type_name(node.type));
+  const auto &ops = node_ops[static_cast<std::size_t>(node.type)];
+  if (ops.print_payload) ops.print_payload(node, indent);
+  if (node.has_children()) {
+    print<"%s\"children\": [\n">(indent);
+  } else {
+    print<"%s\"children\": []\n">(indent);
+  }
+}
+
+}  // namespace
+
+const char *object_type_name(object_type type) {
+  const auto index = static_cast<std::size_t>(type);
+  return index < std::size(node_ops) ? node_ops[index].name : "???";
+}
+
+void object_tree::dump_object(object_id top) const {
+  object_id id = top;
+  unsigned level = 0;
+  for (;;) {
+    open_node((*this)[id], indent_of(level));
+    if ((*this)[id].has_children()) {
+      id = (*this)[id].first_child;
+      ++level;
+      continue;
+    }
+    print<"%s}">(indent_of(level));
+    while (id != top && (*this)[id].next_sibling == no_object) {
+      print<" \n">();
+      id = (*this)[id].parent;
+      --level;
+      print<"%s]\n">(indent_of(level));
+      print<"%s}">(indent_of(level));
+    }
+    if (id == top) return;
+    print<",\n">();
+    id = (*this)[id].next_sibling;
+  }
+}

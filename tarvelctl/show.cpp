@@ -1,0 +1,75 @@
+// show and channel-stats: the ports of every multistack flow switch, with their owners and flows.
+
+#include <arpa/inet.h>
+
+#include "common/channel.h"
+#include "common/flow.h"
+#include "common/flow_naming.h"
+#include "common/invariant.h"
+#include "common/mib.h"
+#include "common/output.h"
+#include "common/output_helpers.h"
+#include "common/provider.h"
+#include "tarvelctl/command.h"
+
+namespace {
+
+// The first port of a client; those before it belong to the host and the device.
+constexpr std::uint32_t first_client_port = 2;
+
+// Calls `visit` with each child of a type.
+template <class Visit>
+void for_each_child(const object_tree &tree, const object_node &node, object_type type, Visit visit) {
+  for (object_id id = node.first_child; id != no_object; id = tree[id].next_sibling) {
+    if (tree[id].type == type) visit(tree[id]);
+  }
+}
+
+template <class Address>
+void print_endpoints(const tv_stats_flow &flow, Address socket_address::*address) {
+  print<"\t\t %s.%d <-> %s.%d\n">(
+      address_text(flow.sf_local.*address), static_cast<int>(ntohs(flow.sf_local.port)),
+      address_text(flow.sf_remote.*address), static_cast<int>(ntohs(flow.sf_remote.port)));
+}
+
+void print_flow(const object_node &node) {
+  const auto flow = node.record<tv_stats_flow>();
+  const std::uint8_t family = flow.sf_local.family;
+  require(family == address_family::ipv6 || family == address_family::ipv4,
+          {"cmd_show", "tarvelctl/tarvelctl", 2030, "0"});
+  if (family == address_family::ipv6) {
+    print_endpoints(flow, &socket_address::ipv6);
+  } else {
+    print_endpoints(flow, &socket_address::ipv4);
+  }
+}
+
+void print_port(const object_tree &tree, const object_node &node) {
+  const auto channel = node.record<channel_entry>();
+  if (channel.port < first_client_port) return;
+  char name[256];
+  const foreign_text owner = pid_to_name(channel.pid, name, sizeof name, true);
+  const char *status = channel.flags & channel.defunct ? highlight("defunct", colour::red) : "";
+  print<"\tPort[%2u] %-22s%s\n">(channel.port, owner, status);
+  for_each_child(tree, node, object_type::flow, print_flow);
+}
+
+void print_flow_switches(const object_tree &tree, const object_node &provider) {
+  const auto parameters = provider.record<nexus_provider_parameters>();
+  if (parameters.subtype != flow_switch_subtype::multistack) return;
+  for_each_child(tree, provider, object_type::nexus, [&](const object_node &nexus) {
+    print<"flow-switch %s %s\n">(nexus.uuid, parameters.name);
+    for_each_child(tree, nexus, object_type::channel,
+                   [&](const object_node &channel) { print_port(tree, channel); });
+  });
+}
+
+}  // namespace
+
+int cmd_show(int /*argc*/, char ** /*argv*/) {
+  object_tree tree;
+  if (tree.scrape_tree() != 0) return 0;
+  for_each_child(tree, tree[object_tree::root], object_type::nexus_provider,
+                 [&](const object_node &provider) { print_flow_switches(tree, provider); });
+  return 0;
+}
