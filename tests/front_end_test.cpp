@@ -24,6 +24,9 @@ const std::vector<std::string> command_names = {
     "memory",
     "netns",
     "provider",
+    "show",
+    "tree",
+    "channel-stats",
     "list-providers",
     "netstat",
 };

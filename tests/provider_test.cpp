@@ -93,7 +93,8 @@ TEST(provider, WithoutInstancesHasOnlyItsHeadingAndRings) {
 
 TEST(provider, ParametersAreSigned) {
   bytes record = provider("p");
-  for (const std::uint32_t at : {152, 156, 160, 164, 168, 172, 188}) record.u32(at, 0x80000000U + (at - 152));
+  for (const std::uint32_t at : {152U, 156U, 160U, 164U, 168U, 172U, 188U})
+    record.u32(at, 0x80000000U + (at - 152));
   EXPECT_EQ(list(record, "provider -D"),
             printed(heading("user-pipe p") +
                     "\trings: tx -2147483648 rx -2147483644 slots: tx -2147483640 rx -2147483636"
