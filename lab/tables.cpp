@@ -1,5 +1,7 @@
 #include "lab/tables.h"
 
+#include "common/channel.h"
+#include "common/flow.h"
 #include "common/provider.h"
 
 namespace lab {
@@ -8,6 +10,12 @@ namespace {
 
 constexpr table all_tables[] = {
     {provider_list_node, write_providers, nullptr},
+    {ring_stat_enable_node, write_ring_stat_enable, nullptr},
+    {channel_list_node, write_channels, pids_of_channels},
+    {flow_adv_node, write_advisories, pids_of_advisories},
+    {flow_owner_node, write_owners, pids_of_array<tv_stats_flow_owner, &tv_stats_flow_owner::sfo_pid>},
+    {flow_route_node, write_routes, nullptr},
+    {flow_node_name, write_flows, pids_of_array<tv_stats_flow, &tv_stats_flow::sf_pid>},
 };
 
 }  // namespace

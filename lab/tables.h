@@ -33,6 +33,14 @@ extern const std::span<const table> tables;
 
 // Each in the file of its name.
 void write_providers(const world &, table_file &);
+void write_channels(const world &, table_file &);
+void write_ring_stat_enable(const world &, table_file &);
+void write_flows(const world &, table_file &);
+void write_advisories(const world &, table_file &);
+void write_owners(const world &, table_file &);
+void write_routes(const world &, table_file &);
+void pids_of_channels(std::span<const std::byte>, std::vector<std::int32_t> &);
+void pids_of_advisories(std::span<const std::byte>, std::vector<std::int32_t> &);
 
 // The ids in a field of an array of records.
 template <class Record, std::int32_t Record::*Pid>

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "lab/programs.h"
+#include "lab/world_parts.h"
 
 namespace lab {
 
@@ -26,10 +27,10 @@ constexpr std::uint32_t most_instances = 3;
 void start_processes(world &state) {
   const std::uint32_t count = state.size.processes;
   const std::uint32_t gap = std::clamp<std::uint32_t>(60'000 / std::max(count, 1U), 1, 60);
-  std::int32_t pid = 60;
   for (std::uint32_t i = 0; i < count; ++i) {
-    pid += static_cast<std::int32_t>(state.random.between(1, gap));
-    state.processes.push_back({pid, i % program_count});
+    state.next_pid += static_cast<std::int32_t>(state.random.between(1, gap));
+    state.processes.push_back(
+        {.pid = state.next_pid, .program = i % static_cast<std::uint32_t>(programs.size())});
     state.started.push_back(i);
   }
 }
@@ -60,19 +61,18 @@ void register_providers(world &state) {
     for (std::uint32_t i = 0; i < owner.nexus_count; ++i) {
       // A provider's first instance has its ordinal, later ones follow the last provider's.
       const std::uint32_t ordinal = i ? of_kind[static_cast<int>(owner.kind)]++ : owner.ordinal;
-      state.nexuses.push_back({state.random.identity(), owner.kind, true, ordinal});
+      state.nexuses.push_back(
+          {.id = state.random.identity(), .kind = owner.kind, .alive = true, .ordinal = ordinal});
     }
+  }
+  state.multistacks.resize(of_kind[static_cast<int>(nexus_kind::multistack)], none);
+  for (std::uint32_t i = 0; i < state.nexuses.size(); ++i) {
+    const nexus &instance = state.nexuses[i];
+    if (instance.kind == nexus_kind::multistack) state.multistacks[instance.ordinal] = i;
   }
 }
 
 }  // namespace
-
-world make_world(const sizes &size, std::uint64_t seed) {
-  world state{.size = size, .seed = seed, .random = random_source(seed)};
-  start_processes(state);
-  register_providers(state);
-  return state;
-}
 
 std::string interface_name(nexus_kind kind, std::uint32_t ordinal) {
   static constexpr const char *prefixes[] = {"en", "en", "bridge"};
@@ -85,15 +85,39 @@ std::uint32_t interface_index(nexus_kind kind, std::uint32_t ordinal) {
   return kind == nexus_kind::bridge ? 5 + 2 * ordinal : 4 + 2 * ordinal;  // 1 to 3 are the system's own
 }
 
+world make_world(const sizes &size, std::uint64_t seed) {
+  constexpr std::uint32_t uptime = 5 * 3600 * 1000;
+  world state{.size = size, .seed = seed, .random = random_source(seed)};
+  start_processes(state);
+  register_providers(state);
+  open_channels(state);
+  move_traffic(state, uptime);
+  open_flows(state);
+  for (channel &used : state.channels) {
+    used.moved.out.forget_rates();
+    used.moved.in.forget_rates();
+  }
+  move_traffic(state, 1000);
+  return state;
+}
+
 // Pipes without a name come and go with those who talk through them.
-void advance(world &state, std::uint32_t /*milliseconds*/) {
-  state.started.clear();
-  state.ended.clear();
+void replace_pipes(world &state, std::uint32_t milliseconds) {
   for (nexus &instance : state.nexuses) {
-    if (instance.kind != nexus_kind::scratch_pipe || !state.random.chance(1, 4)) continue;
+    if (instance.kind != nexus_kind::scratch_pipe || !state.random.chance(milliseconds, 4000)) continue;
     instance.alive = !instance.alive;
     if (instance.alive) instance.id = state.random.identity();
   }
+}
+
+void advance(world &state, std::uint32_t milliseconds) {
+  state.started.clear();
+  state.ended.clear();
+  state.elapsed += milliseconds;
+  replace_pipes(state, milliseconds);
+  replace_channels(state, milliseconds);
+  replace_flows(state, milliseconds);
+  move_traffic(state, milliseconds);
 }
 
 }  // namespace lab

@@ -9,7 +9,10 @@
 #include <vector>
 
 #include "common/uuid.h"
+#include "lab/addresses.h"
+#include "lab/programs.h"
 #include "lab/random.h"
+#include "lab/traffic.h"
 
 namespace lab {
 
@@ -30,12 +33,14 @@ struct sizes {
   std::uint32_t processes = 13;
 };
 
-enum class nexus_kind : std::uint8_t { multistack, net_if, bridge, user_pipe, kernel_pipe, scratch_pipe };
-
 struct process {
-  std::int32_t pid;
-  std::uint32_t program;  // index into `programs`
+  std::int32_t pid;  // 0 while it does not run
+  std::uint32_t program;
+  std::uint32_t channels = 0;  // how many it has open
+  std::int32_t next_fd = 0;
 };
+
+enum class nexus_kind : std::uint8_t { multistack, net_if, bridge, user_pipe, kernel_pipe, scratch_pipe };
 
 struct provider {
   uuid id;
@@ -50,6 +55,62 @@ struct nexus {
   nexus_kind kind;
   bool alive;
   std::uint32_t ordinal;  // among those of its kind; also the number of its interface
+  std::uint32_t first_channel;
+  std::uint32_t channel_count;
+  two_way<traffic> moved;  // over its interface
+};
+
+struct channel {
+  enum class phase : std::uint8_t { open, defunct, closed };
+  static constexpr std::uint32_t device_port = 0;
+  static constexpr std::uint32_t host_port = 1;
+
+  uuid id;
+  std::uint32_t nexus;
+  std::uint32_t port;
+  std::uint32_t process;
+  std::uint32_t flow_switch;  // whose flows it may have, or none
+  std::int32_t fd;
+  phase state;
+  std::uint32_t left = 0;       // milliseconds until a defunct one is closed, a closed one opened
+  std::uint32_t listeners = 0;  // how many it has had
+  two_way<meter> moved;
+  stack_totals stack;  // of what its flows moved
+};
+
+// A multistack nexus with channels that may have flows.
+struct flow_switch {
+  std::uint32_t nexus;
+  std::uint32_t first_route;
+  std::uint32_t route_count;
+  std::uint32_t advisories = 0;  // entries of its list
+  std::vector<std::uint32_t> free_advisories;
+  stack_totals closed;  // of channels that are no more
+};
+
+struct route {
+  std::uint32_t flow_switch;
+  address_kind kind;
+  bool on_link;
+  socket_address remote;  // without port
+  std::uint32_t flows;    // that use it
+  std::uint32_t used;     // how often, which makes the ports of its flows differ
+  std::uint32_t rtt;      // microseconds
+};
+
+struct flow {
+  uuid id;
+  std::uint32_t channel;
+  std::uint32_t route;  // none: it has no remote end
+  const service *use;
+  std::uint16_t local_port;
+  std::uint16_t remote_port;
+  std::uint8_t state;  // tcp::state
+  bool ipv6;
+  bool controlled;         // by its advisory
+  std::uint32_t advisory;  // index in the switch's list, or none
+  two_way<std::uint32_t> packets_per_second;
+  two_way<traffic> moved;
 };
 
 struct world {
@@ -59,7 +120,16 @@ struct world {
 
   std::vector<process> processes;
   std::vector<provider> providers;
-  std::vector<nexus> nexuses;  // those of a provider stand together
+  std::vector<nexus> nexuses;     // those of a provider stand together
+  std::vector<channel> channels;  // those of a nexus stand together
+  std::vector<flow_switch> switches;
+  std::vector<route> routes;  // those of a switch stand together
+  std::vector<flow> flows;
+
+  std::vector<std::uint32_t> flow_channels;  // indexes of the channels that may have flows
+  std::vector<std::uint32_t> multistacks;    // indexes of the multistack nexuses, by ordinal
+  std::int32_t next_pid = 60;
+  std::uint64_t elapsed = 0;  // milliseconds
 
   // Since the world was published last.
   std::vector<std::uint32_t> started;  // indexes of processes

@@ -1,0 +1,133 @@
+// kern.tarvel.nexus_channel_list and kern.tarvel.ring_stat_enable
+
+#include "common/channel.h"
+
+#include <algorithm>
+
+#include "lab/tables.h"
+
+namespace lab {
+
+namespace {
+
+constexpr std::uint32_t buffer_size = 2048;
+
+// The share of ring `number` among `rings`, so that the rings sum up to the channel.
+std::uint64_t part(std::uint64_t total, std::uint32_t number, std::uint32_t rings) {
+  return total / rings + (number < total % rings);
+}
+
+std::uint32_t part(std::uint32_t total, std::uint32_t number, std::uint32_t rings) {
+  return static_cast<std::uint32_t>(part(std::uint64_t{total}, number, rings));
+}
+
+// What a ring moves, in operations of about `batch` slots. A packet takes a slot.
+ring_activity activity_of(const meter &moved, std::uint32_t batch, std::uint32_t number,
+                          std::uint32_t rings) {
+  const std::uint64_t slots = part(moved.total.packets, number, rings);
+  return {.slots = slots,
+          .bytes = part(moved.total.bytes, number, rings),
+          .count = (slots + batch - 1) / batch,
+          .min_slots = slots > 0,
+          .max_slots = static_cast<std::uint32_t>(std::min<std::uint64_t>(slots, 8 * batch)),
+          .slots_per_sec = part(moved.packets_per_second, number, rings),
+          .slots_per_sec_avg = part(moved.packets_average, number, rings),
+          .bytes_per_sec = part(moved.bytes_per_second, number, rings),
+          .bytes_per_sec_avg = part(moved.bytes_average, number, rings)};
+}
+
+// The sync side's rates are those of one sync.
+void set_per_sync(ring_activity &sync) {
+  const std::uint64_t count = std::max<std::uint64_t>(sync.count, 1);
+  sync.slots_per_sec_avg = static_cast<std::uint32_t>(sync.slots / count);
+  sync.bytes_per_sec_avg = sync.bytes / count;
+  const std::uint64_t size = sync.bytes / std::max<std::uint64_t>(sync.slots, 1);
+  sync.slots_per_sec = std::min(sync.slots_per_sec, sync.slots_per_sec_avg + (sync.slots_per_sec & 1));
+  sync.bytes_per_sec = sync.slots_per_sec * size;
+}
+
+void put_rings(const meter &moved, const uuid &id, std::uint32_t batch, std::uint32_t rings,
+               table_file &file) {
+  for (std::uint32_t number = 0; number < rings; ++number) {
+    ring_stats ring{};
+    ring.ring_id = number;
+    ring.xfer = activity_of(moved, batch, number, rings);
+    ring.sync = activity_of(moved, 2 * batch, number, rings);
+    set_per_sync(ring.sync);
+    constexpr std::uint32_t slots = 512;
+    ring.mem_total = slots * buffer_size;
+    // What waits in the ring: about 20 ms of traffic.
+    ring.mem_used = std::min(slots, ring.xfer.slots_per_sec / 50) * buffer_size;
+    // A rare channel has a peer that does not keep to the rules.
+    if (id.bytes[4] < 12) ring.err_len_modified = ring.xfer.slots / 90'000;
+    if (id.bytes[4] < 4) ring.err_corrupted = ring.xfer.slots / 1'300'000;
+    file.put(ring);
+  }
+}
+
+std::uint32_t flags_of(const world &state, const channel &source) {
+  constexpr std::uint32_t monitor = 0x1 | 0x2 | 0x4;  // sends, receives, without copies
+  constexpr std::uint32_t user_pool = 0x8;
+  constexpr std::uint32_t may_be_taken = 0x10;
+  constexpr std::uint32_t exclusive = 0x20;
+  if (source.state == channel::phase::defunct) return user_pool | may_be_taken | channel_entry::defunct;
+  if (source.flow_switch != none) return user_pool | may_be_taken;
+  switch (state.nexuses[source.nexus].kind) {
+    case nexus_kind::net_if:
+      return monitor;
+    case nexus_kind::user_pipe:
+      return 0;
+    case nexus_kind::kernel_pipe:
+      return user_pool | exclusive;
+    default:
+      return source.port <= channel::host_port ? exclusive : user_pool;
+  }
+}
+
+void put_channel(const world &state, const channel &source, table_file &file) {
+  const std::uint32_t tx_rings = (state.size.rings + 1) / 2;
+  const std::uint32_t rx_rings = state.size.rings / 2;
+  file.put(channel_entry{.channel_uuid = source.id,
+                         .flags = flags_of(state, source),
+                         .pid = state.processes[source.process].pid,
+                         .fd = source.fd,
+                         .port = source.port,
+                         .n_tx_rings = tx_rings,
+                         .n_rx_rings = rx_rings});
+  put_rings(source.moved.out, source.id, 4, tx_rings, file);
+  put_rings(source.moved.in, source.id, 8, rx_rings, file);
+}
+
+}  // namespace
+
+void write_channels(const world &state, table_file &file) {
+  for (const nexus &place : state.nexuses) {
+    if (!place.alive) continue;
+    const auto channels = std::span(state.channels).subspan(place.first_channel, place.channel_count);
+    const auto is_there = [](const channel &source) { return source.state != channel::phase::closed; };
+    file.put(nexus_channel_header{
+        .nexus_uuid = place.id,
+        .channel_count = static_cast<std::uint32_t>(std::ranges::count_if(channels, is_there))});
+    for (const channel &source : channels) {
+      if (is_there(source)) put_channel(state, source, file);
+    }
+  }
+}
+
+void pids_of_channels(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
+  record_walk walk(table);
+  for (nexus_channel_header header; walk.take(header);) {
+    channel_entry entry;
+    std::span<const std::byte> rings;
+    for (std::uint32_t left = header.channel_count; left; --left) {
+      if (!walk.take(entry, rings)) return;
+      pids.push_back(entry.pid);
+    }
+  }
+}
+
+void write_ring_stat_enable(const world & /*state*/, table_file &file) {
+  file.put(std::byte{1});
+}
+
+}  // namespace lab

@@ -1,0 +1,39 @@
+// kern.tarvel.stats.flow_adv
+
+#include "common/flow.h"
+#include "lab/tables.h"
+
+namespace lab {
+
+void write_advisories(const world &state, table_file &file) {
+  std::vector<std::vector<tv_stats_flow_adv_entry>> lists(state.switches.size());
+  for (std::size_t i = 0; i < lists.size(); ++i) lists[i].resize(state.switches[i].advisories);
+  for (const flow &source : state.flows) {
+    if (source.advisory == none) continue;
+    lists[state.channels[source.channel].flow_switch][source.advisory] = {
+        .sfae_flow_uuid = source.id,
+        .sfae_flags =
+            tv_stats_flow_adv_entry::valid | (source.controlled ? tv_stats_flow_adv_entry::controlled : 0)};
+  }
+  for (std::size_t i = 0; i < lists.size(); ++i) {
+    const nexus &carrier = state.nexuses[state.switches[i].nexus];
+    // The switch belongs to whoever has its first port.
+    const channel &first = state.channels[carrier.first_channel + (carrier.channel_count > 1)];
+    tv_stats_flow_adv record{.sfa_nx_uuid = carrier.id,
+                             .sfa_pid = state.processes[first.process].pid,
+                             .sfa_entries_count = state.switches[i].advisories};
+    set_text(record.sfa_if_name, interface_name(carrier.kind, carrier.ordinal));
+    file.put(record);
+    file.put(std::as_bytes(std::span(lists[i])));
+  }
+}
+
+void pids_of_advisories(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
+  record_walk walk(table);
+  std::span<const std::byte> entries;
+  for (tv_stats_flow_adv record; walk.take(record, entries);) {
+    pids.push_back(record.sfa_pid);
+  }
+}
+
+}  // namespace lab

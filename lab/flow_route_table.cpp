@@ -1,0 +1,51 @@
+// kern.tarvel.stats.flow_route
+
+#include "common/flow.h"
+#include "lab/tables.h"
+
+namespace lab {
+
+namespace {
+
+enum route_flag : std::uint32_t { on_link = 0x10, resolved = 0x40 };
+
+constexpr std::uint32_t lifetime = 1200;  // seconds
+
+// Of whoever sends the frames on: the gateway's is the same for all routes of an interface. 02 marks
+// addresses that no vendor gave out.
+void set_mac(const world &state, tv_stats_flow_route &record, std::uint32_t ordinal, std::size_t number) {
+  random_source random(state.seed, 3, number == none ? ordinal : std::uint64_t{number} << 32);
+  const std::uint64_t digits = random.next();
+  record.sfr_mac[0] = 0x02;
+  for (unsigned i = 1; i < 6; ++i) record.sfr_mac[i] = static_cast<std::uint8_t>(digits >> 8 * i);
+}
+
+}  // namespace
+
+void write_routes(const world &state, table_file &file) {
+  for (std::size_t i = 0; i < state.routes.size(); ++i) {
+    const route &way = state.routes[i];
+    if (way.flows == 0) continue;
+    const nexus &carrier = state.nexuses[state.switches[way.flow_switch].nexus];
+    random_source random(state.seed, 2, i);
+    tv_stats_flow_route record{};
+    set_text(record.sfr_if_name, interface_name(carrier.kind, carrier.ordinal));
+    record.sfr_bidx = random.below(256);
+    record.sfr_ibidx = random.below(256);
+    record.sfr_refs = way.flows;
+    record.sfr_local = interface_address(state.seed, carrier.ordinal, way.kind);
+    record.sfr_remote = way.remote;
+    // It is resolved anew from time to time; shortly before, there is no one to send frames to.
+    const std::uint64_t age = state.elapsed / 1000 + random.below(lifetime);
+    record.sfr_expire = lifetime - static_cast<std::int64_t>(age % lifetime);
+    record.sfr_flags = way.on_link ? on_link : tv_stats_flow_route::has_gateway;
+    if (!way.on_link) record.sfr_gateway = gateway_address(carrier.ordinal, way.kind != address_kind::ipv4);
+    if (record.sfr_expire > lifetime / 20) {
+      record.sfr_flags |= resolved | tv_stats_flow_route::has_mac;
+      set_mac(state, record, carrier.ordinal, way.on_link ? i : none);
+    }
+    file.put(record);
+  }
+}
+
+}  // namespace lab

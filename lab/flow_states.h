@@ -1,0 +1,62 @@
+// The states of flows, by the numbers that the kernel gives them.
+
+#ifndef TARVELCTL_LAB_FLOW_STATES_H
+#define TARVELCTL_LAB_FLOW_STATES_H
+
+#include <cstdint>
+
+#include "lab/world.h"
+
+namespace lab {
+
+namespace tcp {
+enum state : std::uint8_t {
+  closed,
+  listening,
+  syn_sent,
+  syn_received,
+  established,
+  close_wait,
+  fin_wait_1,
+  closing,
+  last_ack,
+  fin_wait_2,
+  time_wait,
+  gone  // no flow any more, whatever its protocol
+};
+}  // namespace tcp
+
+// Ends without connection state: by how many packets they have sent.
+namespace datagram {
+inline constexpr std::uint32_t no_traffic = 20;
+inline constexpr std::uint32_t single = 21;
+inline constexpr std::uint32_t multiple = 22;
+}  // namespace datagram
+
+struct tcp_behaviour {
+  tcp::state remote;  // the other end's state
+  bool sends;
+  bool receives;
+  std::uint32_t lasts;  // milliseconds on average; 0: until the channel is closed
+  tcp::state next;
+  tcp::state instead;  // sometimes
+  std::uint32_t percent_instead;
+};
+const tcp_behaviour &behaviour_of(std::uint8_t state);
+
+// The states of a flow's ends.
+two_way<std::uint32_t> states_of(const flow &source);
+
+// Whether the ends have, or had, a connection.
+bool was_connected(const flow &source);
+
+// Enters a state: what no longer sends or receives falls silent, a connection that is established becomes
+// busy.
+void enter(world &state, flow &walker, tcp::state next);
+
+// Gives a flow its rates.
+void make_busy(world &state, flow &moving);
+
+}  // namespace lab
+
+#endif

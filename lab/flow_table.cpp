@@ -1,0 +1,78 @@
+// kern.tarvel.stats.flow
+
+#include "common/flow.h"
+
+#include "lab/flow_states.h"
+#include "lab/tables.h"
+
+namespace lab {
+
+namespace {
+
+enum flow_flag : std::uint32_t {
+  tracked = 0x10,
+  connected = 0x20,
+  listener = 0x40,
+  marked = 0x100,  // its packets carry their service class
+  waits_for_close = 0x1000,
+  tells_close = 0x2000,
+};
+
+std::uint32_t flags_of(const flow &source) {
+  std::uint32_t flags = 0;
+  if (source.use->urgency != best_effort) flags |= marked;
+  if (source.route == none) return flags | listener;
+  flags |= connected;
+  if (source.use->protocol != tcp_protocol) return flags;
+  flags |= tracked;
+  if (source.state == tcp::time_wait || source.state == tcp::closed) return flags | waits_for_close;
+  return source.state > tcp::established ? flags | tells_close : flags;
+}
+
+// Measured where there is a connection; about the route's, a little different each time.
+std::uint32_t round_trip_time(const world &state, const flow &source, std::uint64_t side) {
+  if (!was_connected(source) || source.route == none) return 0;
+  random_source random(state.seed ^ side, source.id.bytes[3], source.id.bytes[5] + state.elapsed);
+  const std::uint32_t usual = state.routes[source.route].rtt;
+  return usual + random.below(usual / 4 + 1);
+}
+
+tv_flow_endpoint_stats end_of(const traffic &moved, std::uint32_t end_state, std::uint32_t rtt) {
+  return {.bytes = moved.bytes, .packets = moved.packets, .state = end_state, .rtt = rtt};
+}
+
+}  // namespace
+
+void write_flows(const world &state, table_file &file) {
+  for (const flow &source : state.flows) {
+    const channel &user = state.channels[source.channel];
+    const nexus &carrier = state.nexuses[user.nexus];
+    const process &owner = state.processes[user.process];
+    tv_stats_flow record{};
+    record.sf_nx_uuid = carrier.id;
+    set_text(record.sf_if_name, interface_name(carrier.kind, carrier.ordinal));
+    record.sf_bucket = source.id.bytes[0] % 16 ? source.id.bytes[1] : no_index;
+    set_text(record.sf_proc_name, programs[owner.program].name);
+    record.sf_pid = owner.pid;
+    record.sf_flags = flags_of(source);
+    record.sf_nx_port = user.port;
+    if (source.route == none) {
+      record.sf_local = record.sf_remote = any_address(source.ipv6);
+    } else {
+      const route &way = state.routes[source.route];
+      record.sf_local = interface_address(state.seed, carrier.ordinal, way.kind);
+      record.sf_remote = way.remote;
+    }
+    set_port(record.sf_local, source.local_port);
+    set_port(record.sf_remote, source.remote_port);
+    record.sf_protocol = source.use->protocol;
+    record.sf_svc = source.use->urgency;
+    record.sf_adv_idx = source.advisory;
+    const two_way<std::uint32_t> ends = states_of(source);
+    record.sf_lstats = end_of(source.moved.out, ends.out, round_trip_time(state, source, 1));
+    record.sf_rstats = end_of(source.moved.in, ends.in, round_trip_time(state, source, 2));
+    file.put(record);
+  }
+}
+
+}  // namespace lab
