@@ -1,0 +1,196 @@
+#!/usr/bin/env python3
+"""Interrupts the tool at random moments and looks at what it left behind.
+
+Each run is `tarvelctl -w 1 provider -D` on a kernel with many providers, ended by SIGINT. It writes to a file by
+-f, to a pipe that is read, or to a pipe whose reader stops after a random number of bytes. A run passes when its
+status is 0, standard error is empty, it ended in time, and its output is a prefix of the true output that is cut
+at the end of a line.
+"""
+
+import argparse
+import os
+import random
+import re
+import select
+import signal
+import struct
+import subprocess
+import sys
+import tempfile
+import threading
+import time
+import uuid
+
+HEADING = re.compile(rb"\n(\d{4}-\d\d-\d\d \d\d:\d\d:\d\d\n)?")
+
+
+def make_providers(count, randomness):
+    """Returns a provider table and its true listing with details."""
+    table, listing = [], []
+    for index in range(count):
+        name = f"provider-{index}"
+        own, *instances = (uuid.UUID(int=randomness.getrandbits(128)) for _ in range(1 + randomness.randrange(4)))
+        tx, rx = randomness.randrange(100), -index
+        record = bytearray(264)
+        record[0:16] = own.bytes
+        record[64 : 64 + len(name)] = name.encode()
+        struct.pack_into("<II", record, 128, len(name), 2)
+        struct.pack_into("<ii", record, 152, tx, rx)
+        struct.pack_into("<I", record, 256, len(instances))
+        table.append(bytes(record) + b"".join(instance.bytes for instance in instances))
+        listing.append(f"net-if {name} {str(own).upper()}\n")
+        listing.append(f"\trings: tx {tx} rx {rx} slots: tx 0 rx 0 bufsize 0 metasize 0 mhints 0\n")
+        listing.extend(f"\tinstance {str(instance).upper()}\n" for instance in instances)
+    return b"".join(table), "".join(listing).encode()
+
+
+def where_cut(output, listing):
+    """Says where a run's output ends, or None where it is not a prefix of whole lines of the true output."""
+    if not output:
+        return "before the first line"
+    if not output.endswith(b"\n"):
+        return None
+    at = 0
+    while at < len(output):
+        heading = HEADING.match(output, at)
+        if not heading:
+            return None
+        at = heading.end()
+        rest = output[at : at + len(listing)]
+        if not listing.startswith(rest):
+            return None
+        at += len(rest)
+        if len(rest) < len(listing):
+            return "inside a listing" if at == len(output) else None
+    return "between two listings"
+
+
+class Reader(threading.Thread):
+    """Reads a pipe: to its end, or so many bytes until rest() is called."""
+
+    def __init__(self, pipe, limit=None):
+        super().__init__()
+        self.pipe, self.limit, self.data = pipe, limit, bytearray()
+        self.start()
+
+    def run(self):
+        while self.limit is None or len(self.data) < self.limit:
+            got = os.read(self.pipe, 65536 if self.limit is None else min(65536, self.limit - len(self.data)))
+            if not got:
+                return
+            self.data += got
+
+    def rest(self):
+        self.join()
+        self.limit = None
+        self.run()
+        return bytes(self.data)
+
+
+def wait_for_handler(pid):
+    """Returns once the process catches SIGINT."""
+    mask = 1 << (signal.SIGINT - 1)
+    while True:
+        with open(f"/proc/{pid}/status", encoding="ascii") as status:
+            caught = re.search(r"^SigCgt:\s*(\w+)", status.read(), re.MULTILINE)
+        if int(caught[1], 16) & mask:
+            return
+
+
+class Torture:
+    def __init__(self, program, root, listing, limit, randomness):
+        self.program, self.root, self.listing, self.limit = program, root, listing, limit
+        self.random = randomness
+        started = time.monotonic()
+        true_output = subprocess.run([program, "provider", "-D"], env=self.environment(), capture_output=True)
+        self.run_time = time.monotonic() - started
+        if true_output.stdout != listing:
+            sys.exit("the listing is wrong even without interrupts")
+
+    def environment(self):
+        return {**os.environ, "TARVEL_ROOT": self.root}
+
+    def moment(self):
+        """Mostly inside the first run, now and then in the sleep or the second run."""
+        return self.random.uniform(0, 1.3 if self.random.random() < 0.05 else 0.5 * self.run_time)
+
+    def interrupt_one(self, kind):
+        """Returns where the output of one run ends and how long the process took to end, or raises."""
+        path = os.path.join(self.root, "output")
+        redirection = ["-f", path] if kind == "file" else []
+        with open(path, "wb"):
+            pass
+        process = subprocess.Popen(
+            [self.program, "-w", "1", *redirection, "provider", "-D"],
+            env=self.environment(), stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        limit = self.random.randrange(len(self.listing)) if kind == "stopped pipe" else None
+        reader = Reader(process.stdout.fileno(), limit)
+        wait_for_handler(process.pid)
+        time.sleep(self.moment())
+
+        interrupted = time.monotonic()
+        process.send_signal(signal.SIGINT)
+        end = os.pidfd_open(process.pid)
+        ended = select.select([end], [], [], 20)[0]
+        took = time.monotonic() - interrupted
+        os.close(end)
+        if not ended:
+            process.kill()
+        output, errors = reader.rest(), process.stderr.read()
+        process.stdout.close()
+        process.stderr.close()
+        if process.wait() != 0 or errors:
+            raise AssertionError(f"status {process.returncode}, standard error {errors!r}")
+        if took > self.limit:
+            raise AssertionError(f"ended only after {took:.3f} s")
+        if kind == "file":
+            if output:
+                raise AssertionError(f"{len(output)} bytes on standard output")
+            with open(path, "rb") as file:
+                output = file.read()
+        cut = where_cut(output, self.listing)
+        if cut is None:
+            raise AssertionError(f"{len(output)} bytes of output are no prefix; they end in {output[-60:]!r}")
+        return cut, took
+
+    def interrupt_many(self, kind, count):
+        """Returns the number of runs that failed."""
+        failed, slowest, cuts = 0, 0.0, {}
+        for number in range(count):
+            try:
+                cut, took = self.interrupt_one(kind)
+                cuts[cut] = cuts.get(cut, 0) + 1
+                slowest = max(slowest, took)
+            except AssertionError as reason:
+                failed += 1
+                print(f"{kind}: run {number}: {reason}")
+        ends = ", ".join(f"{cuts[cut]} {cut}" for cut in sorted(cuts))
+        print(f"{kind}: {count} interrupts, {failed} failed; output ends {ends}; slowest end {slowest:.3f} s", flush=True)
+        return failed
+
+
+def main():
+    parser = argparse.ArgumentParser(description=__doc__, formatter_class=argparse.RawDescriptionHelpFormatter)
+    parser.add_argument("program")
+    parser.add_argument("--count", type=int, default=1000, help="interrupts for each kind of output")
+    parser.add_argument("--limit", type=float, default=0.2, help="seconds that a process may take to end")
+    parser.add_argument("--providers", type=int, default=10_000)
+    parser.add_argument("--seed", type=int, default=None)
+    options = parser.parse_args()
+    seed = random.randrange(2**32) if options.seed is None else options.seed
+    print(f"seed {seed}")
+    randomness = random.Random(seed)
+    table, listing = make_providers(options.providers, randomness)
+    with tempfile.TemporaryDirectory() as root:
+        node = os.path.join(root, "proc/sys/kern/tarvel/nexus_provider_list")
+        os.makedirs(os.path.dirname(node))
+        with open(node, "wb") as file:
+            file.write(table)
+        torture = Torture(options.program, root, listing, options.limit, randomness)
+        kinds = ["file", "pipe", "stopped pipe"]
+        failed = sum([torture.interrupt_many(kind, options.count) for kind in kinds])
+    sys.exit(1 if failed else 0)
+
+
+if __name__ == "__main__":
+    main()
