@@ -14,21 +14,8 @@ constexpr char provider_list[] = "kern.tarvel.nexus_provider_list";
 
 // All commands, in the order of the usage text.
 const std::vector<std::string> command_names = {
-    "channel",
-    "flow",
-    "flow-adv",
-    "flow-owner",
-    "flow-route",
-    "flow-switch",
-    "interface",
-    "memory",
-    "netns",
-    "provider",
-    "show",
-    "tree",
-    "channel-stats",
-    "list-providers",
-    "netstat",
+    "channel", "flow",     "flow-adv", "flow-owner", "flow-route",    "flow-switch",    "interface", "memory",
+    "netns",   "provider", "show",     "tree",       "channel-stats", "list-providers", "netstat",
 };
 
 std::string usage_text(const std::string &program = "tarvelctl") {
