@@ -1,5 +1,6 @@
 #include "common/flow_naming.h"
 
+#include <array>
 #include <iterator>
 
 const char *proto_name(std::uint8_t protocol) {
@@ -8,32 +9,38 @@ const char *proto_name(std::uint8_t protocol) {
   return protocol == tcp ? "tcp" : protocol == udp ? "udp" : "unk.";
 }
 
-const char *flow_state_name(std::uint32_t state) {
-  static constexpr const char *names[] = {
-      "CLOSED",     "LISTEN",  "SYN_SENT", "SYN_RCVD",   "ESTABLISHED", "CLOSE_WAIT",
-      "FIN_WAIT_1", "CLOSING", "LAST_ACK", "FIN_WAIT_2", "TIME_WAIT",
+const format::name_text &flow_state_name(std::uint32_t state) {
+  using format::name;
+  static constexpr format::name_text unknown = name("UNKNOWN");
+  static constexpr format::name_text names[] = {
+      name("CLOSED"),      name("LISTEN"),     name("SYN_SENT"),   name("SYN_RCVD"),
+      name("ESTABLISHED"), name("CLOSE_WAIT"), name("FIN_WAIT_1"), name("CLOSING"),
+      name("LAST_ACK"),    name("FIN_WAIT_2"), name("TIME_WAIT"),
   };
   // States of flows without connection state.
-  static constexpr const char *connectionless[] = {"NO_TRAFFIC", "SINGLE", "MULTIPLE"};
-  constexpr std::uint32_t first_connectionless = 20;
+  static constexpr std::uint32_t first_connectionless = 20;
+  static constexpr format::name_text connectionless[] = {name("NO_TRAFFIC"), name("SINGLE"),
+                                                         name("MULTIPLE")};
   if (state < std::size(names)) return names[state];
-  if (state < first_connectionless) return "UNKNOWN";
-  const std::uint32_t rest = state - first_connectionless;
-  return rest < std::size(connectionless) ? connectionless[rest] : "UNKNOWN";
+  const std::uint32_t rest = state - first_connectionless;  // far above where the state is below
+  return rest < std::size(connectionless) ? connectionless[rest] : unknown;
 }
 
-const char *svc_class_name(std::int32_t service_class) {
+const format::name_text &svc_class_name(std::int32_t service_class) {
+  using format::name;
+  static constexpr format::name_text unknown = name("UNK");
   static constexpr struct {
     std::int32_t value;
-    const char *label;
+    format::name_text label;
   } classes[] = {
-      {0x000000, "BE"}, {0x080090, "BKS"}, {0x100080, "BK"}, {0x180010, "RD"}, {0x200020, "OAM"},
-      {0x280120, "AV"}, {0x300110, "RV"},  {0x380100, "VI"}, {0x400180, "VO"}, {0x480190, "CTL"},
+      {0x000000, name("BE")},  {0x080090, name("BKS")}, {0x100080, name("BK")}, {0x180010, name("RD")},
+      {0x200020, name("OAM")}, {0x280120, name("AV")},  {0x300110, name("RV")}, {0x380100, name("VI")},
+      {0x400180, name("VO")},  {0x480190, name("CTL")},
   };
   for (const auto &entry : classes) {
     if (entry.value == service_class) return entry.label;
   }
-  return "UNK";
+  return unknown;
 }
 
 flags_text letters_of_flags(std::uint32_t flags, std::span<const flag_letter> letters) {
@@ -59,54 +66,80 @@ format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6])
                                                               byte(5));
 }
 
-char *put_ipv4_address(char *to, const ipv4_address &address) {
-  for (std::size_t i = 0; i < sizeof address.bytes; ++i) {
-    if (i) *to++ = '.';
-    to = format::put_digits(to, address.bytes[i], format::decimal_digits(address.bytes[i]));
-  }
-  return to;
-}
-
 namespace {
 
+// The decimal text of each byte.
+constexpr auto decimal_bytes = [] {
+  struct entry {
+    char chars[4];
+    unsigned char size;
+  };
+  std::array<entry, 256> table{};
+  for (unsigned value = 0; value < table.size(); ++value) {
+    entry &text = table[value];
+    if (value >= 100) text.chars[text.size++] = static_cast<char>('0' + value / 100);
+    if (value >= 10) text.chars[text.size++] = static_cast<char>('0' + value / 10 % 10);
+    text.chars[text.size++] = static_cast<char>('0' + value % 10);
+  }
+  return table;
+}();
+
 struct run_of_zeros {
-  std::size_t first = 0;
-  std::size_t length = 0;
+  unsigned char first;
+  unsigned char length;
 };
 
-// The first of the longest runs of two or more zero words: "::" stands for it.
-run_of_zeros longest_run(const unsigned (&words)[8]) {
-  run_of_zeros best, current;
-  for (std::size_t i = 0; i < std::size(words); ++i) {
-    if (words[i] != 0) {
-      current.length = 0;
-      continue;
+// The run of words that "::" stands for, by the mask of the words that are zero (bit 0 is the first word):
+// the first of the longest ones of two or more.
+constexpr auto zero_runs = [] {
+  std::array<run_of_zeros, 256> table{};
+  for (unsigned mask = 0; mask < table.size(); ++mask) {
+    run_of_zeros current{};
+    for (unsigned char i = 0; i < 8; ++i) {
+      if (!(mask >> i & 1)) {
+        current.length = 0;
+        continue;
+      }
+      if (current.length++ == 0) current.first = i;
+      if (current.length >= 2 && current.length > table[mask].length) table[mask] = current;
     }
-    if (current.length++ == 0) current.first = i;
-    if (current.length > best.length) best = current;
   }
-  return best.length >= 2 ? best : run_of_zeros{};
-}
+  return table;
+}();
 
 char *put_hexadecimal(char *to, unsigned word) {
-  for (unsigned digits = (static_cast<unsigned>(std::bit_width(word | 1)) + 3) / 4; digits-- > 0;) {
-    *to++ = "0123456789abcdef"[word >> (4 * digits) & 0xf];
-  }
+  static constexpr char digits[] = "0123456789abcdef";
+  if (word >= 0x1000) *to++ = digits[word >> 12];
+  if (word >= 0x100) *to++ = digits[word >> 8 & 0xf];
+  if (word >= 0x10) *to++ = digits[word >> 4 & 0xf];
+  *to++ = digits[word & 0xf];
   return to;
 }
 
 }  // namespace
 
+char *put_ipv4_address(char *to, const ipv4_address &address) {
+  for (const std::uint8_t byte : address.bytes) {
+    const auto &text = decimal_bytes[byte];
+    std::memcpy(to, text.chars, sizeof text.chars);
+    to += text.size;
+    *to++ = '.';
+  }
+  return to - 1;
+}
+
 char *put_ipv6_address(char *to, const ipv6_address &address) {
   unsigned words[8];
-  for (std::size_t i = 0; i < std::size(words); ++i) {
+  unsigned zero_mask = 0;
+  for (unsigned i = 0; i < std::size(words); ++i) {
     words[i] = static_cast<unsigned>(address.bytes[2 * i] << 8 | address.bytes[2 * i + 1]);
+    zero_mask |= static_cast<unsigned>(words[i] == 0) << i;
   }
-  const run_of_zeros zeros = longest_run(words);
+  const run_of_zeros zeros = zero_runs[zero_mask];
   // An IPv4 address in the last two words, by itself or mapped, keeps its dots.
   const bool holds_ipv4 =
       zeros.first == 0 && (zeros.length == 6 || (zeros.length == 5 && words[5] == 0xffff));
-  for (std::size_t i = 0; i < std::size(words);) {
+  for (unsigned i = 0; i < std::size(words);) {
     if (zeros.length && i == zeros.first) {
       *to++ = ':';
       i += zeros.length;
@@ -126,12 +159,12 @@ char *put_ipv6_address(char *to, const ipv6_address &address) {
 
 format::small_text<16> address_text(const ipv4_address &address) {
   format::small_text<16> text;
-  text.size = static_cast<std::size_t>(put_ipv4_address(text.chars, address) - text.chars);
+  text.end_at(put_ipv4_address(text.chars, address));
   return text;
 }
 
 format::small_text<46> address_text(const ipv6_address &address) {
   format::small_text<46> text;
-  text.size = static_cast<std::size_t>(put_ipv6_address(text.chars, address) - text.chars);
+  text.end_at(put_ipv6_address(text.chars, address));
   return text;
 }

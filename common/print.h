@@ -120,13 +120,29 @@ struct small_text {
   bool foreign = false;
 
   std::string_view view() const { return {chars, size}; }
+
+  // Sets the size to where appending to `chars` ended.
+  void end_at(const char *end) { size = static_cast<std::size_t>(end - chars); }
 };
 
-// Bytes that any step may write past what it appends; every sink's room() leaves as many.
-inline constexpr std::size_t slack = 32;
+// A name in a constant table: what is known to be short is copied without asking how long it is.
+using name_text = small_text<16>;
 
+template <std::size_t N>
+consteval name_text name(const char (&text)[N]) {
+  static_assert(N <= sizeof(name_text::chars));
+  name_text result{};
+  std::copy_n(text, N, result.chars);
+  result.size = N - 1;
+  return result;
+}
+
+// Bytes that any step may write past what it appends; every sink's room() leaves as many.
+inline constexpr std::size_t slack = 64;
+
+// Appends blanks. What fits in the slack is written whole, whatever the count: a constant size needs no call.
 inline char *put_blanks(char *to, std::size_t count) {
-  std::memset(to, ' ', slack);  // a constant size is two stores
+  std::memset(to, ' ', slack);
   if (count > slack) std::memset(to + slack, ' ', count - slack);
   return to + count;
 }
@@ -220,19 +236,29 @@ std::size_t bound(const T &argument) {
   }
 }
 
-template <piece P>
-char *put_padded(char *to, const char *text, std::size_t size) {
-  const std::size_t padding = P.width > size ? P.width - size : 0;
-  if (!P.left && padding) to = put_blanks(to, padding);
-  if (size) std::memcpy(to, text, size);  // an empty text may have no address
-  to += size;
-  return P.left && padding ? put_blanks(to, padding) : to;
+// Appends `size` bytes of a text of which `Readable` bytes may be read, or only `size` where that is 0.
+template <std::size_t Readable>
+char *put_bytes(char *to, const char *text, std::size_t size) {
+  if constexpr (Readable > 0 && Readable <= slack) {
+    std::memcpy(to, text, Readable);  // a constant size needs no call
+  } else {
+    if (size) std::memcpy(to, text, size);  // an empty text may have no address
+  }
+  return to + size;
 }
 
-template <piece P>
+template <piece P, std::size_t Readable = 0>
+char *put_padded(char *to, const char *text, std::size_t size) {
+  if constexpr (P.width == 0) return put_bytes<Readable>(to, text, size);
+  const std::size_t padding = P.width > size ? P.width - size : 0;
+  if constexpr (P.left) return put_blanks(put_bytes<Readable>(to, text, size), padding);
+  return put_bytes<Readable>(put_blanks(to, padding), text, size);
+}
+
+template <piece P, std::size_t Readable = 0>
 char *put_text(char *to, text_view text, bool guarded) {
   const std::size_t size = shown_size<P>(text.size);
-  char *const end = put_padded<P>(to, text.data, size);
+  char *const end = put_padded<P, Readable>(to, text.data, size);
   if (text.foreign && guarded) {
     const std::size_t padding = P.width > size ? P.width - size : 0;
     hide_controls(P.left ? to : to + padding, size);
@@ -290,7 +316,8 @@ char *put(char *to, const T &argument, bool guarded) {
     if constexpr (std::same_as<T, text_view>) {
       return put_text<P>(to, argument, guarded);
     } else {
-      return put_text<P>(to, {argument.chars, argument.size, argument.foreign}, guarded);
+      return put_text<P, sizeof argument.chars>(to, {argument.chars, argument.size, argument.foreign},
+                                                guarded);
     }
   } else if constexpr (P.kind == 'c') {
     return put_padded<P>(to, &argument, 1);

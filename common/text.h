@@ -27,7 +27,13 @@ struct text_field {
   // At most the first `length` bytes of the text.
   foreign_text first(std::size_t length) const { return {view().substr(0, std::min(length, Width))}; }
 
-  format::text_view printable() const { return foreign_text{view()}.printable(); }
+  format::small_text<Width> printable() const {
+    format::small_text<Width> text;
+    std::memcpy(text.chars, bytes, Width);
+    text.size = view().size();
+    text.foreign = true;
+    return text;
+  }
 };
 
 #endif

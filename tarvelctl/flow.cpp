@@ -2,7 +2,8 @@
 
 #include "common/flow.h"
 
-#include <algorithm>
+#include <array>
+#include <numeric>
 #include <string_view>
 #include <vector>
 
@@ -18,15 +19,22 @@
 namespace {
 
 // An index, or "-" for none.
-format::small_text<12> index_text(std::uint32_t index) {
-  if (index == no_index) return {.chars = "-", .size = 1};
-  return format::text_of<"%u", 12>(index);
+format::name_text index_text(std::uint32_t index) {
+  format::name_text text;
+  char *end = text.chars;
+  if (index == no_index) {
+    *end++ = '-';
+  } else {
+    end = format::put_digits(end, index, format::decimal_digits(index));
+  }
+  text.end_at(end);
+  return text;
 }
 
 // A round-trip time in milliseconds, or as many blanks where none was measured.
-format::small_text<20> rtt_text(std::uint32_t microseconds) {
+format::small_text<32> rtt_text(std::uint32_t microseconds) {
   if (microseconds == 0) return {.chars = "          ", .size = 10};
-  return format::text_of<"%7.2f ms", 20>(static_cast<float>(microseconds) / 1000);
+  return format::text_of<"%7.2f ms", 32>(static_cast<float>(microseconds) / 1000);
 }
 
 void print_endpoints(const tv_stats_flow &flow, const char *protocol) {
@@ -57,20 +65,53 @@ void print_flow(const tv_stats_flow &flow) {
       index_text(flow.sf_bucket), flow.sf_proc_name, flow.sf_pid);
 }
 
-// The positions of the records that the filters let pass, by process id; flows of a process keep the table's
-// order.
-std::vector<std::uint32_t> selected_by_pid(std::span<const std::byte> flows) {
-  std::vector<std::uint64_t> keys;
+// A process id, as an unsigned number of the same order, over the position of a flow.
+using sort_key = std::uint64_t;
+
+sort_key key_of(std::int32_t pid, std::size_t position) {
+  const std::uint32_t ascending = static_cast<std::uint32_t>(pid) ^ 0x80000000;
+  return sort_key{ascending} << 32 | position;
+}
+
+// Sorts by the upper half, digit by digit from the lowest; keys with the same one keep their order. Many
+// flows have few process ids, which take two passes.
+void sort_by_pid(std::vector<sort_key> &keys) {
+  constexpr unsigned digit_bits = 11;
+  constexpr std::size_t digits = std::size_t{1} << digit_bits;
+  std::vector<sort_key> sorted(keys.size());
+  for (unsigned shift = 32; shift < 64; shift += digit_bits) {
+    const auto digit = [shift](sort_key key) { return key >> shift & (digits - 1); };
+    std::array<std::size_t, digits> place{};
+    for (const sort_key key : keys) ++place[digit(key)];
+    if (!keys.empty() && place[digit(keys[0])] == keys.size()) continue;  // all the same
+    std::exclusive_scan(place.begin(), place.end(), place.begin(), std::size_t{0});
+    for (const sort_key key : keys) sorted[place[digit(key)]++] = key;
+    keys.swap(sorted);
+  }
+}
+
+// The positions of the records that the filters let pass, in the order of the listing.
+std::vector<sort_key> selected_flows(std::span<const std::byte> flows) {
+  std::vector<sort_key> keys;
   const std::size_t count = flows.size() / sizeof(tv_stats_flow);
   keys.reserve(count);
   for (std::size_t i = 0; i < count; ++i) {
-    const auto flow = record_at<tv_stats_flow>(flows, i);
-    if (!netstat_options.selects(flow.sf_nx_uuid, flow.sf_pid)) continue;
-    const std::uint32_t ascending = static_cast<std::uint32_t>(flow.sf_pid) ^ 0x80000000;
-    keys.push_back(std::uint64_t{ascending} << 32 | i);
+    const auto nexus = member_at<tv_stats_flow, uuid>(flows, i, offsetof(tv_stats_flow, sf_nx_uuid));
+    const auto pid = member_at<tv_stats_flow, std::int32_t>(flows, i, offsetof(tv_stats_flow, sf_pid));
+    if (netstat_options.selects(nexus, pid)) keys.push_back(key_of(pid, i));
   }
-  std::sort(keys.begin(), keys.end());
-  return {keys.begin(), keys.end()};
+  sort_by_pid(keys);
+  return keys;
+}
+
+void print_flows(std::span<const std::byte> flows) {
+  constexpr std::size_t ahead = 16;
+  const std::vector<sort_key> keys = selected_flows(flows);
+  const auto position = [&keys](std::size_t i) { return static_cast<std::uint32_t>(keys[i]); };
+  for (std::size_t i = 0; i < keys.size(); ++i) {
+    if (i + ahead < keys.size()) prefetch_record<tv_stats_flow>(flows, position(i + ahead));
+    print_flow(record_at<tv_stats_flow>(flows, position(i)));
+  }
 }
 
 }  // namespace
@@ -88,9 +129,7 @@ int list_flows() {
       "Process.PID");
   require(table.size() % sizeof(tv_stats_flow) == 0,
           {"cmd_flow", "tarvelctl/tarvelctl", 689, "(length % sizeof (*sf)) == 0"});
-  for (const std::uint32_t at : selected_by_pid(table.bytes())) {
-    print_flow(record_at<tv_stats_flow>(table.bytes(), at));
-  }
+  print_flows(table.bytes());
   return 0;
 }
 
