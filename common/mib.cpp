@@ -120,20 +120,35 @@ int object_tree::scrape_flows() {
   if (const int error = flows_.fetch(flow_node_name)) return error;
   require(flows_.size() % sizeof(tv_stats_flow) == 0,
           {"scrape_flows", "common/mib", 223, "(length % sizeof (*sf)) == 0"});
-  nodes_.reserve(nodes_.size() + flows_.size() / sizeof(tv_stats_flow));
-  record_walk walk(flows_.bytes());
-  tv_stats_flow flow;
-  for (const std::byte *at = walk.position(); walk.take(flow); at = walk.position()) {
-    const object_id nexus = find_object(flow.sf_nx_uuid);
+  // The flows of a channel get numbers in a row, in the order in which the tree is walked.
+  std::vector<sort_key> by_channel = find_channels();
+  sort_keys(by_channel);
+  nodes_.reserve(nodes_.size() + by_channel.size());
+  for (const sort_key key : by_channel) {
+    const std::byte *const at = flows_.bytes().data() + position_of(key) * sizeof(tv_stats_flow);
+    append_child(number_of(key), {.uuid = {}, .type = object_type::flow, .payload = at});
+  }
+  return 0;
+}
+
+// The number of its channel for each flow that has one.
+std::vector<sort_key> object_tree::find_channels() {
+  const std::span<const std::byte> flows = flows_.bytes();
+  const std::size_t count = flows.size() / sizeof(tv_stats_flow);
+  std::vector<sort_key> found;
+  found.reserve(count);
+  for (std::size_t i = 0; i < count; ++i) {
+    const object_id nexus =
+        find_object(member_at<tv_stats_flow, uuid>(flows, i, offsetof(tv_stats_flow, sf_nx_uuid)));
     if (nexus == no_object) {
       complain<"orphan flow orphan nx_uuid">();
       continue;
     }
-    const object_id channel = by_port_.find(port_key(nexus, flow.sf_nx_port));
-    if (channel != uuid_index::none)
-      append_child(channel, {.uuid = {}, .type = object_type::flow, .payload = at});
+    const auto port = member_at<tv_stats_flow, std::uint32_t>(flows, i, offsetof(tv_stats_flow, sf_nx_port));
+    const object_id channel = by_port_.find(port_key(nexus, port));
+    if (channel != uuid_index::none) found.push_back(make_sort_key(channel, i));
   }
-  return 0;
+  return found;
 }
 
 // Adds a copy of `child` behind the children of `parent`. Siblings have ascending numbers.

@@ -9,8 +9,10 @@
 #include <cstring>
 #include <vector>
 
+#include "common/flow.h"
 #include "common/kernel_table.h"
 #include "common/record_walk.h"
+#include "common/sort_key.h"
 #include "common/uuid_index.h"
 
 // What a node stands for, and what its payload is.
@@ -62,6 +64,15 @@ class object_tree {
 
   const object_node &operator[](object_id id) const { return nodes_[id].node; }
 
+  // Told that a flow is about to be read, asks for those that follow to be in the cache by then: the flows of
+  // a channel lie all over their table.
+  void read_ahead(object_id id) const {
+    constexpr object_id ahead = 16;
+    if (nodes_.size() - id > ahead && nodes_[id + ahead].node.type == object_type::flow) {
+      prefetch_record<tv_stats_flow>({nodes_[id + ahead].node.payload, sizeof(tv_stats_flow)}, 0);
+    }
+  }
+
   // The first node with this UUID in depth-first pre-order, or no_object. Flows are not searched. The cost
   // does not depend on the size of the tree.
   object_id find_object(const uuid &key);
@@ -84,6 +95,7 @@ class object_tree {
   bool scrape_group(record_walk &walk, object_id nexus, std::uint32_t channel_count);
   void index_ports();
   int scrape_flows();
+  std::vector<sort_key> find_channels();
 
   object_id append_child(object_id parent, const object_node &child);
   void release_children(object_id id);

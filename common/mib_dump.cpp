@@ -127,6 +127,7 @@ void object_tree::dump_object(object_id top) const {
   object_id id = top;
   unsigned level = 0;
   for (;;) {
+    read_ahead(id);
     open_node((*this)[id], indent_of(level));
     if ((*this)[id].has_children()) {
       id = (*this)[id].first_child;

@@ -2,8 +2,6 @@
 
 #include "common/flow.h"
 
-#include <array>
-#include <numeric>
 #include <string_view>
 #include <vector>
 
@@ -12,6 +10,7 @@
 #include "common/kernel_table.h"
 #include "common/output.h"
 #include "common/record_walk.h"
+#include "common/sort_key.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 #include "tarvelctl/reports.h"
@@ -65,32 +64,7 @@ void print_flow(const tv_stats_flow &flow) {
       index_text(flow.sf_bucket), flow.sf_proc_name, flow.sf_pid);
 }
 
-// A process id, as an unsigned number of the same order, over the position of a flow.
-using sort_key = std::uint64_t;
-
-sort_key key_of(std::int32_t pid, std::size_t position) {
-  const std::uint32_t ascending = static_cast<std::uint32_t>(pid) ^ 0x80000000;
-  return sort_key{ascending} << 32 | position;
-}
-
-// Sorts by the upper half, digit by digit from the lowest; keys with the same one keep their order. Many
-// flows have few process ids, which take two passes.
-void sort_by_pid(std::vector<sort_key> &keys) {
-  constexpr unsigned digit_bits = 11;
-  constexpr std::size_t digits = std::size_t{1} << digit_bits;
-  std::vector<sort_key> sorted(keys.size());
-  for (unsigned shift = 32; shift < 64; shift += digit_bits) {
-    const auto digit = [shift](sort_key key) { return key >> shift & (digits - 1); };
-    std::array<std::size_t, digits> place{};
-    for (const sort_key key : keys) ++place[digit(key)];
-    if (!keys.empty() && place[digit(keys[0])] == keys.size()) continue;  // all the same
-    std::exclusive_scan(place.begin(), place.end(), place.begin(), std::size_t{0});
-    for (const sort_key key : keys) sorted[place[digit(key)]++] = key;
-    keys.swap(sorted);
-  }
-}
-
-// The positions of the records that the filters let pass, in the order of the listing.
+// The records that the filters let pass, by process id; flows of a process keep the table's order.
 std::vector<sort_key> selected_flows(std::span<const std::byte> flows) {
   std::vector<sort_key> keys;
   const std::size_t count = flows.size() / sizeof(tv_stats_flow);
@@ -98,19 +72,18 @@ std::vector<sort_key> selected_flows(std::span<const std::byte> flows) {
   for (std::size_t i = 0; i < count; ++i) {
     const auto nexus = member_at<tv_stats_flow, uuid>(flows, i, offsetof(tv_stats_flow, sf_nx_uuid));
     const auto pid = member_at<tv_stats_flow, std::int32_t>(flows, i, offsetof(tv_stats_flow, sf_pid));
-    if (netstat_options.selects(nexus, pid)) keys.push_back(key_of(pid, i));
+    if (netstat_options.selects(nexus, pid)) keys.push_back(make_sort_key(ascending(pid), i));
   }
-  sort_by_pid(keys);
+  sort_keys(keys);
   return keys;
 }
 
 void print_flows(std::span<const std::byte> flows) {
   constexpr std::size_t ahead = 16;
   const std::vector<sort_key> keys = selected_flows(flows);
-  const auto position = [&keys](std::size_t i) { return static_cast<std::uint32_t>(keys[i]); };
   for (std::size_t i = 0; i < keys.size(); ++i) {
-    if (i + ahead < keys.size()) prefetch_record<tv_stats_flow>(flows, position(i + ahead));
-    print_flow(record_at<tv_stats_flow>(flows, position(i)));
+    if (i + ahead < keys.size()) prefetch_record<tv_stats_flow>(flows, position_of(keys[i + ahead]));
+    print_flow(record_at<tv_stats_flow>(flows, position_of(keys[i])));
   }
 }
 

@@ -21,6 +21,7 @@ constexpr std::uint32_t first_client_port = 2;
 template <class Visit>
 void for_each_child(const object_tree &tree, const object_node &node, object_type type, Visit visit) {
   for (object_id id = node.first_child; id != no_object; id = tree[id].next_sibling) {
+    if (type == object_type::flow) tree.read_ahead(id);
     if (tree[id].type == type) visit(tree[id]);
   }
 }
