@@ -75,13 +75,17 @@ void open_channel(world &state, channel &opened) {
 // What a program did before anyone looked.
 void remember_past(world &state, channel &opened) {
   for (int kind = 0; kind < 4; ++kind) {
-    const std::uint64_t packets = state.random.between(500, 400'000);
+    const std::uint64_t packets = state.random.between(5000, 400'000);
     const std::uint64_t answers = packets / state.random.between(1, 4);
     carry(state, opened, kind & 2, kind & 1, {{packets * 300, packets}, {answers * 900, answers}});
   }
-  opened.stack.initiated = state.random.between(10, 900);
-  opened.stack.accepted = state.random.between(0, 40);
-  opened.stack.closed = opened.stack.initiated + opened.stack.accepted;
+  const auto services = programs[state.processes[opened.process].program].services;
+  const bool serves = !services.empty() && services.front().inbound;
+  const std::uint32_t many = state.random.between(10, 900);
+  const std::uint32_t few = state.random.between(0, 12);
+  opened.stack.initiated = serves ? few : many;
+  opened.stack.accepted = serves ? many : few;
+  opened.stack.closed = many + few;
 }
 
 std::uint32_t owner_of(const world &state, const nexus &place, std::uint32_t port) {
@@ -143,7 +147,18 @@ void open_channels(world &state) {
   if (state.processes.empty()) return;
   deal_channels(state.nexuses, state.size.channels);
   for (std::uint32_t i = 0; i < state.nexuses.size(); ++i) populate(state, i);
-  for (const std::uint32_t index : state.flow_channels) remember_past(state, state.channels[index]);
+  for (const std::uint32_t index : state.flow_channels) {
+    channel &opened = state.channels[index];
+    flow_switch &carrier = state.switches[opened.flow_switch];
+    if (carrier.closed.closed == 0) {
+      // Each switch has seen someone who is gone.
+      remember_past(state, opened);
+      carrier.closed = opened.stack;
+      opened.stack = {};
+      opened.moved = {};
+    }
+    remember_past(state, opened);
+  }
 }
 
 void replace_channels(world &state, std::uint32_t milliseconds) {

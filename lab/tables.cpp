@@ -1,7 +1,10 @@
 #include "lab/tables.h"
 
+#include "common/arena.h"
 #include "common/channel.h"
+#include "common/counters.h"
 #include "common/flow.h"
+#include "common/netns.h"
 #include "common/provider.h"
 
 namespace lab {
@@ -15,6 +18,11 @@ constexpr table all_tables[] = {
     {flow_adv_node, write_advisories, pids_of_advisories},
     {flow_owner_node, write_owners, pids_of_array<tv_stats_flow_owner, &tv_stats_flow_owner::sfo_pid>},
     {flow_route_node, write_routes, nullptr},
+    {net_if_node, write_net_ifs, nullptr},
+    {flow_switch_node, write_flow_switches, nullptr},
+    {userstack_node, write_userstacks, pids_of_array<tv_stats_userstack, &tv_stats_userstack::pid>},
+    {arena_node, write_arenas, pids_of_arenas},
+    {netns_node, write_namespaces, nullptr},
     {flow_node_name, write_flows, pids_of_array<tv_stats_flow, &tv_stats_flow::sf_pid>},
 };
 

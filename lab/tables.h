@@ -39,8 +39,14 @@ void write_flows(const world &, table_file &);
 void write_advisories(const world &, table_file &);
 void write_owners(const world &, table_file &);
 void write_routes(const world &, table_file &);
+void write_net_ifs(const world &, table_file &);
+void write_flow_switches(const world &, table_file &);
+void write_userstacks(const world &, table_file &);
+void write_arenas(const world &, table_file &);
+void write_namespaces(const world &, table_file &);
 void pids_of_channels(std::span<const std::byte>, std::vector<std::int32_t> &);
 void pids_of_advisories(std::span<const std::byte>, std::vector<std::int32_t> &);
+void pids_of_arenas(std::span<const std::byte>, std::vector<std::int32_t> &);
 
 // The ids in a field of an array of records.
 template <class Record, std::int32_t Record::*Pid>

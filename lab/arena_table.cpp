@@ -1,0 +1,185 @@
+// kern.tarvel.stats.arena
+
+#include "common/arena.h"
+
+#include <algorithm>
+
+#include "lab/tables.h"
+
+namespace lab {
+
+namespace {
+
+constexpr char prefix[] = "com.example.";
+
+enum arena_type : std::int32_t { nexus_arena, policy_arena, system_arena };
+
+enum region_mode : std::uint32_t {
+  no_redirect = 0x1,
+  map_ok = 0x2,
+  read_only = 0x4,
+  persistent = 0x8,
+  monolithic = 0x10,
+  no_cache = 0x20,
+  mirrored = 0x80000000,
+};
+
+// Whose region it is: arenas of one channel, of one nexus or of the whole machine share it.
+enum scope : std::uint8_t { channel_scope, nexus_scope, machine_scope, scopes };
+
+struct region_shape {
+  const char *name;
+  scope shared;
+  std::uint32_t mode;
+  std::uint32_t object_size;  // as asked for
+  std::uint32_t objects;
+  std::uint32_t alignment;  // of objects
+  std::uint32_t segment_size;
+  bool wired;
+};
+
+// By region type.
+constexpr region_shape shapes[tv_stats_arena::region_slots] = {
+    {"schema", channel_scope, no_redirect | map_ok | read_only | monolithic, 2904, 1, 64, 16384, false},
+    {"ring", channel_scope, map_ok, 12'440, 4, 64, 32768, false},
+    {"buf", nexus_scope, map_ok | persistent, 2048, 2000, 128, 65536, true},
+    {"umd", nexus_scope, map_ok | persistent, 480, 2000, 64, 32768, false},
+    {"usd", channel_scope, map_ok, 16, 1500, 16, 16384, false},
+    {"ustats", channel_scope, map_ok | monolithic, 9800, 1, 64, 16384, false},
+    {"flowadv", nexus_scope, map_ok | read_only | monolithic, 20, 512, 4, 16384, false},
+    {"nexusadv", nexus_scope, map_ok | read_only | monolithic, 64, 1, 64, 16384, false},
+    {"sysctls", machine_scope, no_redirect | map_ok | read_only | mirrored, 1100, 1, 64, 16384, false},
+    {"kmd", nexus_scope, persistent, 600, 2000, 64, 32768, true},
+    {"ksd", channel_scope, no_cache, 24, 1500, 8, 16384, false},
+    {"kstats", nexus_scope, no_cache | monolithic, 5200, 1, 64, 16384, true},
+};
+
+struct arena_parts {
+  std::int32_t type;
+  std::uint32_t regions;  // bits
+};
+
+constexpr arena_parts system_parts{system_arena, 1 << 8};
+constexpr arena_parts policy_parts{policy_arena, 1 << 0 | 1 << 5 | 1 << 11};
+constexpr arena_parts switch_parts{nexus_arena, 0xfff};
+constexpr arena_parts pipe_parts{nexus_arena, 0xfff & ~(1 << 6 | 1 << 7)};
+
+std::uint64_t rounded_up(std::uint64_t value, std::uint64_t step) {
+  return (value + step - 1) / step * step;
+}
+
+// The state of a region follows from whose it is, so that all arenas that have it show the same.
+tv_stats_region region_of(const world &state, std::size_t type, const uuid &owner,
+                          const std::string &owner_name) {
+  const region_shape &shape = shapes[type];
+  std::uint64_t key;
+  std::memcpy(&key, owner.bytes, sizeof key);
+  random_source random(state.seed, 16 + type, key);
+  tv_stats_region made{};
+  set_text(made.name,
+           std::string("com.example.") + shape.name + (owner_name.empty() ? "" : ".") + owner_name);
+  made.region_uuid = random.identity();
+  made.type = static_cast<std::int32_t>(type);
+  made.mode = shape.mode;
+  made.obj_size_req = shape.object_size;
+  made.obj_count_req = shape.objects;
+  made.obj_size = rounded_up(shape.object_size, shape.alignment);
+  // What is asked for becomes pages, what is made whole segments.
+  made.seg_size_req = rounded_up(std::max<std::uint64_t>(made.obj_size, shape.segment_size / 4 * 3), 4096);
+  made.seg_size = shape.segment_size;
+  made.objs_per_seg = shape.mode & monolithic ? shape.objects : made.seg_size / made.obj_size;
+  made.seg_count = rounded_up(shape.objects, made.objs_per_seg) / made.objs_per_seg;
+  made.obj_count = made.seg_count * made.objs_per_seg;
+  made.mem_total = made.seg_count * made.seg_size;
+  // Half to all segments are in use, a few more or less from second to second.
+  const std::uint64_t seconds = state.elapsed / 1000;
+  random_source now(random.next(), seconds);
+  made.seg_in_use = made.seg_count - made.seg_count * (random.below(40) + now.below(10)) / 100;
+  made.mem_wired = shape.wired ? made.seg_in_use * made.seg_size : 0;
+  made.frees = random.below(500) + seconds * (made.seg_count > 1 ? random.below(4) : 0);
+  made.allocs = made.frees + made.seg_in_use;
+  made.rescales = made.seg_count > 8 ? random.below(5) + seconds / 600 : 0;
+  return made;
+}
+
+// By scope.
+struct arena_owner {
+  uuid ids[scopes];
+  std::string names[scopes];
+};
+
+void put_arena(const world &state, const arena_parts &parts, const arena_owner &owner,
+               const std::vector<std::int32_t> &pids, table_file &file) {
+  tv_stats_arena arena{};
+  set_text(arena.name, std::string(prefix).append(owner.names[channel_scope]));
+  arena.type = parts.type;
+  for (std::size_t type = 0; type < tv_stats_arena::region_slots; ++type) {
+    const scope shared = shapes[type].shared;
+    if (parts.regions >> type & 1)
+      arena.regions[type] = region_of(state, type, owner.ids[shared], owner.names[shared]);
+  }
+  for (std::size_t i = 0; i < std::min(pids.size(), tv_stats_arena::pid_slots); ++i) arena.pids[i] = pids[i];
+  file.put(arena);
+}
+
+// The first processes that run, from a program on.
+std::vector<std::int32_t> running(const world &state, std::uint32_t first_program) {
+  std::vector<std::int32_t> pids;
+  for (const process &source : state.processes) {
+    if (source.pid && source.program >= first_program) pids.push_back(source.pid);
+    if (pids.size() == tv_stats_arena::pid_slots) break;
+  }
+  return pids;
+}
+
+// Who has an arena of a channel: its owner, and the owner of the second port of its nexus, a switch's device
+// or a pipe's other end.
+std::vector<std::int32_t> users_of(const world &state, const channel &used) {
+  const nexus &place = state.nexuses[used.nexus];
+  std::vector<std::int32_t> pids{state.processes[used.process].pid};
+  if (place.channel_count < 2) return pids;
+  const std::int32_t other = state.processes[state.channels[place.first_channel + 1].process].pid;
+  if (other && other != pids[0]) pids.push_back(other);
+  return pids;
+}
+
+std::string nexus_name(const nexus &place) {
+  const std::string interface = interface_name(place.kind, place.ordinal);
+  return interface.empty() ? std::string("pipe").append(std::to_string(place.ordinal)) : interface;
+}
+
+// Where there are more arenas than channels, channels have several: `turn` tells them apart.
+void put_channel_arena(const world &state, const channel &used, std::size_t turn, table_file &file) {
+  const nexus &place = state.nexuses[used.nexus];
+  arena_owner owner{{used.id, place.id, {}}, {"", nexus_name(place), ""}};
+  owner.names[channel_scope] = owner.names[nexus_scope] + ".port";
+  owner.names[channel_scope] += std::to_string(used.port);
+  if (turn) {
+    owner.ids[channel_scope] = random_source(turn, used.id.bytes[0], used.id.bytes[1]).identity();
+    owner.names[channel_scope].append(1, '.').append(std::to_string(turn));
+  }
+  const arena_parts &parts = place.kind == nexus_kind::multistack ? switch_parts : pipe_parts;
+  put_arena(state, parts, owner, users_of(state, used), file);
+}
+
+}  // namespace
+
+void write_arenas(const world &state, table_file &file) {
+  const std::size_t count = state.size.arenas;
+  if (count > 0) put_arena(state, system_parts, {{}, {"system", "", ""}}, running(state, 0), file);
+  if (count > 1)
+    put_arena(state, policy_parts, {{}, {"policy", "policy", ""}}, running(state, flow_programs), file);
+  const std::size_t channels = state.channels.size();
+  const std::size_t stride = channels % 3 ? 3 : 1;  // a few arenas are of all kinds of nexus
+  for (std::size_t i = 2; i < count && channels; ++i) {
+    const channel &used = state.channels[(i - 2) * stride % channels];
+    if (used.state != channel::phase::closed) put_channel_arena(state, used, (i - 2) / channels, file);
+  }
+}
+
+void pids_of_arenas(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
+  tv_stats_arena arena;
+  for (record_walk walk(table); walk.take(arena);) pids.insert(pids.end(), arena.pids, std::end(arena.pids));
+}
+
+}  // namespace lab
