@@ -8,12 +8,11 @@
 namespace platform {
 
 void prefer_large_pages(void *block, std::size_t size) {
-  constexpr std::uintptr_t large_page = 2 * 1024 * 1024;
-  const auto begin = (reinterpret_cast<std::uintptr_t>(block) + large_page - 1) & ~(large_page - 1);
-  const auto end = (reinterpret_cast<std::uintptr_t>(block) + size) & ~(large_page - 1);
-  if (begin >= end) return;
+  constexpr std::size_t large_page = 2 * 1024 * 1024;
+  const std::size_t lead = -reinterpret_cast<std::uintptr_t>(block) % large_page;  // up to the first large page
+  if (size < lead + large_page) return;
   const int saved = errno;
-  madvise(reinterpret_cast<void *>(begin), end - begin, MADV_HUGEPAGE);
+  madvise(static_cast<char *>(block) + lead, (size - lead) / large_page * large_page, MADV_HUGEPAGE);
   errno = saved;
 }
 
