@@ -10,8 +10,6 @@ namespace lab {
 
 namespace {
 
-constexpr char prefix[] = "com.example.";
-
 enum arena_type : std::int32_t { nexus_arena, policy_arena, system_arena };
 
 enum region_mode : std::uint32_t {
@@ -43,16 +41,21 @@ constexpr region_shape shapes[tv_stats_arena::region_slots] = {
     {"schema", channel_scope, no_redirect | map_ok | read_only | monolithic, 2904, 1, 64, 16384, false},
     {"ring", channel_scope, map_ok, 12'440, 4, 64, 32768, false},
     {"buf", nexus_scope, map_ok | persistent, 2048, 2000, 128, 65536, true},
-    {"umd", nexus_scope, map_ok | persistent, 480, 2000, 64, 32768, false},
+    {"mdu", nexus_scope, map_ok | persistent, 480, 2000, 64, 32768, false},
     {"usd", channel_scope, map_ok, 16, 1500, 16, 16384, false},
     {"ustats", channel_scope, map_ok | monolithic, 9800, 1, 64, 16384, false},
     {"flowadv", nexus_scope, map_ok | read_only | monolithic, 20, 512, 4, 16384, false},
     {"nexusadv", nexus_scope, map_ok | read_only | monolithic, 64, 1, 64, 16384, false},
-    {"sysctls", machine_scope, no_redirect | map_ok | read_only | mirrored, 1100, 1, 64, 16384, false},
-    {"kmd", nexus_scope, persistent, 600, 2000, 64, 32768, true},
+    {"sysctls", machine_scope, no_redirect | map_ok | read_only | monolithic | mirrored, 1100, 1, 64, 16384,
+     false},
+    {"mdk", nexus_scope, persistent, 600, 2000, 64, 32768, true},
     {"ksd", channel_scope, no_cache, 24, 1500, 8, 16384, false},
     {"kstats", nexus_scope, no_cache | monolithic, 5200, 1, 64, 16384, true},
 };
+
+constexpr char machine_name[] = "com.example.machine";
+constexpr char system_name[] = "com.example.system";
+constexpr char policy_name[] = "com.example.policy";
 
 struct arena_parts {
   std::int32_t type;
@@ -76,8 +79,7 @@ tv_stats_region region_of(const world &state, std::size_t type, const uuid &owne
   std::memcpy(&key, owner.bytes, sizeof key);
   random_source random(state.seed, 16 + type, key);
   tv_stats_region made{};
-  set_text(made.name,
-           std::string("com.example.") + shape.name + (owner_name.empty() ? "" : ".") + owner_name);
+  set_text(made.name, std::string(owner_name).append(1, '.').append(shape.name));
   made.region_uuid = random.identity();
   made.type = static_cast<std::int32_t>(type);
   made.mode = shape.mode;
@@ -96,7 +98,8 @@ tv_stats_region region_of(const world &state, std::size_t type, const uuid &owne
   random_source now(random.next(), seconds);
   made.seg_in_use = made.seg_count - made.seg_count * (random.below(40) + now.below(10)) / 100;
   made.mem_wired = shape.wired ? made.seg_in_use * made.seg_size : 0;
-  made.frees = random.below(500) + seconds * (made.seg_count > 1 ? random.below(4) : 0);
+  const std::uint64_t each_second = made.seg_count > 1 ? made.seg_count / 10 + 1 + random.below(4) : 0;
+  made.frees = random.below(500) + seconds * each_second;
   made.allocs = made.frees + made.seg_in_use;
   made.rescales = made.seg_count > 8 ? random.below(5) + seconds / 600 : 0;
   return made;
@@ -111,7 +114,7 @@ struct arena_owner {
 void put_arena(const world &state, const arena_parts &parts, const arena_owner &owner,
                const std::vector<std::int32_t> &pids, table_file &file) {
   tv_stats_arena arena{};
-  set_text(arena.name, std::string(prefix).append(owner.names[channel_scope]));
+  set_text(arena.name, owner.names[channel_scope]);
   arena.type = parts.type;
   for (std::size_t type = 0; type < tv_stats_arena::region_slots; ++type) {
     const scope shared = shapes[type].shared;
@@ -143,15 +146,10 @@ std::vector<std::int32_t> users_of(const world &state, const channel &used) {
   return pids;
 }
 
-std::string nexus_name(const nexus &place) {
-  const std::string interface = interface_name(place.kind, place.ordinal);
-  return interface.empty() ? std::string("pipe").append(std::to_string(place.ordinal)) : interface;
-}
-
 // Where there are more arenas than channels, channels have several: `turn` tells them apart.
 void put_channel_arena(const world &state, const channel &used, std::size_t turn, table_file &file) {
   const nexus &place = state.nexuses[used.nexus];
-  arena_owner owner{{used.id, place.id, {}}, {"", nexus_name(place), ""}};
+  arena_owner owner{{used.id, place.id, {}}, {"", registered_name(place.kind, place.ordinal), machine_name}};
   owner.names[channel_scope] = owner.names[nexus_scope] + ".port";
   owner.names[channel_scope] += std::to_string(used.port);
   if (turn) {
@@ -166,9 +164,11 @@ void put_channel_arena(const world &state, const channel &used, std::size_t turn
 
 void write_arenas(const world &state, table_file &file) {
   const std::size_t count = state.size.arenas;
-  if (count > 0) put_arena(state, system_parts, {{}, {"system", "", ""}}, running(state, 0), file);
+  if (count > 0)
+    put_arena(state, system_parts, {{}, {system_name, "", machine_name}}, running(state, 0), file);
   if (count > 1)
-    put_arena(state, policy_parts, {{}, {"policy", "policy", ""}}, running(state, flow_programs), file);
+    put_arena(state, policy_parts, {{}, {policy_name, policy_name, machine_name}},
+              running(state, flow_programs), file);
   const std::size_t channels = state.channels.size();
   const std::size_t stride = channels % 3 ? 3 : 1;  // a few arenas are of all kinds of nexus
   for (std::size_t i = 2; i < count && channels; ++i) {

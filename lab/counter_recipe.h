@@ -12,7 +12,8 @@
 
 namespace lab {
 
-// Adds `times` for each `per` of a source to the counter of this name. A counter may have several.
+// Adds `times` for each `per` of a source to the counter of this name. A counter may have several. Where they
+// take away, it never falls as long as each `per` is a multiple of the one before.
 struct ingredient {
   std::string_view counter;
   int source;

@@ -33,7 +33,7 @@ struct known_range {
 };
 
 constexpr known_range known_ranges[] = {
-    {tcp_protocol, 22, 0, {0, 1, 1}},        {tcp_protocol, 53, 0, {0, 1, 1}},
+    {tcp_protocol, 22, 0, {0, 1, 0}},        {tcp_protocol, 53, 0, {0, 1, 0}},
     {tcp_protocol, 80, 0, {0, 1, 1}},        {tcp_protocol, 443, 0, {0, 2, 2}},
     {tcp_protocol, 49152, 65535, {1, 0, 0}}, {udp_protocol, 53, 0, {0, 1, 0}},
     {udp_protocol, 123, 0, {0, 1, 0}},       {udp_protocol, 500, 0, {1, 0, 0}},

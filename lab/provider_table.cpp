@@ -11,7 +11,6 @@ namespace lab {
 namespace {
 
 struct provider_shape {
-  std::string_view name;
   std::uint32_t type;
   std::uint32_t subtype;
   std::int32_t flags;
@@ -23,21 +22,17 @@ struct provider_shape {
 
 // By nexus_kind.
 constexpr provider_shape shapes[] = {
-    {"com.example.multistack", nexus_type::flow_switch, flow_switch_subtype::multistack, 0, 512, 1024, 512,
-     1},
-    {"com.example.net-if", nexus_type::network_interface, 0, 0, 512, 512, 512, 0},
-    {"com.example.bridge", nexus_type::flow_switch, flow_switch_subtype::bridge, 0, 1024, 1024, 512, 0},
-    {"com.example.content-filter", nexus_type::user_pipe, 0, 0, 256, 256, 128, 0},
-    {"com.example.tunnel", nexus_type::kernel_pipe, 0, 0, 256, 512, 512, 2},
-    {"com.example.scratch", nexus_type::user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
+    {nexus_type::flow_switch, flow_switch_subtype::multistack, 0, 512, 1024, 512, 1},
+    {nexus_type::network_interface, 0, 0, 512, 512, 512, 0},
+    {nexus_type::flow_switch, flow_switch_subtype::bridge, 0, 1024, 1024, 512, 0},
+    {nexus_type::user_pipe, 0, 0, 256, 256, 128, 0},
+    {nexus_type::kernel_pipe, 0, 0, 256, 512, 512, 2},
+    {nexus_type::user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
 };
 
 nexus_provider_parameters parameters_of(const world &state, const provider &source) {
   const provider_shape &shape = shapes[static_cast<int>(source.kind)];
-  std::string name(shape.name);
-  std::string suffix = interface_name(source.kind, source.ordinal);
-  if (suffix.empty() && source.ordinal) suffix = std::to_string(source.ordinal);
-  if (!suffix.empty()) name.append(".").append(suffix);
+  const std::string name = registered_name(source.kind, source.ordinal);
   nexus_provider_parameters made{};
   set_text(made.name, name);
   made.name_length = static_cast<std::uint32_t>(name.size());

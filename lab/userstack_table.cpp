@@ -8,145 +8,71 @@ namespace lab {
 
 namespace {
 
+// Packets that left and arrived, bytes of them that are data, connections.
 enum source {
-  ip_out,
-  ip_in,
-  ip6_out,
-  ip6_in,
-  tcp_out,
-  tcp_in,
-  tcp_out_data,  // bytes without headers
-  tcp_in_data,
-  udp_out,
-  udp_in,
-  initiated,
-  accepted,
-  closed,
+  ip_tx,
+  ip_rx,
+  ip6_tx,
+  ip6_rx,
+  tx,
+  rx,
+  txd,
+  rxd,
+  udp_tx,
+  udp_rx,
+  init,
+  acpt,
+  done,
   source_count
 };
 
 constexpr ingredient ip_ingredients[] = {
-    {"TotalRcvd", ip_in, 1, 1},       {"BadCsum", ip_in, 1, 900'000},    {"FragRcvd", ip_in, 2, 50'000},
-    {"FragTimeO", ip_in, 1, 600'000}, {"Reassembled", ip_in, 1, 50'000}, {"UnkwnProto", ip_in, 1, 800'000},
-    {"Delivered", ip_in, 1, 1},       {"Delivered", ip_in, -1, 900'000}, {"Delivered", ip_in, -1, 800'000},
-    {"Delivered", ip_in, -1, 50'000}, {"LocalOut", ip_out, 1, 1},        {"NoRoute", ip_out, 1, 250'000},
-    {"RxChn", ip_in, 1, 1},           {"RxChnColl", ip_in, 1, 14},       {"RxChnGT2", ip_in, 1, 8},
-    {"RxChnGT4", ip_in, 1, 30},       {"IPInPkt", ip_in, 1, 1},
+    {"TotalRcvd", ip_rx, 1, 1},        {"Delivered", ip_rx, 1, 1},
+    {"Delivered", ip_rx, -1, 50'000},  {"FragRcvd", ip_rx, 2, 50'000},
+    {"Reassembled", ip_rx, 1, 50'000}, {"LocalOut", ip_tx, 1, 1},
+    {"NoRoute", ip_tx, 1, 250'000},    {"RxChn", ip_rx, 1, 1},
+    {"RxChnColl", ip_rx, 1, 14},       {"RxChnGT2", ip_rx, 1, 8},
+    {"RxChnGT4", ip_rx, 1, 30},        {"IPInPkt", ip_rx, 1, 1},
 };
 
 constexpr ingredient ip6_ingredients[] = {
-    {"TotalRcvd", ip6_in, 1, 1},
-    {"Delivered", ip6_in, 1, 1},
-    {"Delivered", ip6_in, -1, 700'000},
-    {"Delivered", ip6_in, -1, 90'000},
-    {"FrafRcvd", ip6_in, 2, 90'000},
-    {"Reassembled", ip6_in, 1, 90'000},
-    {"ScopeErr", ip6_in, 1, 700'000},
-    {"LocalOut", ip6_out, 1, 1},
-    {"NoRoute", ip6_out, 1, 350'000},
-    {"Fwd$Hit", ip6_out, 1, 1},
-    {"Fwd$Hit", ip6_out, -1, 400},
-    {"Fwd$Miss", ip6_out, 1, 400},
-    {"AddrSelFail", ip6_out, 1, 2'000'000},
+    {"TotalRcvd", ip6_rx, 1, 1},     {"Delivered", ip6_rx, 1, 1},        {"Delivered", ip6_rx, -1, 90'000},
+    {"FrafRcvd", ip6_rx, 2, 90'000}, {"Reassembled", ip6_rx, 1, 90'000}, {"LocalOut", ip6_tx, 1, 1},
+    {"NoRoute", ip6_tx, 1, 350'000}, {"Fwd$Hit", ip6_tx, 1, 1},          {"Fwd$Hit", ip6_tx, -1, 400},
+    {"Fwd$Miss", ip6_tx, 1, 400},
 };
 
 constexpr ingredient tcp_ingredients[] = {
-    {"ConnInit", initiated, 1, 1},
-    {"ConnAcpt", accepted, 1, 1},
-    {"ConnEst", initiated, 1, 1},
-    {"ConnEst", initiated, -1, 25},
-    {"ConnEst", accepted, 1, 1},
-    {"ConnDrop", initiated, 1, 25},
-    {"EConnDrop", initiated, 1, 50},
-    {"ConnClosed", closed, 1, 1},
-    {"RTTTimed", tcp_out, 1, 6},
-    {"RTTUpdated", tcp_out, 1, 6},
-    {"DelayAck", tcp_in, 1, 9},
-    {"ReXmtTO", tcp_out, 1, 4000},
-    {"KATO", closed, 1, 5},
-    {"KAProbe", closed, 1, 5},
-    {"SndTotalPkt", tcp_out, 1, 1},
-    {"SndTotalDP", tcp_out, 1, 1},
-    {"SndTotalDP", tcp_out, -1, 300},
-    {"SndTotalDP", tcp_out, -1, 4},
-    {"SndTotalDP", tcp_out, -1, 60},
-    {"SndTotalDP", initiated, -1, 1},
-    {"SndTotalDP", closed, -1, 1},
-    {"SndDPktReXmt", tcp_out, 1, 300},
-    {"SndAck", tcp_out, 1, 4},
-    {"SndWinUpd", tcp_out, 1, 60},
-    {"SndCtlPkt", initiated, 1, 1},
-    {"SndCtlPkt", closed, 1, 1},
-    {"SndDataByte", tcp_out_data, 1, 1},
-    {"SndDataByte", tcp_out_data, -1, 300},
-    {"SndDByteReXmt", tcp_out_data, 1, 300},
-    {"RcvTotalPkt", tcp_in, 1, 1},
-    {"RcvPktInSeq", tcp_in, 1, 1},
-    {"RcvPktInSeq", tcp_in, -1, 4},
-    {"RcvPktInSeq", tcp_in, -1, 500},
-    {"RcvPktInSeq", tcp_in, -1, 350},
-    {"RcvBInSeq", tcp_in_data, 1, 1},
-    {"RcvBInSeq", tcp_in_data, -1, 500},
-    {"RcvBInSeq", tcp_in_data, -1, 350},
-    {"RcvBadCsum", tcp_in, 1, 900'000},
-    {"RcvDupPkt", tcp_in, 1, 500},
-    {"RcvDupByte", tcp_in_data, 1, 500},
-    {"RcvOOPkt", tcp_in, 1, 350},
-    {"RcvOOByte", tcp_in_data, 1, 350},
-    {"RcvAckPkt", tcp_in, 1, 4},
-    {"RcvAckByte", tcp_out_data, 1, 1},
-    {"RcvAckByte", tcp_out_data, -1, 300},
-    {"RcvDupAck", tcp_in, 1, 120},
-    {"RcvWinUpdPkt", tcp_in, 1, 80},
-    {"PredAck", tcp_in, 1, 5},
-    {"PredData", tcp_in, 1, 2},
-    {"Pcb$Miss", tcp_in, 1, 70},
-    {"RTT$Upd", closed, 1, 2},
-    {"RTTVar$Upd", closed, 1, 2},
-    {"RTTUsed", initiated, 1, 3},
-    {"RTTVarUsed", initiated, 1, 3},
-    {"SSTholdUsed", initiated, 1, 9},
-    {"ListenDrop", accepted, 1, 200},
-    {"BadRST", closed, 1, 150},
-    {"SCAdded", accepted, 1, 1},
-    {"SCCompl", accepted, 1, 1},
-    {"HCAdd", closed, 1, 2},
-    {"SACKRecEpi", tcp_out, 1, 2600},
-    {"SACKReXmt", tcp_out, 1, 1400},
-    {"SACKReXmtB", tcp_out_data, 1, 1400},
-    {"SACKRcvBlk", tcp_in, 1, 900},
-    {"SACKSntBlk", tcp_in, 1, 700},
-    {"CoalPkt", tcp_in, 1, 7},
-    {"LRO2Pkt", tcp_in, 1, 22},
-    {"LROMultiPkt", tcp_in, 1, 12},
-    {"LROLargePkt", tcp_in, 1, 45},
-    {"LimitedXmt", tcp_out, 1, 3200},
-    {"TailLossTRO", tcp_out, 1, 5000},
-    {"ReOrdPkt", tcp_in, 1, 1100},
-    {"RecoveryPkt", tcp_out, 1, 1800},
-    {"ProbTO", tcp_out, 1, 2400},
-    {"TLPFastRecvr", tcp_out, 1, 7000},
-    {"DSACKSnd", tcp_in, 1, 2200},
-    {"DSACKRcv", tcp_out, 1, 3900},
-    {"ECNCliSetup", initiated, 1, 1},
-    {"ECNNegoSucc", initiated, 1, 3},
-    {"ECNSvrSetup", accepted, 1, 2},
-    {"ECNSvrNoSupt", initiated, 2, 3},
-    {"TFOCkReq", initiated, 1, 12},
-    {"TFOCkRcv", initiated, 1, 20},
-    {"TmrDriftLE1Ms", tcp_out, 1, 15},
-    {"TmrDriftLE10Ms", tcp_out, 1, 90},
-    {"TmrDriftLE20Ms", tcp_out, 1, 800},
-    {"TmrDriftLE50Ms", tcp_out, 1, 2500},
-    {"TmrDriftLE100Ms", tcp_out, 1, 9000},
-    {"TmrDriftLE200Ms", tcp_out, 1, 70'000},
+    {"ConnInit", init, 1, 1},       {"ConnAcpt", acpt, 1, 1},       {"ConnEst", init, 1, 1},
+    {"ConnEst", init, -1, 25},      {"ConnEst", acpt, 1, 1},        {"ConnDrop", init, 1, 25},
+    {"ConnClosed", done, 1, 1},     {"SndTotalPkt", tx, 1, 1},      {"SndTotalDP", tx, 1, 1},
+    {"SndTotalDP", tx, -1, 3},      {"SndAck", tx, 1, 3},           {"SndAck", tx, -1, 30},
+    {"SndWinUpd", tx, 1, 30},       {"SndWinUpd", tx, -1, 300},     {"SndDPktReXmt", tx, 1, 300},
+    {"SndDPktReXmt", tx, -1, 3000}, {"SndCtlPkt", tx, 1, 3000},     {"SndDataByte", txd, 1, 1},
+    {"SndDataByte", txd, -1, 300},  {"SndDByteReXmt", txd, 1, 300}, {"RcvTotalPkt", rx, 1, 1},
+    {"RcvPktInSeq", rx, 1, 1},      {"RcvPktInSeq", rx, -1, 4},     {"RcvAckPkt", rx, 1, 4},
+    {"RcvAckPkt", rx, -1, 400},     {"RcvDupPkt", rx, 1, 400},      {"RcvDupPkt", rx, -1, 800},
+    {"RcvOOPkt", rx, 1, 800},       {"RcvBInSeq", rxd, 1, 1},       {"RcvBInSeq", rxd, -1, 400},
+    {"RcvDupByte", rxd, 1, 400},    {"RcvDupByte", rxd, -1, 800},   {"RcvOOByte", rxd, 1, 800},
+    {"RcvAckByte", txd, 1, 1},      {"RcvAckByte", txd, -1, 300},   {"RcvDupAck", rx, 1, 120},
+    {"RcvWinUpdPkt", rx, 1, 80},    {"PredAck", rx, 1, 5},          {"PredData", rx, 1, 2},
+    {"Pcb$Miss", rx, 1, 70},        {"RTTTimed", tx, 1, 6},         {"RTTUpdated", tx, 1, 6},
+    {"DelayAck", rx, 1, 9},         {"ReXmtTO", tx, 1, 4000},       {"KATO", done, 1, 5},
+    {"KAProbe", done, 1, 5},        {"RTT$Upd", done, 1, 2},        {"RTTVar$Upd", done, 1, 2},
+    {"RTTUsed", init, 1, 3},        {"RTTVarUsed", init, 1, 3},     {"SCAdded", acpt, 1, 1},
+    {"SCCompl", acpt, 1, 1},        {"SACKRecEpi", tx, 1, 2600},    {"SACKReXmt", tx, 1, 1400},
+    {"SACKReXmtB", txd, 1, 1400},   {"SACKRcvBlk", rx, 1, 900},     {"SACKSntBlk", rx, 1, 700},
+    {"CoalPkt", rx, 1, 7},          {"LRO2Pkt", rx, 1, 22},         {"LROMultiPkt", rx, 1, 12},
+    {"TailLossTRO", tx, 1, 5000},   {"ReOrdPkt", rx, 1, 1100},      {"RecoveryPkt", tx, 1, 1800},
+    {"ProbTO", tx, 1, 2400},        {"ECNCliSetup", init, 1, 1},    {"ECNNegoSucc", init, 1, 3},
+    {"ECNSvrNoSupt", init, 2, 3},   {"TmrDriftLE1Ms", tx, 1, 15},   {"TmrDriftLE10Ms", tx, 1, 90},
+    {"TmrDriftLE20Ms", tx, 1, 800},
 };
 
 constexpr ingredient udp_ingredients[] = {
-    {"InPkt", udp_in, 1, 1},          {"BadCsum", udp_in, 1, 800'000}, {"NoPort", udp_in, 1, 9000},
-    {"FullSock", udp_in, 1, 120'000}, {"PCBCacheMiss", udp_in, 1, 25}, {"PCBHashMiss", udp_in, 1, 9000},
-    {"OutPkt", udp_out, 1, 1},        {"FastOut", udp_out, 1, 1},      {"FastOut", udp_out, -1, 40},
-    {"NoCsum", udp_in, 1, 60},
+    {"InPkt", udp_rx, 1, 1},         {"NoPort", udp_rx, 1, 9000}, {"FullSock", udp_rx, 1, 120'000},
+    {"PCBCacheMiss", udp_rx, 1, 25}, {"OutPkt", udp_tx, 1, 1},    {"FastOut", udp_tx, 1, 1},
+    {"FastOut", udp_tx, -1, 40},     {"NoCsum", udp_rx, 1, 60},
 };
 
 std::uint64_t data_of(const traffic &moved) {
@@ -163,18 +89,18 @@ void put_stack(const nexus &carrier, std::int32_t pid, const stack_totals &seen,
   std::uint64_t sources[source_count] = {};
   for (int ipv6 = 0; ipv6 < 2; ++ipv6) {
     const auto &[by_tcp, by_udp] = seen.moved[ipv6];
-    sources[ipv6 ? ip6_out : ip_out] = by_tcp.out.packets + by_udp.out.packets;
-    sources[ipv6 ? ip6_in : ip_in] = by_tcp.in.packets + by_udp.in.packets;
-    sources[tcp_out] += by_tcp.out.packets;
-    sources[tcp_in] += by_tcp.in.packets;
-    sources[tcp_out_data] += data_of(by_tcp.out);
-    sources[tcp_in_data] += data_of(by_tcp.in);
-    sources[udp_out] += by_udp.out.packets;
-    sources[udp_in] += by_udp.in.packets;
+    sources[ipv6 ? ip6_tx : ip_tx] = by_tcp.out.packets + by_udp.out.packets;
+    sources[ipv6 ? ip6_rx : ip_rx] = by_tcp.in.packets + by_udp.in.packets;
+    sources[tx] += by_tcp.out.packets;
+    sources[rx] += by_tcp.in.packets;
+    sources[txd] += data_of(by_tcp.out);
+    sources[rxd] += data_of(by_tcp.in);
+    sources[udp_tx] += by_udp.out.packets;
+    sources[udp_rx] += by_udp.in.packets;
   }
-  sources[initiated] = seen.initiated;
-  sources[accepted] = seen.accepted;
-  sources[closed] = seen.closed;
+  sources[init] = seen.initiated;
+  sources[acpt] = seen.accepted;
+  sources[done] = seen.closed;
 
   tv_stats_userstack record{};
   record.nx_uuid = carrier.id;

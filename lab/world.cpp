@@ -101,6 +101,14 @@ world make_world(const sizes &size, std::uint64_t seed) {
   return state;
 }
 
+std::string registered_name(nexus_kind kind, std::uint32_t ordinal) {
+  static constexpr const char *names[] = {"multistack",     "net-if", "bridge",
+                                          "content-filter", "tunnel", "scratch"};
+  const std::string interface = interface_name(kind, ordinal);
+  std::string name = std::string("com.example.").append(names[static_cast<int>(kind)]).append(1, '.');
+  return name.append(interface.empty() ? std::to_string(ordinal) : interface);
+}
+
 // Pipes without a name come and go with those who talk through them.
 void replace_pipes(world &state, std::uint32_t milliseconds) {
   for (nexus &instance : state.nexuses) {

@@ -140,6 +140,9 @@ struct world {
 std::string interface_name(nexus_kind kind, std::uint32_t ordinal);
 std::uint32_t interface_index(nexus_kind kind, std::uint32_t ordinal);
 
+// What a provider or an instance is called.
+std::string registered_name(nexus_kind kind, std::uint32_t ordinal);
+
 // The same for the same sizes and seed.
 world make_world(const sizes &size, std::uint64_t seed);
 
