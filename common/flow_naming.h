@@ -53,6 +53,9 @@ using endpoint_text = format::small_text<64>;  // longest: a host of 37 bytes, "
 // bytes 2 and 3 of link-local addresses. An IPv6 host of the local domain goes without the domain. Nothing is
 // looked up with `numerical`; without it every call asks the system's name services again and may wait for
 // them.
+//
+// The names of interfaces in scopes are asked for once each, until forget_scopes() at the start of a listing.
+void forget_scopes();
 ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical);
 ipv6_host_text ipv6_host_name(const ipv6_address &address, bool numerical);
 

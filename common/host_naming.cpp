@@ -6,7 +6,9 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstring>
+#include <iterator>
 #include <string_view>
 
 #include "common/flow_naming.h"
@@ -73,11 +75,26 @@ bool may_embed_scope(const ipv6_address &address) {
   return bytes[0] == 0xff && (scope == 1 || scope == 2);
 }
 
-ipv6_host_text numeric_with_scope(const ipv6_address &address, unsigned scope) {
+// How getnameinfo renders an address with a scope: "%" and an interface or a number behind it. Asking for an
+// interface's name takes longer than all else in a row of a listing, so that the last answers are kept, for
+// one listing.
+struct scope_text {
+  std::uint32_t key = 0;  // of no scope
+  format::name_text text{};
+};
+scope_text scopes[64];
+
+// What the rendering depends on: the scope, and which kind of address carries it.
+std::uint32_t scope_key(const ipv6_address &address, unsigned scope) {
+  const bool is_multicast = address.bytes[0] == 0xff;
+  return static_cast<std::uint32_t>(is_multicast ? address.bytes[1] & 0x0f : 0) << 16 | scope;
+}
+
+// The whole text, "?" where there is none.
+ipv6_host_text ask_for_number(const ipv6_address &address, unsigned scope) {
   sockaddr_in6 socket_address{};
   socket_address.sin6_family = AF_INET6;
   std::memcpy(&socket_address.sin6_addr, address.bytes, sizeof address.bytes);
-  std::memset(&socket_address.sin6_addr.s6_addr[2], 0, 2);
   socket_address.sin6_scope_id = scope;
   char host[NI_MAXHOST];
   const int error = getnameinfo(reinterpret_cast<const sockaddr *>(&socket_address), sizeof socket_address,
@@ -86,10 +103,31 @@ ipv6_host_text numeric_with_scope(const ipv6_address &address, unsigned scope) {
 }
 
 ipv6_host_text numeric(const ipv6_address &address) {
-  const unsigned scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
-  if (scope && may_embed_scope(address)) return numeric_with_scope(address, scope);
+  unsigned scope = 0;
+  ipv6_address plain = address;
+  if (may_embed_scope(address)) {
+    scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
+    plain.bytes[2] = plain.bytes[3] = 0;
+  }
   ipv6_host_text text;
-  text.end_at(put_ipv6_address(text.chars, address));
+  text.end_at(put_ipv6_address(text.chars, plain));
+  if (scope == 0) return text;
+
+  const std::uint32_t key = scope_key(address, scope);
+  scope_text &known = scopes[key % std::size(scopes)];
+  if (known.key != key) {
+    const ipv6_host_text whole = ask_for_number(plain, scope);
+    const std::string_view rendered = whole.view();
+    const std::size_t length = rendered.size() - text.size;
+    const bool may_be_cut = rendered.size() == sizeof whole.chars - 1;
+    if (may_be_cut || !rendered.starts_with(text.view()) || length > sizeof known.text.chars) return whole;
+    known.key = key;
+    known.text.size = length;
+    std::memcpy(known.text.chars, rendered.data() + text.size, length);
+  }
+  text.foreign = true;
+  const std::size_t room = sizeof text.chars - 1 - text.size;
+  text.end_at(std::copy_n(known.text.chars, std::min(room, known.text.size), text.chars + text.size));
   return text;
 }
 
@@ -115,7 +153,7 @@ void put_service(endpoint_text &text, char *host_end, std::uint16_t port, const 
     end = put_cut(end, service ? service->s_name : unspecified, service_name_limit);
   }
   text.end_at(end);
-  text.foreign = !numerical;
+  text.foreign = true;  // names of hosts and services, and of the interfaces in scopes
 }
 
 // Starts an endpoint with the host of any kind.
@@ -131,6 +169,10 @@ bool is_unspecified(const Address &address) {
 }
 
 }  // namespace
+
+void forget_scopes() {
+  std::fill(std::begin(scopes), std::end(scopes), scope_text{});
+}
 
 ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {
   constexpr std::size_t size = sizeof(ipv4_host_text::chars);

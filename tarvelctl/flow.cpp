@@ -91,6 +91,7 @@ void print_flows(std::span<const std::byte> flows) {
 
 int list_flows() {
   if (!netstat_options.all_flows) netstat_options.numerical = 1;
+  forget_scopes();
   kernel_table table;
   if (const int error = table.fetch(flow_node_name)) return error;
   if (table.empty()) return 0;

@@ -51,6 +51,7 @@ void print_route(const tv_stats_flow_route &route) {
 
 int cmd_flow_route(int argc, char **argv) {
   take_numerical_option(argc, argv);
+  forget_scopes();
   kernel_table table;
   if (const int error = table.fetch(flow_route_node)) return error;
   if (table.empty()) return 0;
