@@ -67,7 +67,7 @@ socket_address remote_address(random_source &random, std::uint32_t ordinal, addr
     const std::uint32_t elsewhere = 0x800000 | random.below(0x10000);
     return of_global(on_link ? ordinal : elsewhere, random.next());
   }
-  if (on_link && number < 200) return of_private(ordinal, 255 - number % 200);
+  if (on_link && number < 200) return of_private(ordinal, 254 - number % 200);
   // 89 has no factor in common with 250: hosts look scattered and do not repeat.
   const auto &network = documentation[number % 3];
   const auto host = static_cast<std::uint8_t>(1 + number / 3 * 89 % 250);

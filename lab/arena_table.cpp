@@ -118,8 +118,8 @@ void put_arena(const world &state, const arena_parts &parts, const arena_owner &
   arena.type = parts.type;
   for (std::size_t type = 0; type < tv_stats_arena::region_slots; ++type) {
     const scope shared = shapes[type].shared;
-    if (parts.regions >> type & 1)
-      arena.regions[type] = region_of(state, type, owner.ids[shared], owner.names[shared]);
+    if ((parts.regions >> type & 1) == 0) continue;
+    arena.regions[type] = region_of(state, type, owner.ids[shared], owner.names[shared]);
   }
   for (std::size_t i = 0; i < std::min(pids.size(), tv_stats_arena::pid_slots); ++i) arena.pids[i] = pids[i];
   file.put(arena);
@@ -164,11 +164,10 @@ void put_channel_arena(const world &state, const channel &used, std::size_t turn
 
 void write_arenas(const world &state, table_file &file) {
   const std::size_t count = state.size.arenas;
-  if (count > 0)
-    put_arena(state, system_parts, {{}, {system_name, "", machine_name}}, running(state, 0), file);
-  if (count > 1)
-    put_arena(state, policy_parts, {{}, {policy_name, policy_name, machine_name}},
-              running(state, flow_programs), file);
+  const arena_owner system{{}, {system_name, "", machine_name}};
+  const arena_owner policy{{}, {policy_name, policy_name, machine_name}};
+  if (count > 0) put_arena(state, system_parts, system, running(state, 0), file);
+  if (count > 1) put_arena(state, policy_parts, policy, running(state, flow_programs), file);
   const std::size_t channels = state.channels.size();
   const std::size_t stride = channels % 3 ? 3 : 1;  // a few arenas are of all kinds of nexus
   for (std::size_t i = 2; i < count && channels; ++i) {

@@ -52,16 +52,6 @@ std::uint32_t port_of(nexus_kind kind, std::uint32_t number) {
   return number == 0 ? 2 : number - 1;
 }
 
-// A process that runs the program: the `instance`th, if there are as many. On a small machine one process
-// does the work of several programs.
-std::uint32_t process_for(const world &state, std::uint32_t program, std::uint32_t instance) {
-  const auto processes = static_cast<std::uint32_t>(state.processes.size());
-  const auto kinds = static_cast<std::uint32_t>(programs.size());
-  if (processes <= program) return program % processes;
-  const std::uint32_t instances = (processes - program + kinds - 1) / kinds;
-  return program + instance % instances * kinds;
-}
-
 void open_channel(world &state, channel &opened) {
   process &owner = state.processes[opened.process];
   if (owner.next_fd == 0) owner.next_fd = static_cast<std::int32_t>(state.random.between(3, 20));
@@ -143,6 +133,14 @@ void reopen_channel(world &state, std::uint32_t index) {
 
 }  // namespace
 
+std::uint32_t process_for(const world &state, std::uint32_t program, std::uint32_t instance) {
+  const auto processes = static_cast<std::uint32_t>(state.processes.size());
+  const auto kinds = static_cast<std::uint32_t>(programs.size());
+  if (processes <= program) return program % processes;
+  const std::uint32_t instances = (processes - program + kinds - 1) / kinds;
+  return program + instance % instances * kinds;
+}
+
 void open_channels(world &state) {
   if (state.processes.empty()) return;
   deal_channels(state.nexuses, state.size.channels);
@@ -163,7 +161,8 @@ void open_channels(world &state) {
 
 void replace_channels(world &state, std::uint32_t milliseconds) {
   const auto count = static_cast<std::uint32_t>(state.flow_channels.size());
-  for (auto losses = state.random.share(count, milliseconds, 60'000); losses; --losses) {
+  const auto losses = std::min<std::uint64_t>(state.random.share(count, milliseconds, 60'000), count / 4 + 1);
+  for (std::uint64_t left = losses; left; --left) {
     channel &lost = state.channels[state.flow_channels[state.random.below(count)]];
     if (lost.state != channel::phase::open) continue;
     lost.state = channel::phase::defunct;

@@ -17,10 +17,8 @@ void write_advisories(const world &state, table_file &file) {
   }
   for (std::size_t i = 0; i < lists.size(); ++i) {
     const nexus &carrier = state.nexuses[state.switches[i].nexus];
-    // The switch belongs to whoever has its first port.
-    const channel &first = state.channels[carrier.first_channel + (carrier.channel_count > 1)];
     tv_stats_flow_adv record{.sfa_nx_uuid = carrier.id,
-                             .sfa_pid = state.processes[first.process].pid,
+                             .sfa_pid = state.processes[process_for(state, network_daemon, 0)].pid,
                              .sfa_entries_count = state.switches[i].advisories};
     set_text(record.sfa_if_name, interface_name(carrier.kind, carrier.ordinal));
     file.put(record);

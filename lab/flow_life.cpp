@@ -53,8 +53,8 @@ void replace_flows(world &state, std::uint32_t milliseconds) {
     } else {
       step_udp(state, walker, milliseconds);
     }
-    if (walker.advisory != none && state.random.chance(milliseconds, 20'000))
-      walker.controlled = !walker.controlled;
+    const bool advised = walker.advisory != none && state.random.chance(milliseconds, 20'000);
+    walker.controlled = walker.controlled != advised;
   }
   std::erase_if(state.flows, [&state](const flow &ended) {
     if (ended.state != tcp::gone) return false;
@@ -64,7 +64,7 @@ void replace_flows(world &state, std::uint32_t milliseconds) {
 
   const std::uint64_t wanted = state.size.flows;
   const std::uint64_t missing = wanted - std::min<std::uint64_t>(wanted, state.flows.size());
-  const std::uint64_t usual = state.random.share(missing + wanted / 16, milliseconds, 2000);
+  const std::uint64_t usual = state.random.share(missing + wanted / 16, std::min(milliseconds, 2000U), 2000);
   if (state.flow_channels.empty() || wanted == 0 || state.flows.size() > wanted + wanted / 4) return;
   for (std::uint32_t left = state.random.below(static_cast<std::uint32_t>(2 * usual + 2)); left; --left) {
     const auto channels = static_cast<std::uint32_t>(state.flow_channels.size());

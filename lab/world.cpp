@@ -72,6 +72,15 @@ void register_providers(world &state) {
   }
 }
 
+// Pipes without a name come and go with those who talk through them.
+void replace_pipes(world &state, std::uint32_t milliseconds) {
+  for (nexus &instance : state.nexuses) {
+    if (instance.kind != nexus_kind::scratch_pipe || !state.random.chance(milliseconds, 4000)) continue;
+    instance.alive = !instance.alive;
+    if (instance.alive) instance.id = state.random.identity();
+  }
+}
+
 }  // namespace
 
 std::string interface_name(nexus_kind kind, std::uint32_t ordinal) {
@@ -107,15 +116,6 @@ std::string registered_name(nexus_kind kind, std::uint32_t ordinal) {
   const std::string interface = interface_name(kind, ordinal);
   std::string name = std::string("com.example.").append(names[static_cast<int>(kind)]).append(1, '.');
   return name.append(interface.empty() ? std::to_string(ordinal) : interface);
-}
-
-// Pipes without a name come and go with those who talk through them.
-void replace_pipes(world &state, std::uint32_t milliseconds) {
-  for (nexus &instance : state.nexuses) {
-    if (instance.kind != nexus_kind::scratch_pipe || !state.random.chance(milliseconds, 4000)) continue;
-    instance.alive = !instance.alive;
-    if (instance.alive) instance.id = state.random.identity();
-  }
 }
 
 void advance(world &state, std::uint32_t milliseconds) {

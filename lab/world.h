@@ -143,6 +143,10 @@ std::uint32_t interface_index(nexus_kind kind, std::uint32_t ordinal);
 // What a provider or an instance is called.
 std::string registered_name(nexus_kind kind, std::uint32_t ordinal);
 
+// The index of a process that runs the program: of the `instance`th one, if there are as many. On a small
+// machine one process does the work of several programs; there must be one.
+std::uint32_t process_for(const world &state, std::uint32_t program, std::uint32_t instance);
+
 // The same for the same sizes and seed.
 world make_world(const sizes &size, std::uint64_t seed);
 

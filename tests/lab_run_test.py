@@ -1,0 +1,179 @@
+#!/usr/bin/env python3
+"""Tests of how the lab's tables move, of what `run` leaves behind and of what `capture` saves.
+
+usage: lab_run_test.py TARVELLAB [unittest options]
+"""
+import os
+import pathlib
+import pty
+import signal
+import subprocess
+import sys
+import time
+import unittest
+
+sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
+from lab_kernel import Kernel, LabTest, files, lab, node_dir, run, u32, u64  # noqa: E402
+
+
+class Simulate(LabTest):
+    def simulate(self, *options):
+        process = subprocess.Popen([lab, "simulate", self.directory, *options], stdout=subprocess.PIPE, text=True)
+        self.addCleanup(process.stdout.close)
+        self.addCleanup(process.wait)
+        self.addCleanup(process.kill)
+        self.assertEqual(process.stdout.readline(), f"simulating in {self.directory}\n")
+        return process, Kernel(self.directory)
+
+    def test_ReadersMeetWholeTablesOnly(self):
+        process, kernel = self.simulate("--interval", "10", "--flows", "2000")
+        sizes, inodes, end = set(), set(), time.monotonic() + 2
+        while time.monotonic() < end:
+            inodes.add((kernel.root / node_dir / "stats/flow").stat().st_ino)
+            sizes.add(len(kernel.flows()))
+            kernel.providers(), list(kernel.channels()), list(kernel.chains("stats/flow_adv", 40, 36, 20))
+        process.send_signal(signal.SIGINT)
+        self.assertEqual(process.wait(5), 0)
+        self.assertGreater(min(len(sizes), len(inodes)), 10)
+        self.assertTrue(all(1000 < size < 3000 for size in sizes))
+        self.assertEqual([name for name in files(self.directory) if "/." in name], [])
+        running = {int(p.parent.name) for p in self.directory.glob("proc/*/comm")}
+        self.assertLessEqual(set(kernel.pids()) - {0}, running)
+
+    def test_RatesAreTheDifferencesOfSnapshots(self):
+        process, kernel = self.simulate("--interval", "200")
+        path = kernel.root / node_dir / "nexus_channel_list"
+
+        def next_snapshot(last=[None]):
+            self.wait_for(lambda: path.stat().st_ino != last[0])
+            last[0] = path.stat().st_ino
+            return {entry[:16]: rings for _, entry, rings in kernel.channels() if entry}
+
+        before, compared = next_snapshot(), 0
+        for _ in range(8):
+            after = next_snapshot()
+            for old, new in ((old, new) for c in before.keys() & after for old, new in zip(before[c], after[c])):
+                moved = u64(new, 16) - u64(old, 16)
+                self.assertGreaterEqual(moved, 0)
+                compared += moved > 0 and abs(u64(new, 48) - 5 * moved) < 5
+            before = after
+        process.terminate()
+        self.assertEqual(process.wait(5), 0)
+        # Now and then a machine under load takes a snapshot more between two reads.
+        self.assertGreater(compared, 200)
+
+
+class Run(LabTest):
+    def setUp(self):
+        super().setUp()
+        self.env = {**os.environ, "TMPDIR": str(self.directory)}
+
+    def start(self, script, **options):
+        process = subprocess.Popen([lab, "run", "--interval", "20", "--", "sh", "-c", script], env=self.env,
+                                   stdout=subprocess.PIPE, text=True, **options)
+        self.addCleanup(process.stdout.close)
+        self.addCleanup(process.wait)
+        self.addCleanup(process.kill)
+        return process, process.stdout.readline().strip()
+
+    def nothing_left(self):
+        if any(self.directory.iterdir()):
+            return False
+        told = [p for p in pathlib.Path("/proc").glob("[0-9]*/environ") if self.mentions(p)]
+        return not told
+
+    def mentions(self, path):
+        try:
+            return f"TMPDIR={self.directory}\0".encode() in path.read_bytes()
+        except OSError:
+            return False
+
+    def test_StatusIsTheCommandsOwn(self):
+        for script, status in (("exit 0", 0), ("exit 7", 7), ("kill -KILL $$", -9), ("kill -TERM $$", -15)):
+            self.assertEqual(run("run", "--", "sh", "-c", script, env=self.env).returncode, status)
+        self.assertEqual(run("run", "--", "no-such-command", env=self.env).returncode, 127)
+        self.assertEqual(run("run", "--", "/dev/null", env=self.env).returncode, 126)
+        self.assertEqual(run("run", self.directory / "none", "--", "true", env=self.env).returncode, 1)
+        self.assertTrue(self.nothing_left())
+
+    def test_CommandSeesACompleteKernel(self):
+        seen = run("run", "--", "tarvelctl", "provider", env=self.env)
+        self.assertEqual((seen.returncode, seen.stderr, seen.stdout.count("com.example.")), (0, "", 9))
+        kernel = self.generate("--providers", "3")
+        seen = run("run", kernel.root.name, "--", "sh", "-c", "cd /; echo $TARVEL_ROOT", cwd=self.directory)
+        self.assertEqual(seen.stdout, f"{kernel.root.resolve()}\n")
+
+    def test_SignalsArePassedOnAndAllIsCleanedUp(self):
+        for number in signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGQUIT:
+            process, _ = self.start(f"trap 'exit 9' {int(number)}; echo ready; while :; do sleep 0.01; done")
+            process.send_signal(number)
+            self.assertEqual(process.wait(5), 9)
+            self.assertTrue(self.nothing_left())
+            process, _ = self.start("echo ready; exec sleep 60")
+            process.send_signal(number)
+            self.assertEqual(process.wait(5), -number)
+            self.assertTrue(self.nothing_left())
+
+    def test_TheTerminalInterruptsTheCommandOnceAndTheSimulationNever(self):
+        script = ("n=0; trap 'n=$((n+1)); i=$(stat -c %i $f)' INT; f=$TARVEL_ROOT/proc/sys/kern/tarvel/stats/flow; echo ready;"
+                  "while [ $n = 0 ]; do sleep 0.01; done; sleep 0.3; [ $i != $(stat -c %i $f) ] && echo moves; echo $n times")
+        pid, terminal = pty.fork()
+        if pid == 0:
+            os.execve(lab, [lab, "run", "--interval", "20", "--", "sh", "-c", script], self.env)
+        output = b""
+        while b"times" not in output:
+            output += os.read(terminal, 1000)
+            if b"ready" in output and b"^C" not in output:
+                os.write(terminal, b"\3")
+        self.assertEqual(os.waitstatus_to_exitcode(os.waitpid(pid, 0)[1]), 0)
+        os.close(terminal)
+        self.assertIn(b"moves\r\n1 times", output)
+        self.assertTrue(self.nothing_left())
+
+    def test_TheSimulationDoesNotOutliveAKilledRun(self):
+        process, child = self.start("echo $$; exec sleep 60")
+        process.kill()
+        process.wait()
+        os.kill(int(child), signal.SIGKILL)
+        self.wait_for(self.nothing_left)
+
+
+class Capture(LabTest):
+    def capture(self, root, name="saved"):
+        return run("capture", self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)})
+
+    def test_CapturedKernelIsTheSameByteForByte(self):
+        kernel = self.generate()
+        self.assertEqual(self.capture(kernel.root).returncode, 0)
+        made, saved = files(kernel.root), files(self.directory / "saved")
+        mentioned = {f"proc/{pid}/comm" for pid in kernel.pids()}
+        self.assertEqual(saved, {name: made[name] for name in made if "comm" not in name or name in mentioned})
+        self.assertEqual((self.directory / "saved").stat().st_mode & 0o777, 0o700)
+        self.assertEqual(self.capture(kernel.root, "made").returncode, 0)  # onto itself
+        self.assertEqual(files(kernel.root), made)
+
+    def test_MissingTablesAreLeftOut(self):
+        kernel = self.generate()
+        self.capture(kernel.root)
+        (kernel.root / node_dir / "stats/flow").unlink()
+        again = self.capture(kernel.root)
+        self.assertEqual(again.returncode, 0)
+        self.assertIn("kern.tarvel.stats.flow is left out", again.stderr)
+        self.assertEqual(files(self.directory / "saved").keys() & {node_dir + "stats/flow"}, set())
+        self.assertEqual(self.capture(self.directory / "empty").returncode, 1)
+
+    def test_DamagedTablesAreSavedAsTheyAre(self):
+        kernel = self.generate()
+        for name, keep, damage in (("nexus_channel_list", 3000, (16, b"\xff" * 4)), ("nexus_channel_list", 71, (60, b"\xff" * 8)),
+                                   ("stats/flow_adv", 59, (36, b"\xff" * 4)), ("stats/flow", 639, (68, b"\xff" * 4)),
+                                   ("stats/arena", 2607, (0, b"")), ("stats/userstack", 1, (0, b""))):
+            table = bytearray(kernel.table(name)[:keep])
+            at, value = damage
+            table[at:at + len(value)] = value
+            (kernel.root / node_dir / name).write_bytes(table)
+            self.assertEqual(self.capture(kernel.root).returncode, 0)
+            self.assertEqual(Kernel(self.directory / "saved").table(name), bytes(table))
+
+
+if __name__ == "__main__":
+    unittest.main()
