@@ -272,8 +272,10 @@ TEST_F(write_error, ClosedStandardOutputDoesNotMatterWithAnOutputFile) {
 
 TEST_F(write_error, ReaderThatLeavesEndsTheProcessQuietly) {
   make_long_report();
-  const run_result result = run("provider", {.reader_leaves = true});
-  EXPECT_EQ(complained(result.err, result.status), complained("", -SIGPIPE));
+  for (const std::vector<int> &ignored : {std::vector<int>{}, std::vector<int>{SIGPIPE}}) {
+    const run_result result = run("provider", {.reader_leaves = true, .ignored = ignored});
+    EXPECT_EQ(complained(result.err, result.status), complained("", -SIGPIPE));
+  }
 }
 
 }  // namespace

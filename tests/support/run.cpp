@@ -84,6 +84,7 @@ channel make_stdout(const run_options &options) {
   dup2(out, STDOUT_FILENO);
   dup2(err, STDERR_FILENO);
   for (const int fd : options.closed) close(fd);
+  for (const int number : options.ignored) signal(number, SIG_IGN);
   if (!options.directory.empty() && chdir(options.directory.c_str()) != 0) _exit(126);
   setenv("TARVEL_ROOT", kernel.root().c_str(), 1);
 

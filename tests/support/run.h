@@ -48,6 +48,7 @@ struct run_options {
   bool reader_leaves = false;         // the reader of standard output closes it after its first read
   std::string stdout_path{};          // standard output is this file, and `out` stays empty
   std::vector<int> closed{};          // standard descriptors that are closed at the start
+  std::vector<int> ignored{};         // signals that the caller has ignored
   std::string program_name{};         // in place of the program's path, as its first argument
   std::filesystem::path directory{};  // where it runs
   std::function<void(const running &)> meanwhile{};  // called at least every few milliseconds
