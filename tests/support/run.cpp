@@ -128,6 +128,13 @@ run_result complained(std::string err, int status, std::string out) {
   return {std::move(out), std::move(err), status};
 }
 
+run_result inconsistent(const std::string &function, int line, const std::string &expression, std::string out,
+                        const std::string &file) {
+  return complained("Assertion failed: (" + expression + "), function " + function + ", file " + file +
+                        ", line " + std::to_string(line) + ".\n",
+                    -SIGABRT, std::move(out));
+}
+
 void PrintTo(const run_result &result, std::ostream *to) {
   *to << "status " << result.status << "\n--- standard output:\n"
       << result.out << "--- standard error:\n"

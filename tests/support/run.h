@@ -28,6 +28,10 @@ void PrintTo(const run_result &result, std::ostream *to);
 run_result printed(std::string out);
 run_result complained(std::string err, int status = 0, std::string out = "");
 
+// A run that ends at the invariant of an inconsistent table, after the report in front of it.
+run_result inconsistent(const std::string &function, int line, const std::string &expression,
+                        std::string out = "", const std::string &file = "tarvelctl/tarvelctl");
+
 // A command line without the program's name: a text, split at blanks, or one text per word.
 struct words : std::vector<std::string> {
   words(const char *line);
