@@ -8,6 +8,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -46,15 +47,17 @@ bool wait_for_room(int fd, const timespec *timeout, const sigset_t *held) {
   return ppoll(&room, 1, timeout, held) > 0;
 }
 
-timespec time_left(const timespec &deadline) {
+constexpr std::int64_t nanoseconds = 1'000'000'000;
+
+std::int64_t monotonic_time() {
   timespec now;
   clock_gettime(CLOCK_MONOTONIC, &now);
-  timespec left{.tv_sec = deadline.tv_sec - now.tv_sec, .tv_nsec = deadline.tv_nsec - now.tv_nsec};
-  if (left.tv_nsec < 0) {
-    left.tv_nsec += 1'000'000'000;
-    --left.tv_sec;
-  }
-  return left.tv_sec < 0 ? timespec{} : left;
+  return now.tv_sec * nanoseconds + now.tv_nsec;
+}
+
+timespec time_until(std::int64_t deadline) {
+  const std::int64_t left = std::max<std::int64_t>(deadline - monotonic_time(), 0);
+  return {.tv_sec = left / nanoseconds, .tv_nsec = left % nanoseconds};
 }
 
 // The signal's own end where a reader has gone, also when the caller had it ignored or held back.
@@ -105,14 +108,31 @@ std::size_t output::next_piece(const char *upto) const {
   return last ? static_cast<std::size_t>(last + 1 - begin_) : PIPE_BUF;
 }
 
+// Writes at most `size` bytes, waiting for room where writing cannot be told not to wait. A terminal may wait
+// also when it has some room. Then SIGINT has to come through, and what it cuts off is dropped: how much was
+// written is not known.
+ssize_t output::write_piece(std::size_t size, const sigset_t &unheld) {
+  if (!may_block_) return write(fd_, begin_, size);
+  wait_for_room(fd_, nullptr, &unheld);
+  if (!is_terminal_) return write(fd_, begin_, size);
+  write_is_open_ = true;
+  sigset_t held;
+  sigprocmask(SIG_SETMASK, &unheld, &held);
+  const ssize_t written = write(fd_, begin_, size);
+  const int error = errno;
+  sigprocmask(SIG_SETMASK, &held, nullptr);
+  errno = error;
+  write_is_open_ = false;
+  return written;
+}
+
 // Writes the bytes up to `upto`, lines_end_ or end_, and moves what follows to the buffer's front.
 void output::drain(const char *upto) {
   int error = 0;
   {
     const interrupt_hold hold;
     while (begin_ < upto && !error) {
-      if (may_block_) wait_for_room(fd_, nullptr, &hold.before());
-      const ssize_t written = write(fd_, begin_, next_piece(upto));
+      const ssize_t written = write_piece(next_piece(upto), hold.before());
       if (written > 0) {
         begin_ += written;
       } else if (written == 0) {
@@ -157,13 +177,12 @@ void output::fail(int error) {
 }
 
 int output::abandon() noexcept {
-  timespec deadline;
-  clock_gettime(CLOCK_MONOTONIC, &deadline);
-  deadline.tv_nsec += 100'000'000;
+  if (write_is_open_) return 0;
+  const std::int64_t deadline = monotonic_time() + nanoseconds / 10;
   const char *const upto = lines_end_.load(std::memory_order_acquire);
   bool wait = may_block_;
   while (begin_ < upto) {
-    const timespec left = time_left(deadline);
+    const timespec left = time_until(deadline);
     if (wait && !wait_for_room(fd_, &left, nullptr)) return 0;
     const ssize_t written = write(fd_, begin_, next_piece(upto));
     if (written > 0) {

@@ -7,6 +7,9 @@
 #ifndef TARVELCTL_COMMON_OUTPUT_H
 #define TARVELCTL_COMMON_OUTPUT_H
 
+#include <signal.h>
+#include <sys/types.h>
+
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
@@ -79,6 +82,7 @@ class output {
   static constexpr std::ptrdiff_t flush_size = 32 * 1024;
 
   std::size_t next_piece(const char *upto) const;
+  ssize_t write_piece(std::size_t size, const sigset_t &unheld);
   void make_room(std::size_t size);
   void drain(const char *upto);
   void fail(int error);
@@ -95,7 +99,8 @@ class output {
   failure on_failure_;
   bool is_terminal_ = false;
   bool is_pipe_ = false;
-  bool may_block_ = false;  // a pipe, socket or terminal, on whose reader a write can wait
+  std::atomic<bool> write_is_open_ = false;  // a write that SIGINT may cut off is going on
+  bool may_block_ = false;                   // a pipe, socket or terminal, on whose reader a write can wait
 };
 
 // Standard output, or the file that replaces it.

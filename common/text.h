@@ -3,7 +3,6 @@
 #ifndef TARVELCTL_COMMON_TEXT_H
 #define TARVELCTL_COMMON_TEXT_H
 
-#include <algorithm>
 #include <cstddef>
 #include <cstring>
 #include <string_view>
@@ -25,7 +24,7 @@ struct text_field {
   std::string_view view() const { return {bytes, strnlen(bytes, Width)}; }
 
   // At most the first `length` bytes of the text.
-  foreign_text first(std::size_t length) const { return {view().substr(0, std::min(length, Width))}; }
+  foreign_text first(std::size_t length) const { return {view().substr(0, length)}; }
 
   format::small_text<Width> printable() const {
     format::small_text<Width> text;
