@@ -1,87 +1,40 @@
-// The flow listing as one would write it first: read the table, qsort the records, printf each row. It is what the
-// benchmark measures tarvelctl against, on the same table and with the same bytes as result.
+// The flow listing.
 
 #include <arpa/inet.h>
 #include <netdb.h>
-#include <stdint.h>
-#include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
 
-struct endpoint_address {
-  uint8_t length, family;
-  uint16_t port;
-  uint8_t ipv4[4], ipv6[16];
-  uint32_t scope;
-};
-
-struct endpoint_stats {
-  uint64_t bytes, packets;
-  uint32_t state, rtt;
-  uint8_t unread[40];
-};
-
-struct flow {
-  uint8_t nexus[16];
-  char interface[16];
-  uint32_t bucket;
-  char process[32];
-  int32_t pid;
-  uint32_t flags, port;
-  struct endpoint_address local, remote;
-  uint8_t protocol, unread_1[3];
-  int32_t service_class;
-  uint32_t advisory;
-  uint8_t unread_2[4];
-  struct endpoint_stats local_stats, remote_stats;
-  uint8_t unread_3[40];
-};
+#include "obvious.h"
 
 static int by_pid(const void *a, const void *b) {
   const struct flow *x = a, *y = b;
   return (x->pid > y->pid) - (x->pid < y->pid);
 }
 
-static const char *protocol_name(uint8_t protocol) {
-  switch (protocol) {
-    case 6: return "tcp";
-    case 17: return "udp";
-    default: return "unk.";
-  }
-}
-
-static const char *state_name(uint32_t state) {
-  static const char *names[] = {"CLOSED",     "LISTEN",     "SYN_SENT", "SYN_RCVD", "ESTABLISHED", "CLOSE_WAIT",
-                                "FIN_WAIT_1", "CLOSING",    "LAST_ACK", "FIN_WAIT_2", "TIME_WAIT", "UNKNOWN",
-                                "UNKNOWN",    "UNKNOWN",    "UNKNOWN",  "UNKNOWN",  "UNKNOWN",     "UNKNOWN",
-                                "UNKNOWN",    "UNKNOWN",    "NO_TRAFFIC", "SINGLE", "MULTIPLE"};
-  return state < sizeof names / sizeof *names ? names[state] : "UNKNOWN";
-}
-
 static const char *service_class_name(int32_t value) {
   switch (value) {
-    case 0x000000: return "BE";
-    case 0x080090: return "BKS";
-    case 0x100080: return "BK";
-    case 0x180010: return "RD";
-    case 0x200020: return "OAM";
-    case 0x280120: return "AV";
-    case 0x300110: return "RV";
-    case 0x380100: return "VI";
-    case 0x400180: return "VO";
-    case 0x480190: return "CTL";
-    default: return "UNK";
+    case 0x000000:
+      return "BE";
+    case 0x080090:
+      return "BKS";
+    case 0x100080:
+      return "BK";
+    case 0x180010:
+      return "RD";
+    case 0x200020:
+      return "OAM";
+    case 0x280120:
+      return "AV";
+    case 0x300110:
+      return "RV";
+    case 0x380100:
+      return "VI";
+    case 0x400180:
+      return "VO";
+    case 0x480190:
+      return "CTL";
+    default:
+      return "UNK";
   }
-}
-
-static const char *flags_text(uint32_t flags) {
-  static char text[32];
-  snprintf(text, sizeof text, "%c%c%c%c%c%c%c%c%c%c%c%c%c ", flags & 0x10 ? 't' : '-', flags & 0x20 ? 'c' : '-',
-           flags & 0x40 ? 'l' : '-', flags & 0x100 ? 'q' : '-', flags & 0x200 ? 'b' : '-', flags & 0x1000 ? 'w' : '-',
-           flags & 0x2000 ? 'e' : '-', flags & 0x1000000 ? 'a' : '-', flags & 0x2000000 ? 'n' : '-',
-           flags & 0x4000000 ? 'd' : '-', flags & 0x8000000 ? 'o' : '-', flags & 0x40000000 ? 'x' : '-',
-           flags & 0x80000000 ? 'r' : '-');
-  return text;
 }
 
 static void ipv4_endpoint(char *text, size_t size, const struct endpoint_address *address) {
@@ -106,7 +59,8 @@ static void ipv6_endpoint(char *text, size_t size, const struct endpoint_address
       in.sin6_scope_id = (uint32_t)(b[2] << 8 | b[3]);
       b[2] = b[3] = 0;
     }
-    if (getnameinfo((struct sockaddr *)&in, sizeof in, host, sizeof host, NULL, 0, NI_NUMERICHOST)) strcpy(host, "?");
+    if (getnameinfo((struct sockaddr *)&in, sizeof in, host, sizeof host, NULL, 0, NI_NUMERICHOST))
+      strcpy(host, "?");
     host[49] = '\0';
   }
   if (address->port) {
@@ -164,17 +118,14 @@ static void print_flow(const struct flow *f) {
 }
 
 int main(int argc, char **argv) {
-  FILE *file = argc > 1 ? fopen(argv[1], "rb") : NULL;
-  if (!file) return perror("table"), 1;
-  fseek(file, 0, SEEK_END);
-  const size_t size = (size_t)ftell(file);
-  rewind(file);
-  struct flow *flows = malloc(size);
-  if (!flows || fread(flows, 1, size, file) != size) return perror("read"), 1;
+  size_t size;
+  struct flow *flows = read_table(argc > 1 ? argv[1] : "", "stats/flow", &size);
   const size_t count = size / sizeof *flows;
-  printf("%-5s %-43s %-43s %-12s %-12s %-10s %-10s %-3s %-8s %-4s %-3s %-14s %-12s %-12s %-10s %-10s %-3s %s\n",
-         "Proto", "Local Address", "Remote Address", "InBytes", "OutBytes", "InPackets", "OutPackets", "SvC", "NetIf",
-         "Port", "Adv", "Flags", "Local State", "Remote State", "Local RTT", "Remote RTT", "Bkt", "Process.PID");
+  printf(
+      "%-5s %-43s %-43s %-12s %-12s %-10s %-10s %-3s %-8s %-4s %-3s %-14s %-12s %-12s %-10s %-10s %-3s %s\n",
+      "Proto", "Local Address", "Remote Address", "InBytes", "OutBytes", "InPackets", "OutPackets", "SvC",
+      "NetIf", "Port", "Adv", "Flags", "Local State", "Remote State", "Local RTT", "Remote RTT", "Bkt",
+      "Process.PID");
   qsort(flows, count, sizeof *flows, by_pid);
   for (size_t i = 0; i < count; i++) print_flow(&flows[i]);
   return fflush(stdout) == 0 ? 0 : 1;
