@@ -364,7 +364,7 @@ consteval bool accepts() {
       return std::same_as<T, char>;
     case 'f':
     case 'g':
-      return std::floating_point<T> && !P.zero;
+      return std::floating_point<T> && !P.zero && (P.precision == no_precision || P.precision <= 6);
     default:
       return !std::is_arithmetic_v<T> && !P.zero;
   }
