@@ -121,6 +121,7 @@ int main(int argc, char **argv) {
   size_t size;
   struct flow *flows = read_table(argc > 1 ? argv[1] : "", "stats/flow", &size);
   const size_t count = size / sizeof *flows;
+  if (!count) return 0;
   printf(
       "%-5s %-43s %-43s %-12s %-12s %-10s %-10s %-3s %-8s %-4s %-3s %-14s %-12s %-12s %-10s %-10s %-3s %s\n",
       "Proto", "Local Address", "Remote Address", "InBytes", "OutBytes", "InPackets", "OutPackets", "SvC",
