@@ -11,7 +11,7 @@
 #include "common/flow_naming.h"
 #include "common/mib.h"
 #include "common/output.h"
-#include "common/output_helpers.h"
+#include "common/process_names.h"
 #include "common/provider.h"
 
 namespace {
@@ -24,7 +24,7 @@ indent_text indent_of(unsigned level) {
   return deepest.substr(0, std::min<std::size_t>(3 * level, deepest.size()));
 }
 
-void print_provider_payload(const object_node &node, indent_text indent) {
+void print_provider_payload(const object_node &node, indent_text indent, process_names & /*owners*/) {
   const auto p = node.record<nexus_provider_parameters>();
   print<"%s\"name\":\"%s\",\n">(indent, p.shown_name());
   print<"%s\"provider_type\":\"%s\",\n">(indent, provider_type_name(p.type, p.subtype));
@@ -42,12 +42,11 @@ void print_provider_payload(const object_node &node, indent_text indent) {
   print<"%s\"ifindex\":%d,\n">(indent, p.ifindex);
 }
 
-void print_channel_payload(const object_node &node, indent_text indent) {
+void print_channel_payload(const object_node &node, indent_text indent, process_names &owners) {
   const auto channel = node.record<channel_entry>();
-  char name[32];
   print<"%s\"flags\":%d,\n">(indent, static_cast<int>(channel.flags));
   print<"%s\"pid\":%d,\n">(indent, channel.pid);
-  print<"%s\"proc_name\":\"%s\",\n">(indent, pid_to_name(channel.pid, name, sizeof name, false));
+  print<"%s\"proc_name\":\"%s\",\n">(indent, owners.of(channel.pid));
   print<"%s\"fd\":%d,\n">(indent, channel.fd);
   print<"%s\"port\":%d,\n">(indent, static_cast<int>(channel.port));
   print<"%s\"n_tx_rings\":%d,\n">(indent, static_cast<int>(channel.n_tx_rings));
@@ -72,7 +71,7 @@ void print_endpoints(const tv_stats_flow &flow, indent_text indent) {
   }
 }
 
-void print_flow_payload(const object_node &node, indent_text indent) {
+void print_flow_payload(const object_node &node, indent_text indent, process_names & /*owners*/) {
   const auto flow = node.record<tv_stats_flow>();
   const tv_flow_endpoint_stats &in = flow.sf_rstats;
   const tv_flow_endpoint_stats &out = flow.sf_lstats;
@@ -93,7 +92,7 @@ void print_flow_payload(const object_node &node, indent_text indent) {
 // What the types differ in, by object_type.
 constexpr struct {
   const char *name;
-  void (*print_payload)(const object_node &node, indent_text indent);
+  void (*print_payload)(const object_node &node, indent_text indent, process_names &owners);
 } node_ops[] = {
     {"root", nullptr},
     {"nexus_provider", print_provider_payload},
@@ -103,12 +102,12 @@ constexpr struct {
 };
 
 // Everything of a node before its children.
-void open_node(const object_node &node, indent_text indent) {
+void open_node(const object_node &node, indent_text indent, process_names &owners) {
   print<"%s{\n">(indent);
   print<"%s\"uuid\":\"%s\",\n">(indent, node.uuid);
   print<"%s\"type\":\"%s\",\n">(indent, object_type_name(node.type));
   const auto &ops = node_ops[static_cast<std::size_t>(node.type)];
-  if (ops.print_payload) ops.print_payload(node, indent);
+  if (ops.print_payload) ops.print_payload(node, indent, owners);
   if (node.has_children()) {
     print<"%s\"children\": [\n">(indent);
   } else {
@@ -124,11 +123,12 @@ const char *object_type_name(object_type type) {
 }
 
 void object_tree::dump_object(object_id top) const {
+  process_names owners(false);
   object_id id = top;
   unsigned level = 0;
   for (;;) {
     read_ahead(id);
-    open_node((*this)[id], indent_of(level));
+    open_node((*this)[id], indent_of(level), owners);
     if ((*this)[id].has_children()) {
       id = (*this)[id].first_child;
       ++level;

@@ -11,6 +11,7 @@
 #include "common/channel_snapshot.h"
 #include "common/output.h"
 #include "common/output_helpers.h"
+#include "common/process_names.h"
 #include "platform/sysctl.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/ring_stats.h"
@@ -41,10 +42,8 @@ int ring_stat_enabled(bool &enabled) {
   return 0;
 }
 
-void print_port(const channel_entry &channel) {
-  char name[256];
-  print<"\tPort[%2u] %-22s (fd %d)\t">(channel.port, pid_to_name(channel.pid, name, sizeof name, true),
-                                       channel.fd);
+void print_port(const channel_entry &channel, process_names &owners) {
+  print<"\tPort[%2u] %-22s (fd %d)\t">(channel.port, owners.of(channel.pid), channel.fd);
   if (channel.flags) print_flags(" flags", channel.flags, channel_flag_names);
   print<"\n">();
 }
@@ -67,6 +66,7 @@ void channel_list_print(const channel_snapshot &current, const channel_snapshot 
     return;
   }
   print<"Instances: %d\n">(static_cast<int>(current.nexus_count()));
+  process_names owners(true);
   unsigned nexus_number = 0;
   const std::byte *group = nullptr;
   bool header_is_printed = false;
@@ -77,7 +77,7 @@ void channel_list_print(const channel_snapshot &current, const channel_snapshot 
     }
     if (!ref.entry) continue;
     const channel_entry channel = ref.channel();
-    print_port(channel);
+    print_port(channel, owners);
     bool collected = false;
     if (ring_stat_enabled(collected) != 0 || !collected) continue;
 

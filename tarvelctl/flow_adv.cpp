@@ -5,6 +5,7 @@
 #include "common/kernel_table.h"
 #include "common/output.h"
 #include "common/output_helpers.h"
+#include "common/process_names.h"
 #include "common/record_walk.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
@@ -17,9 +18,9 @@ constexpr char advisory_flag_names[] =
     "\1VALID"
     "\2CONTROLLED";
 
-void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk entries) {
-  char name[256];
-  print<" - %s\n">(pid_to_name(advisories.sfa_pid, name, sizeof name, true));
+void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk entries,
+                               process_names &processes) {
+  print<" - %s\n">(processes.of(advisories.sfa_pid));
   print<"\tNexus UUID: %s\n">(advisories.sfa_nx_uuid);
   print<"\tNetif     : %s\n">(advisories.sfa_if_name);
   print<"\tFlowAdvIdx               Flow UUID                 Flags\n">();
@@ -38,12 +39,13 @@ void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk 
 int list_flow_advisories() {
   kernel_table table;
   if (const int error = table.fetch(flow_adv_node)) return error;
+  process_names processes(true);
   record_walk walk(table.bytes());
   tv_stats_flow_adv advisories;
   std::span<const std::byte> entries;
   while (walk.take(advisories, entries)) {
     if (!netstat_options.selects(advisories.sfa_nx_uuid, advisories.sfa_pid)) continue;
-    __tv_stats_flow_adv_print(advisories, record_walk(entries));
+    __tv_stats_flow_adv_print(advisories, record_walk(entries), processes);
   }
   require(walk.at_end(), {"cmd_flow_adv", "tarvelctl/tarvelctl", 766, "scan == (buffer + length)"});
   return 0;

@@ -7,6 +7,7 @@
 #include "common/kernel_table.h"
 #include "common/output.h"
 #include "common/output_helpers.h"
+#include "common/process_names.h"
 #include "common/record_walk.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/region_set.h"
@@ -112,13 +113,12 @@ void print_arena_total(const memory_size &memory) {
   print<"\n">();
 }
 
-void print_arena(const tv_stats_arena &arena) {
+void print_arena(const tv_stats_arena &arena, process_names &processes) {
   print_separator('=');
   print<"%15s  %s\n">(format::text_of<"%.12s arena:", 64>(type_name(arena_types, arena.type)), arena.name);
   for (const std::int32_t pid : arena.pids) {
     if (pid == 0) break;
-    char name[256];
-    print<"%15s  %s\n">("", pid_to_name(pid, name, sizeof name, true));
+    print<"%15s  %s\n">("", processes.of(pid));
   }
   print_separator('=');
   memory_size memory;
@@ -159,8 +159,9 @@ void __tv_region_set_print_summary() {
 void __memory_arena_stats() {
   kernel_table table;
   if (table.fetch(arena_node) != 0 || table.empty()) return;
+  process_names processes(true);
   record_walk walk(table.bytes());
-  for (tv_stats_arena arena; walk.take(arena);) print_arena(arena);
+  for (tv_stats_arena arena; walk.take(arena);) print_arena(arena, processes);
   __tv_region_set_print_summary();
   require(walk.at_end(), {"__memory_arena_stats", "tarvelctl/tarvelctl", 1620, "scan == (buffer + length)"});
 }

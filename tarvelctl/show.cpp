@@ -9,6 +9,7 @@
 #include "common/mib.h"
 #include "common/output.h"
 #include "common/output_helpers.h"
+#include "common/process_names.h"
 #include "common/provider.h"
 #include "tarvelctl/command.h"
 
@@ -45,23 +46,21 @@ void print_flow(const object_node &node) {
   }
 }
 
-void print_port(const object_tree &tree, const object_node &node) {
+void print_port(const object_tree &tree, const object_node &node, process_names &owners) {
   const auto channel = node.record<channel_entry>();
   if (channel.port < first_client_port) return;
-  char name[256];
-  const foreign_text owner = pid_to_name(channel.pid, name, sizeof name, true);
   const char *status = channel.flags & channel.defunct ? highlight("defunct", colour::red) : "";
-  print<"\tPort[%2u] %-22s%s\n">(channel.port, owner, status);
+  print<"\tPort[%2u] %-22s%s\n">(channel.port, owners.of(channel.pid), status);
   for_each_child(tree, node, object_type::flow, print_flow);
 }
 
-void print_flow_switches(const object_tree &tree, const object_node &provider) {
+void print_flow_switches(const object_tree &tree, const object_node &provider, process_names &owners) {
   const auto parameters = provider.record<nexus_provider_parameters>();
   if (parameters.subtype != flow_switch_subtype::multistack) return;
   for_each_child(tree, provider, object_type::nexus, [&](const object_node &nexus) {
     print<"flow-switch %s %s\n">(nexus.uuid, parameters.name);
     for_each_child(tree, nexus, object_type::channel,
-                   [&](const object_node &channel) { print_port(tree, channel); });
+                   [&](const object_node &channel) { print_port(tree, channel, owners); });
   });
 }
 
@@ -70,7 +69,8 @@ void print_flow_switches(const object_tree &tree, const object_node &provider) {
 int cmd_show(int /*argc*/, char ** /*argv*/) {
   object_tree tree;
   if (tree.scrape_tree() != 0) return 0;
+  process_names owners(true);
   for_each_child(tree, tree[object_tree::root], object_type::nexus_provider,
-                 [&](const object_node &provider) { print_flow_switches(tree, provider); });
+                 [&](const object_node &provider) { print_flow_switches(tree, provider, owners); });
   return 0;
 }

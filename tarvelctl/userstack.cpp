@@ -4,7 +4,7 @@
 #include "common/invariant.h"
 #include "common/kernel_table.h"
 #include "common/output.h"
-#include "common/output_helpers.h"
+#include "common/process_names.h"
 #include "common/record_walk.h"
 #include "tarvelctl/counter_lines.h"
 #include "tarvelctl/netstat_options.h"
@@ -33,12 +33,11 @@ constexpr protocol protocols[] = {
     {"udp", &netstat_settings::proto_udp, udp_counter_names, block<&tv_stats_userstack::udp>},
 };
 
-void print_header(const tv_stats_userstack &stack) {
+void print_header(const tv_stats_userstack &stack, process_names &processes) {
   if (stack.pid == 0) {
     print<" - <Closed Port Stats>\n">();
   } else {
-    char name[256];
-    print<" - %s\n">(pid_to_name(stack.pid, name, sizeof name, true));
+    print<" - %s\n">(processes.of(stack.pid));
   }
   print<"\tNexus UUID: %s\n">(stack.nx_uuid);
   print<"\tNetif     : %s\n">(stack.if_name);
@@ -52,8 +51,8 @@ void print_sections(tv_stats_userstack &stack) {
   }
 }
 
-void __tv_stats_userstack_print(tv_stats_userstack &stack) {
-  print_header(stack);
+void __tv_stats_userstack_print(tv_stats_userstack &stack, process_names &processes) {
+  print_header(stack, processes);
   print_sections(stack);
 }
 
@@ -64,12 +63,13 @@ int cmd_userstack() {
   if (const int error = table.fetch(userstack_node)) return error;
   if (table.empty()) return 0;
 
+  process_names processes(true);
   tv_stats_userstack total{};
   record_walk walk(table.bytes());
   for (tv_stats_userstack stack; walk.take(stack);) {
     if (!netstat_options.selects(stack.nx_uuid, stack.pid)) continue;
     if (!netstat_options.global) {
-      __tv_stats_userstack_print(stack);
+      __tv_stats_userstack_print(stack, processes);
       continue;
     }
     for (const protocol &each : protocols) add_counters(each.counters(total), each.counters(stack));

@@ -55,9 +55,15 @@ extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_
     *old_length = file.stated_size();
     return 0;
   }
-  const long got = file.read(old_value, *old_length);
+  // A stated size is the snapshot's. Without one, the data ends where a read finds nothing more.
+  const std::size_t size = file.stated_size() ? file.stated_size() : *old_length;
+  if (size > *old_length) {
+    errno = ENOMEM;
+    return -1;
+  }
+  const long got = file.read(old_value, size);
   if (got < 0) return -1;
-  if (static_cast<std::size_t>(got) == *old_length) {
+  if (!file.stated_size() && static_cast<std::size_t>(got) == *old_length) {
     char beyond;
     const long more = file.read(&beyond, 1);
     if (more < 0) return -1;
