@@ -3,8 +3,8 @@
 #include <arpa/inet.h>
 
 #include <algorithm>
+#include <cstring>
 #include <iterator>
-#include <string_view>
 
 #include "common/channel.h"
 #include "common/flow.h"
@@ -16,15 +16,17 @@
 
 namespace {
 
-using indent_text = std::string_view;
+using indent_text = format::small_text<32>;
 
 // Three blanks a level, down to level 7; what lies deeper is indented as that.
 indent_text indent_of(unsigned level) {
-  constexpr indent_text deepest = "                     ";
-  return deepest.substr(0, std::min<std::size_t>(3 * level, deepest.size()));
+  indent_text blanks;
+  blanks.size = 3 * std::min(level, 7U);
+  std::memset(blanks.chars, ' ', sizeof blanks.chars);
+  return blanks;
 }
 
-void print_provider_payload(const object_node &node, indent_text indent, process_names & /*owners*/) {
+void print_provider_payload(const object_node &node, const indent_text &indent, process_names & /*owners*/) {
   const auto p = node.record<nexus_provider_parameters>();
   print<"%s\"name\":\"%s\",\n">(indent, p.shown_name());
   print<"%s\"provider_type\":\"%s\",\n">(indent, provider_type_name(p.type, p.subtype));
@@ -42,7 +44,7 @@ void print_provider_payload(const object_node &node, indent_text indent, process
   print<"%s\"ifindex\":%d,\n">(indent, p.ifindex);
 }
 
-void print_channel_payload(const object_node &node, indent_text indent, process_names &owners) {
+void print_channel_payload(const object_node &node, const indent_text &indent, process_names &owners) {
   const auto channel = node.record<channel_entry>();
   print<"%s\"flags\":%d,\n">(indent, static_cast<int>(channel.flags));
   print<"%s\"pid\":%d,\n">(indent, channel.pid);
@@ -54,12 +56,12 @@ void print_channel_payload(const object_node &node, indent_text indent, process_
 }
 
 template <class Address>
-void print_endpoint(indent_text indent, const char *side, const Address &address, std::uint16_t port) {
+void print_endpoint(const indent_text &indent, const char *side, const Address &address, std::uint16_t port) {
   print<"%s\"%s_addr\":\"%s\",\n">(indent, side, address_text(address));
   print<"%s\"%s_port\":%d,\n">(indent, side, static_cast<int>(ntohs(port)));
 }
 
-void print_endpoints(const tv_stats_flow &flow, indent_text indent) {
+void print_endpoints(const tv_stats_flow &flow, const indent_text &indent) {
   const socket_address &local = flow.sf_local;
   const socket_address &remote = flow.sf_remote;
   if (local.family == address_family::ipv6) {
@@ -71,7 +73,7 @@ void print_endpoints(const tv_stats_flow &flow, indent_text indent) {
   }
 }
 
-void print_flow_payload(const object_node &node, indent_text indent, process_names & /*owners*/) {
+void print_flow_payload(const object_node &node, const indent_text &indent, process_names & /*owners*/) {
   const auto flow = node.record<tv_stats_flow>();
   const tv_flow_endpoint_stats &in = flow.sf_rstats;
   const tv_flow_endpoint_stats &out = flow.sf_lstats;
@@ -92,7 +94,7 @@ void print_flow_payload(const object_node &node, indent_text indent, process_nam
 // What the types differ in, by object_type.
 constexpr struct {
   const char *name;
-  void (*print_payload)(const object_node &node, indent_text indent, process_names &owners);
+  void (*print_payload)(const object_node &node, const indent_text &indent, process_names &owners);
 } node_ops[] = {
     {"root", nullptr},
     {"nexus_provider", print_provider_payload},
@@ -102,7 +104,7 @@ constexpr struct {
 };
 
 // Everything of a node before its children.
-void open_node(const object_node &node, indent_text indent, process_names &owners) {
+void open_node(const object_node &node, const indent_text &indent, process_names &owners) {
   print<"%s{\n">(indent);
   print<"%s\"uuid\":\"%s\",\n">(indent, node.uuid);
   print<"%s\"type\":\"%s\",\n">(indent, object_type_name(node.type));
