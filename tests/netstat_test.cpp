@@ -2,17 +2,14 @@
 
 #include <gtest/gtest.h>
 
+#include <map>
 #include <sstream>
 
-#include "tests/support/bytes.h"
-#include "tests/support/kernel_dir.h"
-#include "tests/support/run.h"
+#include "tests/support/records.h"
 
 namespace {
 
-constexpr char nexus[] = "FEDCBA98-7654-3210-0123-456789ABCDEF";
 constexpr char other_nexus[] = "00112233-4455-6677-8899-AABBCCDDEEFF";
-constexpr char no_nexus[] = "00000000-0000-0000-0000-000000000000";
 const std::string prefix = "kern.tarvel.stats.";
 constexpr std::uint64_t most = 0xFFFFFFFFFFFFFFFF;
 
@@ -33,12 +30,12 @@ const std::string usage_text =
     "\t--show-zeros    print out zero fields in statistics\n";
 
 // What stands around the counters is not for us.
-bytes stack(std::int32_t pid, const char *uuid = nexus) {
+bytes stack(std::int32_t pid, const char *uuid = mixed_uuid) {
   bytes record = bytes(2496).uuid(0, uuid).text(16, "en0").u32(32, static_cast<std::uint32_t>(pid));
   return record.text(36, std::string(12, '\xEE')).u64(392, most).u64(2312, most);
 }
 
-std::string stack_heading(const std::string &process, const std::string &uuid = nexus) {
+std::string stack_heading(const std::string &process, const std::string &uuid = mixed_uuid) {
   return " - " + process + "\n\tNexus UUID: " + uuid + "\n\tNetif     : en0\n";
 }
 
@@ -46,9 +43,7 @@ const std::string titles = "\tip:\n\tip6:\n\ttcp:\n\tudp:\n";
 const std::string closed_stack = stack_heading("<Closed Port Stats>") + titles;
 
 run_result run(const std::string &table, const std::string &contents, const words &line) {
-  kernel_dir kernel;
-  kernel.table(prefix + table, contents).process(42, "curl\n");
-  return run_tarvelctl(kernel, line);
+  return run_on(prefix + table, contents, line);
 }
 run_result stacks(const std::string &contents, const words &line) {
   return run("userstack", contents, line);
@@ -64,15 +59,12 @@ TEST(netstat, WithoutAReportPrintsItsUsage) {
 
 TEST(netstat, WrongOptionsAreReportedAndSkipped) {
   const std::pair<const char *, std::string> cases[] = {
-      {"netstat -xn", "netstat: invalid option -- 'x'\n"},
       {"netstat -w1", "netstat: invalid option -- 'w'\nnetstat: invalid option -- '1'\n"},
-      {"netstat --nope", "netstat: unrecognized option '--nope'\n"},
       {"netstat -p", "netstat: option requires an argument -- 'p'\n"},
       {"netstat --pid", "netstat: option '--pid' requires an argument\n"},
       {"netstat --netif=1", "netstat: option '--netif' doesn't allow an argument\n"}};
   for (const auto &[line, diagnostic] : cases)
     EXPECT_EQ(stacks("", line), complained(diagnostic + usage_text));
-  EXPECT_EQ(stacks(stack(0), "netstat -xs"), complained("netstat: invalid option -- 'x'\n", 0, closed_stack));
 }
 
 TEST(netstat, WrongValuesStopItBeforeAnyReport) {
@@ -80,69 +72,60 @@ TEST(netstat, WrongValuesStopItBeforeAnyReport) {
     EXPECT_EQ(stacks(stack(0), {"netstat", "-s", "-p", "tcp", "-p", name, "-x"}),
               complained("Unsupported protocol \"" + name + "\"\n"));
   }
-  const std::string id = nexus;
+  const std::string id = mixed_uuid;
   for (const std::string &text : {id + "0", id.substr(1), std::string("G").append(id, 1), std::string()}) {
     EXPECT_EQ(stacks(stack(0), {"netstat", "-s", "--uuid", text, "-x"}), complained("Bad UUID\n")) << text;
   }
   EXPECT_EQ(hide_times(stacks(stack(0), "netstat -s -p icmp -w 60").out), "\n<time>\n");
 }
 
-// A kernel with one short record in each table, and the reports about it.
+// A kernel with one record in each table, and what the reports say about them, by letter.
 struct short_reports {
   short_reports() {
     const std::pair<const char *, std::string> tables[] = {
-        {"flow", bytes(320)},    {"userstack", stack(0)},    {"net_if", bytes(320)},
+        {"flow", flow()},        {"userstack", stack(0)},    {"net_if", bytes(320)},
         {"flow_adv", bytes(40)}, {"flow_owner", bytes(128)}, {"flow_switch", bytes(448)}};
     for (const auto &[name, contents] : tables) kernel.table(prefix + name, contents);
   }
   std::string operator()(const std::string &letters) const {
-    const std::string unnamed = std::string(" -          ") + no_nexus + "\n";
+    const std::string unnamed = std::string(" -          ") + null_uuid + "\n";
+    const std::map<char, std::string> reports = {
+        {'f', run_tarvelctl(kernel, "flow").out},
+        {'s', closed_stack},
+        {'i', "netif:\n" + unnamed},
+        {'a', std::string(" - <unknown>.0\n\tNexus UUID: ") + null_uuid +
+                  "\n\tNetif     : \n\tFlowAdvIdx               Flow UUID                 Flags\n"},
+        {'o',
+         "NetIf     Port   Property              Bkt  Process\n"
+         "          0                            0    (0)\n"},
+        {'w', "flowswitch:\n" + unnamed}};
     std::string all;
-    for (const char letter : letters) {
-      if (letter == 'f') all += run_tarvelctl(kernel, "flow").out;
-      if (letter == 's') all += closed_stack;
-      if (letter == 'i') all += "netif:\n" + unnamed;
-      if (letter == 'a') {
-        all += std::string(" - <unknown>.0\n\tNexus UUID: ") + no_nexus + "\n\tNetif     : \n" +
-               "\tFlowAdvIdx               Flow UUID                 Flags\n";
-      }
-      if (letter == 'o') {
-        all +=
-            "NetIf     Port   Property              Bkt  Process\n"
-            "          0                            0    (0)\n";
-      }
-      if (letter == 'w') all += "flowswitch:\n" + unnamed;
-    }
+    for (const char letter : letters) all += reports.at(letter);
     return all;
   }
   kernel_dir kernel;
 };
 
-TEST(netstat, ReportsRunOnceInAFixedOrder) {
+TEST(netstat, ReportsRunOnceInAFixedOrderWhateverFails) {
   const short_reports reports;
-  const std::pair<const char *, std::vector<std::string>> cases[] = {
-      {"f", {"-a", "--flow", "-an"}},
-      {"s", {"-s", "--protocol", "--pro"}},
-      {"i", {"--netif", "-n --net --wait 9"}},
-      {"a", {"--flow-adv", "--flow-a"}},
-      {"o", {"--flow-owner", "--flow-o"}},
-      {"w", {"--flowswitch", "--flows"}},
-      {"fs", {"-as", "-sna"}},
-      {"fi", {"x -a y --netif -- -s"}},
-      {"fsiaow", {"--flowswitch --flow-owner --flow-adv --netif -s -a --flow -s"}}};
-  for (const auto &[expected, lines] : cases) {
-    for (const std::string &options : lines) {
-      EXPECT_EQ(run_tarvelctl(reports.kernel, "netstat " + options), printed(reports(expected))) << options;
-    }
+  const std::pair<const char *, const char *> cases[] = {
+      {"f", "-an"},
+      {"f", "--flow"},
+      {"s", "--pro"},
+      {"i", "-n --net --wait 9"},
+      {"a", "--flow-adv"},
+      {"o", "--flow-o"},
+      {"w", "--flowswitch"},
+      {"fs", "-sna"},
+      {"fi", "x -a y --netif -- -s"},
+      {"fsiaow", "--flowswitch --flow-owner --flow-adv --netif -s -a --flow -s"}};
+  for (const auto &[expected, options] : cases) {
+    EXPECT_EQ(run_tarvelctl(reports.kernel, std::string("netstat ") + options), printed(reports(expected)))
+        << options;
   }
-}
-
-TEST(netstat, FailingReportsDoNotStopTheLaterOnes) {
-  const short_reports reports;
   for (const char *name : {"flow", "net_if"}) remove(reports.kernel.table_path(prefix + name));
-  const std::string failure = "sysctl for len failed, No such file or directory\n";
   EXPECT_EQ(run_tarvelctl(reports.kernel, "netstat -as --netif --flow-adv --flow-owner --flowswitch"),
-            complained(failure + failure, 0, reports("saow")));
+            complained(missing + missing, 0, reports("saow")));
 }
 
 // Counters
@@ -197,27 +180,25 @@ TEST(netstat_stacks, CountersAreNamedByPosition) {
   }
 }
 
-TEST(netstat_stacks, SectionsAreChosenByProtocol) {
+TEST(netstat_stacks, AreChosenByProtocolProcessAndNexus) {
   const std::pair<const char *, const char *> cases[] = {
       {"netstat -sptcp", "\ttcp:\n"},
       {"netstat --per-protocol udp -p ip -s", "\tip:\n\tudp:\n"},
       {"netstat -s --pe=ip6 -p ip6", "\tip6:\n"}};
-  for (const auto &[line, expected] : cases) {
+  for (const auto &[line, expected] : cases)
     EXPECT_EQ(stacks(stack(43), line), printed(stack_heading("<unknown>.43") + expected)) << line;
-  }
-}
 
-TEST(netstat_stacks, AreFilteredByProcessAndNexus) {
   const std::string table = stack(0) + stack(42) + stack(-1) + stack(42, other_nexus);
   const std::string first = stack_heading("curl.42") + titles;
   const std::string last = stack_heading("curl.42", other_nexus) + titles;
-  const std::pair<std::string, std::string> cases[] = {{"--pid abc", closed_stack},
-                                                       {"--pid 42", first + last},
-                                                       {"--pid -1", stack_heading("<unknown>.-1") + titles},
-                                                       {"--pid 43", ""},
-                                                       {"--uuid 00112233-4455-6677-8899-aabbccddeeff", last},
-                                                       {std::string("--pid 42 --uuid ") + nexus, first}};
-  for (const auto &[options, expected] : cases)
+  const std::pair<std::string, std::string> filters[] = {
+      {"--pid abc", closed_stack},
+      {"--pid 42", first + last},
+      {"--pid -1", stack_heading("<unknown>.-1") + titles},
+      {"--pid 43", ""},
+      {"--uuid 00112233-4455-6677-8899-aabbccddeeff", last},
+      {std::string("--pid 42 --uuid ") + mixed_uuid, first}};
+  for (const auto &[options, expected] : filters)
     EXPECT_EQ(stacks(table, "netstat -s " + options), printed(expected));
 }
 
@@ -237,7 +218,6 @@ TEST(netstat_stacks, FiltersSelectWhatIsFolded) {
   EXPECT_EQ(stacks(table, fold + " --pid 42"), total(3, 5, 0, 2));
   EXPECT_EQ(stacks(table, by_nexus), total(2, 5, 0, 0));
   EXPECT_EQ(stacks(table, by_nexus + " --pid 43"), printed(titles));
-  EXPECT_EQ(stacks("", fold), printed(""));
 }
 
 TEST(netstat_stacks, PartialRecordsFailBehindTheReport) {
@@ -258,7 +238,7 @@ struct nexus_report {
   std::size_t size, end;  // of the record and of its counters
   const char *names, *first, *last;
 
-  bytes record(std::string_view name, const char *uuid = nexus) const {
+  bytes record(std::string_view name, const char *uuid = mixed_uuid) const {
     return bytes(size).uuid(0, uuid).text(16, name);
   }
 };
@@ -290,7 +270,7 @@ TEST(nexus_counters, AreSortedByName) {
     }
     for (const char *name :
          {"0123456789abcdef", "EN0     ", "bridge10", "en      ", "en0     ", "en1     ", "\xc3\xa9      "}) {
-      report += std::string(" - ") + name + " " + nexus + "\n" + counter_line(the.first, most);
+      report += std::string(" - ") + name + " " + mixed_uuid + "\n" + counter_line(the.first, most);
     }
     EXPECT_EQ(run(the.table, table, the.command), printed(report));
   }
@@ -303,11 +283,12 @@ TEST(nexus_counters, AreFilteredByNexusOrAllFolded) {
     const auto report = [&the](const std::string &heading, std::uint64_t first, std::uint64_t last) {
       return printed(the.title + heading + counter_line(the.first, first) + counter_line(the.last, last));
     };
-    const std::string by_nexus = the.option + " --pid 7 --uuid " + nexus;
+    const std::string by_nexus = the.option + " --pid 7 --uuid " + mixed_uuid;
     EXPECT_EQ(run(the.table, table, the.option + " --global"), report("", 2, 5));
     EXPECT_EQ(run(the.table, table, by_nexus + " --global"), report("", 2, 5));
-    EXPECT_EQ(run(the.table, table, by_nexus), report(std::string(" - en0      ") + nexus + "\n", most, 1));
-    EXPECT_EQ(run(the.table, table, the.option + " --uuid " + no_nexus), printed(the.title));
+    EXPECT_EQ(run(the.table, table, by_nexus),
+              report(std::string(" - en0      ") + mixed_uuid + "\n", most, 1));
+    EXPECT_EQ(run(the.table, table, the.option + " --uuid " + null_uuid), printed(the.title));
   }
 }
 
@@ -317,9 +298,6 @@ TEST(nexus_counters, OddTableLengthsFailBeforeAnything) {
     for (const std::size_t length : {std::size_t{1}, the.size - 1, the.size + 1}) {
       EXPECT_EQ(run(the.table, table.substr(0, length), the.command), the.failure) << length;
     }
-    EXPECT_EQ(run(the.table, "", the.command), printed(""));
-    EXPECT_EQ(run_tarvelctl(kernel_dir(), the.command),
-              complained("sysctl for len failed, No such file or directory\n"));
   }
 }
 

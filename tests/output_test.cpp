@@ -1,4 +1,5 @@
-// The buffered output: whole rows, whatever their length and whoever reads them.
+// The buffered output: whole rows, whatever their length and whoever reads them; and what commands print
+// with.
 
 #include "common/output.h"
 
@@ -8,9 +9,23 @@
 
 #include <thread>
 
+#include "common/output_helpers.h"
 #include "tests/support/capture.h"
+#include "tests/support/kernel_dir.h"
 
 namespace {
+
+// Lets an output write to a terminal that nobody looks at.
+struct terminal {
+  explicit terminal(output &to) {
+    if (openpty(&reader, &program, nullptr, nullptr, nullptr) == 0) to.attach(program);
+  }
+  ~terminal() {
+    close(program);
+    close(reader);
+  }
+  int reader = -1, program = -1;
+};
 
 class output_test : public testing::Test {
  protected:
@@ -18,20 +33,14 @@ class output_test : public testing::Test {
   output out{storage, output::failure::fatal};
 };
 
-TEST_F(output_test, RowsArriveInOrder) {
+TEST_F(output_test, RowsOfAllLengthsArriveWhole) {
   capture captured(out);
+  const std::string part(1000, 'x'), huge(300'000, 'y');
   std::string expected;
   for (int i = 0; i < 20'000; ++i) {
     format::print_to<"row %d\n">(out, i);
     expected += "row " + std::to_string(i) + "\n";
   }
-  EXPECT_EQ(captured.text(), expected);
-}
-
-TEST_F(output_test, RowsLongerThanTheBufferArriveWhole) {
-  capture captured(out);
-  const std::string part(1000, 'x');
-  std::string expected;
   for (int row = 0; row < 5; ++row) {
     for (int i = 0; i < 100 * row; ++i) {
       format::print_to<"%s">(out, part);
@@ -40,7 +49,6 @@ TEST_F(output_test, RowsLongerThanTheBufferArriveWhole) {
     format::print_to<"\n">(out);
     expected += "\n";
   }
-  const std::string huge(300'000, 'y');
   format::print_to<"%s\n">(out, huge);
   EXPECT_EQ(captured.text(), expected + huge + "\n");
 }
@@ -83,48 +91,38 @@ TEST_F(output_test, PipeReaderNeverMeetsATornRow) {
   EXPECT_EQ(received, expected);
 }
 
-TEST_F(output_test, AbandonedOutputEndsWithItsLastWholeLine) {
-  capture captured(out);
-  format::print_to<"one\n">(out);
-  format::print_to<"two\n">(out);
-  format::print_to<"thr">(out);
-  EXPECT_EQ(out.abandon(), 0);
-  EXPECT_EQ(captured.written(), "one\ntwo\n");
-  EXPECT_EQ(out.abandon(), 0);
-  EXPECT_EQ(captured.written(), "one\ntwo\n");
-}
-
-TEST_F(output_test, AbandonedOutputSaysWhyItCouldNotBeWritten) {
+TEST_F(output_test, AbandonedOutputEndsWithItsLastWholeLineOrSaysWhyNot) {
+  {
+    capture captured(out);
+    format::print_to<"one\n">(out);
+    format::print_to<"two\n">(out);
+    format::print_to<"thr">(out);
+    for (int times = 0; times < 2; ++times) {
+      EXPECT_EQ(out.abandon(), 0);
+      EXPECT_EQ(captured.written(), "one\ntwo\n");
+    }
+  }
   out.attach(open("/dev/full", O_WRONLY | O_CLOEXEC));
   format::print_to<"lost\n">(out);
   EXPECT_EQ(out.abandon(), ENOSPC);
 }
 
 TEST_F(output_test, RedirectionLeavesBehindWhatWasPrintedBefore) {
-  capture captured(out);
+  const terminal before(out);
+  EXPECT_TRUE(out.is_terminal());
   format::print_to<"before\n">(out);
   const int file = memfd_create("file", MFD_CLOEXEC);
   const int reader = dup(file);
-  const std::string before = captured.text();
   out.redirect(file);
+  EXPECT_FALSE(out.is_terminal());
   format::print_to<"after\n">(out);
   out.flush();
-  char buffer[64];
-  const ssize_t size = pread(reader, buffer, sizeof buffer, 0);
+  char text[64] = {}, terminal_text[64] = {};
+  EXPECT_EQ(pread(reader, text, sizeof text, 0), 6);
+  EXPECT_EQ(read(before.reader, terminal_text, sizeof terminal_text), 8);
   close(reader);
-  EXPECT_EQ(before, "before\n");
-  EXPECT_EQ(std::string(buffer, static_cast<std::size_t>(size)), "after\n");
-}
-
-TEST_F(output_test, KnowsATerminal) {
-  {
-    capture captured(out);
-    EXPECT_FALSE(out.is_terminal());
-  }
-  capture_terminal terminal(out);
-  EXPECT_TRUE(out.is_terminal());
-  out.redirect(open("/dev/null", O_WRONLY | O_CLOEXEC));
-  EXPECT_FALSE(out.is_terminal());
+  EXPECT_STREQ(text, "after\n");
+  EXPECT_STREQ(terminal_text, "before\r\n");
 }
 
 TEST(complain, LetsTheReportGoFirst) {
@@ -134,6 +132,97 @@ TEST(complain, LetsTheReportGoFirst) {
   EXPECT_EQ(captured.written(), "");
   complain<"trouble\n">();
   EXPECT_EQ(captured.written(), "row\n");
+}
+
+TEST(print_options_usage, BracketsWhatMayBeLeftOut) {
+  const option options[] = {{"plain", no_argument, nullptr, 'p'},
+                            {"value", required_argument, nullptr, 'v'},
+                            {"maybe", optional_argument, nullptr, 'm'},
+                            {}};
+  const struct {
+    std::uint32_t flags[3];
+    const char *usage;
+  } cases[] = {{{0, 0, 2}, "\t--plain, -p\n\t--value, -v <value>\n\t--maybe, -m [ <maybe> ]\n"},
+               {{1, 3, ~0U}, "\t[--plain, -p ]\n\t[--value, -v <value> ]\n\t[--maybe, -m [ <maybe> ] ]\n"}};
+  for (const auto &[flags, usage] : cases) {
+    capture captured(diagnostics);
+    print_options_usage(options, flags);
+    EXPECT_EQ(captured.text(), usage);
+  }
+}
+
+TEST(print_flags, NamesTheSetBits) {
+  constexpr char region[] = "\20\1NOREDIRECT\2MMAPOK\6NOCACHE\40MIRRORED";
+  const struct {
+    const char *label;
+    std::uint32_t value;
+    const char *bit_names, *shown;
+  } cases[] = {
+      {" flags", 0, region, " flags=0<>"},
+      {"flags", 3, region, "flags=3<NOREDIRECT,MMAPOK>"},
+      {"flags", 0x2BCDEF04, region, "flags=2bcdef04<>"},
+      {"flags", 1, "\20", "flags=1<>"},
+      {nullptr, 0, region, "<>"},
+      {nullptr, 0x80000022, region, "<MMAPOK,NOCACHE,MIRRORED>"},
+      {"mode", 8, "\10\4EIGHT", "mode=10<EIGHT>"},
+      {"mode", 10, "\12\4EIGHT", "mode=a<EIGHT>"},
+      {"f", 7, "\20\3third\1first\2second", "f=7<third,first,second>"},
+  };
+  for (const auto &[label, value, bit_names, shown] : cases) {
+    capture captured(report);
+    print_flags(label, value, bit_names);
+    EXPECT_EQ(captured.text(), shown);
+  }
+}
+
+TEST(highlight, ColoursOnTerminalsOnly) {
+  const char text[] = "defunct";
+  {
+    capture file(report);
+    EXPECT_EQ(highlight(text, colour::red), text);
+  }
+  const terminal attached(report);
+  EXPECT_STREQ(highlight(text, colour::red), "\033[31mdefunct\033[0m");
+  EXPECT_STREQ(highlight(text, colour::cyan), "\033[36mdefunct\033[0m");
+  const std::string long_text(1100, 'x');
+  EXPECT_EQ(highlight(long_text.c_str(), colour::red), "\033[31m" + long_text.substr(0, 1023 - 5));
+}
+
+TEST(pid_to_name_test, GivesNameOrIdCutToTheBuffer) {
+  kernel_dir kernel;
+  kernel.process(25, "configd\n").process(7, "fifteen-letters\n");
+  setenv("TARVEL_ROOT", kernel.root().c_str(), 1);
+  const struct {
+    int pid;
+    std::size_t size;
+    bool with_pid;
+    const char *name;
+  } cases[] = {
+      {25, 32, false, "configd"},
+      {25, 256, true, "configd.25"},
+      {7, 32, false, "fifteen-letters"},
+      {25, 8, false, "configd"},
+      {25, 7, false, "config"},
+      {25, 1, false, ""},
+      {25, 10, true, "configd.2"},
+      {25, 9, true, "configd."},
+      {25, 8, true, "configd"},
+      {25, 7, true, "config"},
+      {26, 32, false, "<unknown>.26"},
+      {26, 32, true, "<unknown>.26"},
+      {0, 32, false, "<unknown>.0"},
+      {-1, 32, true, "<unknown>.-1"},
+      {26, 12, false, "<unknown>.2"},
+      {7, 256, true, "fifteen-letters.7"},
+      {2147483647, 32, false, "<unknown>.2147483647"},
+  };
+  for (const auto &[pid, size, with_pid, name] : cases) {
+    std::string buffer(size + 8, '#');  // of which the last 8 may not be written
+    EXPECT_EQ(pid_to_name(pid, buffer.data(), size, with_pid).text, name) << size;
+    EXPECT_EQ(buffer[std::strlen(name)], '\0');
+    EXPECT_EQ(buffer.substr(size), "########");
+  }
+  unsetenv("TARVEL_ROOT");
 }
 
 }  // namespace

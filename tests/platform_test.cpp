@@ -1,15 +1,14 @@
-// Kernel variables and process names as files.
+// Kernel variables and process names as files; bounds of tables.
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <stdlib.h>
 #include <sys/prctl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <cstring>
+#include <memory>
 
+#include "common/record_walk.h"
 #include "platform/process.h"
 #include "platform/sysctl.h"
 #include "tests/support/kernel_dir.h"
@@ -30,9 +29,9 @@ class platform_test : public testing::Test {
     bool operator==(const answer &) const = default;
   };
 
-  static answer measure(const char *name) {
+  static answer measure(const std::string &name) {
     answer result{0, 12345};
-    if (sysctlbyname(name, nullptr, &result.length, nullptr, 0) != 0) result.error = errno;
+    if (sysctlbyname(name.c_str(), nullptr, &result.length, nullptr, 0) != 0) result.error = errno;
     return result;
   }
 
@@ -46,6 +45,12 @@ class platform_test : public testing::Test {
     return result;
   }
 
+  static std::string process_name(int pid) {
+    char name[platform::process_name_size];
+    std::memset(name, '#', sizeof name);
+    return platform::query_process_name(pid, name) ? name : "(none)";
+  }
+
   kernel_dir kernel;
   std::string data;
 };
@@ -53,66 +58,45 @@ class platform_test : public testing::Test {
 using sysctl_test = platform_test;
 using process_test = platform_test;
 
-TEST_F(sysctl_test, DeliversTheFile) {
+TEST_F(sysctl_test, DeliversTheFileWhereItFits) {
   kernel.table(node, "ten bytes.");
   EXPECT_EQ(measure(node), (answer{0, 10}));
   EXPECT_EQ(read(node, 10), (answer{0, 10}));
   EXPECT_EQ(data, "ten bytes.");
-}
-
-TEST_F(sysctl_test, DeliversLessWhereTheTableShrank) {
-  kernel.table(node, "ten bytes.");
-  EXPECT_EQ(measure(node), (answer{0, 10}));
+  for (const std::size_t size : {0U, 1U, 9U}) EXPECT_EQ(read(node, size).error, ENOMEM) << size;
   kernel.table(node, "short");
   EXPECT_EQ(read(node, 10), (answer{0, 5}));
   EXPECT_EQ(data, "short");
   kernel.table(node, "");
-  EXPECT_EQ(read(node, 10), (answer{0, 0}));
-}
-
-TEST_F(sysctl_test, TableLargerThanTheBufferIsENOMEM) {
-  kernel.table(node, "ten bytes.");
-  for (const std::size_t size : {0U, 1U, 9U}) EXPECT_EQ(read(node, size).error, ENOMEM) << size;
+  EXPECT_EQ(measure(node), (answer{0, 0}));
+  EXPECT_EQ(read(node, 0), (answer{0, 0}));
   kernel.table(node, std::string(100'000, 'x'));
   EXPECT_EQ(read(node, 99'999).error, ENOMEM);
   EXPECT_EQ(read(node, 100'000), (answer{0, 100'000}));
 }
 
-TEST_F(sysctl_test, EmptyTableHasLength0) {
-  kernel.table(node, "");
-  EXPECT_EQ(measure(node), (answer{0, 0}));
-  EXPECT_EQ(read(node, 0), (answer{0, 0}));
-}
-
-TEST_F(sysctl_test, MissingVariableIsENOENT) {
-  EXPECT_EQ(measure(node).error, ENOENT);
-  EXPECT_EQ(read(node, 10).error, ENOENT);
-}
-
 TEST_F(sysctl_test, NamesThatNoVariableHasAreENOENT) {
   kernel.table("a.b", "x");
   write_file(kernel.root() / "proc/secret", "x");
-  for (const std::string &name :
-       {std::string(), std::string("a/b"), std::string("a.b/../../../secret"), std::string("../secret"),
-        std::string(5000, 'x'), "a." + std::string(255, 'b')}) {
-    EXPECT_EQ(measure(name.c_str()).error, ENOENT) << name.substr(0, 40);
+  for (const std::string &name : {std::string(), std::string("a/b"), std::string("a.b/../../../secret"),
+                                  std::string("../secret"), std::string(5000, 'x'), std::string(node)}) {
+    EXPECT_EQ(measure(name).error, ENOENT) << name.substr(0, 40);
   }
+  EXPECT_EQ(read(node, 10).error, ENOENT);
+  const std::string long_name = "kern." + std::string(200, 'x') + ".y";
+  kernel.table(long_name, "found");
+  EXPECT_EQ(measure(long_name), (answer{0, 5}));
 }
 
-TEST_F(sysctl_test, LongNamesAreFound) {
-  const std::string name = "kern." + std::string(200, 'x') + ".y";
-  kernel.table(name, "found");
-  EXPECT_EQ(measure(name.c_str()), (answer{0, 5}));
-}
-
-TEST_F(sysctl_test, GroupOfVariablesIsEISDIR) {
-  kernel.table(node, "x");
+TEST_F(sysctl_test, WhatIsNoReadableFileIsRefused) {
+  kernel.table(node, "x").table("kern.open", "y").table("kern.pipe", "");
   EXPECT_EQ(measure("kern.tarvel.stats").error, EISDIR);
   EXPECT_EQ(read("kern.tarvel", 10).error, EISDIR);
-}
+  remove(kernel.table_path("kern.pipe"));
+  ASSERT_EQ(mkfifo(kernel.table_path("kern.pipe").c_str(), 0666), 0);
+  EXPECT_NE(measure("kern.pipe").error, 0);
+  EXPECT_NE(read("kern.pipe", 10).error, 0);
 
-TEST_F(sysctl_test, VariableThatMayNotBeReadIsEACCES) {
-  kernel.table(node, "x").table("kern.open", "y");
   chmod(kernel.table_path(node).c_str(), 0);
   const bool root = geteuid() == 0;  // who may read everything
   ASSERT_TRUE(!root || seteuid(65534) == 0);
@@ -133,67 +117,84 @@ TEST_F(sysctl_test, NewValueIsEPERM) {
   EXPECT_EQ(contents_of(kernel.table_path(node)), "x");
 }
 
-TEST_F(sysctl_test, PipeInPlaceOfATableIsRefused) {
-  kernel.table(node, "x");
-  remove(kernel.table_path(node));
-  ASSERT_EQ(mkfifo(kernel.table_path(node).c_str(), 0666), 0);
-  EXPECT_NE(measure(node).error, 0);
-  EXPECT_NE(read(node, 10).error, 0);
-}
-
-TEST_F(sysctl_test, FilesThatDoNotStateTheirSizeAreMeasured) {
-  const std::string expected = contents_of("/proc/sys/kernel/ostype");
-  if (expected.empty()) GTEST_SKIP() << "no kernel variables here";
+TEST_F(platform_test, LiveMachineIsSeenOnlyWithoutAnotherRoot) {
+  EXPECT_EQ(measure("kernel.ostype").error, ENOENT);
+  EXPECT_EQ(process_name(getpid()), "(none)");
   unsetenv("TARVEL_ROOT");
+  prctl(PR_SET_NAME, "a tarvel test");
+  EXPECT_EQ(process_name(getpid()), "a tarvel test");
+  const std::string expected = contents_of("/proc/sys/kernel/ostype");  // which does not state its size
+  if (expected.empty()) GTEST_SKIP() << "no kernel variables here";
   EXPECT_EQ(measure("kernel.ostype"), (answer{0, expected.size()}));
   EXPECT_EQ(read("kernel.ostype", expected.size()), (answer{0, expected.size()}));
   EXPECT_EQ(data, expected);
 }
 
-TEST_F(sysctl_test, NothingFallsBackToTheLiveMachine) {
-  EXPECT_EQ(measure("kernel.ostype").error, ENOENT);
-  char name[platform::process_name_size] = "untouched";
-  EXPECT_FALSE(platform::query_process_name(getpid(), name));
-  EXPECT_STREQ(name, "untouched");
-}
-
-std::string process_name(int pid) {
-  char name[platform::process_name_size];
-  std::memset(name, '#', sizeof name);
-  return platform::query_process_name(pid, name) ? name : "(none)";
-}
-
-TEST_F(process_test, NameIsTheTextUpToItsLineEnd) {
-  kernel.process(1, "init\n")
-      .process(2, "no line end")
-      .process(3, " two  words \n")
-      .process(4, "two\nlines\n");
-  EXPECT_EQ(process_name(1), "init");
-  EXPECT_EQ(process_name(2), "no line end");
-  EXPECT_EQ(process_name(3), " two  words ");
-  EXPECT_EQ(process_name(4), "two\nlines");
-}
-
-TEST_F(process_test, NameIsCutAt15Bytes) {
-  kernel.process(1, "exactly-fifteen\n")
-      .process(2, "sixteen-letters!\n")
-      .process(3, std::string(200, 'x') + "\n");
-  kernel.process(4, "exactly-fifteen");
-  EXPECT_EQ(process_name(1), "exactly-fifteen");
-  EXPECT_EQ(process_name(2), "sixteen-letters");
-  EXPECT_EQ(process_name(3), std::string(15, 'x'));
-  EXPECT_EQ(process_name(4), "exactly-fifteen");
-}
-
-TEST_F(process_test, ProcessesWithoutNameAreUnknown) {
+TEST_F(process_test, NameIsTheTextUpToItsLineEndCutAt15Bytes) {
+  const std::pair<std::string, const char *> cases[] = {
+      {"init\n", "init"},
+      {"no line end", "no line end"},
+      {" two  words \n", " two  words "},
+      {"two\nlines\n", "two\nlines"},
+      {"exactly-fifteen\n", "exactly-fifteen"},
+      {"exactly-fifteen", "exactly-fifteen"},
+      {"sixteen-letters!\n", "sixteen-letters"},
+      {std::string(200, 'x') + "\n", "xxxxxxxxxxxxxxx"},
+  };
+  for (const auto &[comm, name] : cases) {
+    kernel.process(1, comm);
+    EXPECT_EQ(process_name(1), name);
+  }
   kernel.process(0, "zero\n").process(-1, "negative\n").process(3, "");
   for (const int pid : {0, -1, -2147483647 - 1, 2, 3}) EXPECT_EQ(process_name(pid), "(none)") << pid;
 }
 
-TEST_F(process_test, LiveProcessIsFound) {
-  unsetenv("TARVEL_ROOT");
-  prctl(PR_SET_NAME, "a tarvel test");
-  EXPECT_EQ(process_name(getpid()), "a tarvel test");
+// Claims what follows it, as kernel records do.
+struct claim {
+  std::uint32_t bytes;
+  std::uint64_t trailing_size() const { return std::uint64_t{bytes} * 16; }
+};
+
+// A table of its own allocation, so that a sanitizer sees its end; it starts at an odd address.
+struct odd_table {
+  odd_table(std::uint32_t claimed, std::size_t size)
+      : block(new std::byte[size + 1]{}), bytes(block.get() + 1, size) {
+    std::memcpy(block.get() + 1, &claimed, std::min(size, sizeof claimed));
+  }
+  std::unique_ptr<std::byte[]> block;
+  std::span<const std::byte> bytes;
+};
+
+TEST(record_walk, TakesARecordAndWhatFollowsIt) {
+  const odd_table table(2, 4 + 32 + 4);
+  record_walk walk(table.bytes);
+  claim record{};
+  std::span<const std::byte> trailing;
+  ASSERT_TRUE(walk.take(record, trailing));
+  EXPECT_EQ(record.bytes, 2U);
+  EXPECT_EQ(trailing.data(), table.bytes.data() + 4);
+  EXPECT_EQ(trailing.size(), 32U);
+  EXPECT_EQ(walk.remaining(), 4U);
+  ASSERT_TRUE(walk.take(record, trailing));
+  EXPECT_TRUE(trailing.empty() && walk.at_end());
+  EXPECT_FALSE(walk.take(record));
+  EXPECT_EQ(record_at<claim>(table.bytes, 0).bytes, 2U);
+  EXPECT_EQ(record_at<claim>(table.bytes, 9).bytes, 0U);
+}
+
+TEST(record_walk, StaysWhereAStepDoesNotFit) {
+  std::vector<std::pair<std::uint32_t, std::size_t>> cases = {
+      {0x0FFFFFFF, 64}, {0x10000000, 64}, {0x10000001, 64}, {0xFFFFFFFF, 64}};
+  for (std::size_t size = 0; size < 4 + 32; ++size) cases.emplace_back(2, size);
+  for (const auto &[count, size] : cases) {
+    const odd_table table(count, size);
+    record_walk walk(table.bytes);
+    claim record{};
+    std::span<const std::byte> trailing;
+    EXPECT_FALSE(walk.take(record, trailing)) << count << " in " << size;
+    EXPECT_EQ(walk.remaining(), size);
+    EXPECT_EQ(walk.at_end(), size == 0);
+  }
 }
 
 }  // namespace

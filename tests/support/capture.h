@@ -22,7 +22,7 @@ class capture {
   capture(const capture &) = delete;
   capture &operator=(const capture &) = delete;
 
-  // All that was written so far.
+  // All that was printed so far.
   std::string text() {
     to_.flush();
     return written();
@@ -38,24 +38,6 @@ class capture {
  private:
   output &to_;
   int fd_;
-};
-
-// Lets an output write to a terminal that nobody looks at.
-class capture_terminal {
- public:
-  explicit capture_terminal(output &to) {
-    if (openpty(&reader_, &terminal_, nullptr, nullptr, nullptr) == 0) to.attach(terminal_);
-  }
-  ~capture_terminal() {
-    close(terminal_);
-    close(reader_);
-  }
-  capture_terminal(const capture_terminal &) = delete;
-  capture_terminal &operator=(const capture_terminal &) = delete;
-
- private:
-  int reader_ = -1;
-  int terminal_ = -1;
 };
 
 #endif

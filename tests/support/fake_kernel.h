@@ -1,11 +1,17 @@
-// A kernel that answers by a script. Linking fake_kernel.cpp puts it in the place of the real sysctlbyname.
+// A kernel that answers by a script, in the place of the real sysctlbyname. One file of a program includes
+// it.
 
 #ifndef TARVELCTL_TESTS_SUPPORT_FAKE_KERNEL_H
 #define TARVELCTL_TESTS_SUPPORT_FAKE_KERNEL_H
 
-#include <cstddef>
+#include <gtest/gtest.h>
+
+#include <cerrno>
+#include <cstring>
 #include <string>
 #include <vector>
+
+#include "platform/sysctl.h"
 
 // One answer: an error, the size of a table, or its data.
 struct kernel_answer {
@@ -31,6 +37,8 @@ struct kernel_call {
   std::size_t length;
   const void *new_value;
   std::size_t new_length;
+
+  bool operator==(const kernel_call &) const = default;
 };
 
 struct fake_kernel {
@@ -38,6 +46,24 @@ struct fake_kernel {
   std::vector<kernel_call> calls;
 };
 
-extern fake_kernel the_kernel;
+inline fake_kernel the_kernel;
+
+extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, const void *new_value,
+                            std::size_t new_length) {
+  const std::size_t turn = the_kernel.calls.size();
+  the_kernel.calls.push_back({name, old_value != nullptr, *old_length, new_value, new_length});
+  EXPECT_LT(turn, the_kernel.script.size());
+  const kernel_answer answer = turn < the_kernel.script.size() ? the_kernel.script[turn] : fails(ENOSYS);
+  if (answer.error) {
+    errno = answer.error;
+    return -1;
+  }
+  if (old_value) {
+    EXPECT_LE(answer.data.size(), *old_length);
+    std::memcpy(old_value, answer.data.data(), answer.data.size());
+  }
+  *old_length = answer.size;
+  return 0;
+}
 
 #endif

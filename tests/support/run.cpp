@@ -9,13 +9,10 @@
 #include <termios.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <cstdlib>
-#include <memory>
 #include <ostream>
+#include <regex>
 #include <sstream>
-#include <system_error>
 #include <utility>
 
 namespace {
@@ -24,57 +21,38 @@ void check(bool done, const char *what) {
   if (!done) throw std::system_error(errno, std::generic_category(), what);
 }
 
-// A descriptor, closed at the end.
-class descriptor {
- public:
-  descriptor() = default;
-  explicit descriptor(int fd) : fd_(fd) {}
-  descriptor(descriptor &&other) noexcept : fd_(std::exchange(other.fd_, -1)) {}
-  descriptor &operator=(descriptor &&other) noexcept {
-    std::swap(fd_, other.fd_);
-    return *this;
-  }
-  ~descriptor() { reset(); }
-
-  int get() const { return fd_; }
-  void reset() {
-    if (fd_ >= 0) close(fd_);
-    fd_ = -1;
-  }
-
- private:
-  int fd_ = -1;
-};
-
-// The two ends of an output: what the program writes to and what the test reads from.
+// The two ends of an output: what the program writes to, and what the test reads from or -1.
 struct channel {
-  descriptor program;
-  descriptor test;
+  int program;
+  int test = -1;
 };
+
+void close_end(int &fd) {
+  if (fd >= 0) close(fd);
+  fd = -1;
+}
 
 channel make_pipe() {
   int ends[2];
   check(pipe2(ends, O_CLOEXEC) == 0, "pipe");
-  return {descriptor(ends[1]), descriptor(ends[0])};
+  return {ends[1], ends[0]};
 }
 
 channel make_terminal() {
-  int test;
-  int program;
+  channel terminal{};
   termios raw{};
   cfmakeraw(&raw);  // line ends arrive as they were written
-  check(openpty(&test, &program, nullptr, &raw, nullptr) == 0, "openpty");
-  fcntl(test, F_SETFD, FD_CLOEXEC);
-  fcntl(program, F_SETFD, FD_CLOEXEC);
-  return {descriptor(program), descriptor(test)};
+  check(openpty(&terminal.test, &terminal.program, nullptr, &raw, nullptr) == 0, "openpty");
+  for (const int fd : {terminal.test, terminal.program}) fcntl(fd, F_SETFD, FD_CLOEXEC);
+  return terminal;
 }
 
 channel make_stdout(const run_options &options) {
   if (options.terminal) return make_terminal();
   if (options.stdout_path.empty()) return make_pipe();
-  const int file = open(options.stdout_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
-  check(file >= 0, options.stdout_path.c_str());
-  return {descriptor(file), descriptor()};
+  const channel file{open(options.stdout_path.c_str(), O_WRONLY | O_CLOEXEC)};
+  check(file.program >= 0, options.stdout_path.c_str());
+  return file;
 }
 
 [[noreturn]] void become_tarvelctl(const kernel_dir &kernel, const words &line, const run_options &options,
@@ -97,20 +75,14 @@ channel make_stdout(const run_options &options) {
 }
 
 // Appends what there is to read. Closes the descriptor at its end.
-void read_some(descriptor &from, std::string &to) {
+void read_some(int &from, std::string &to) {
   char buffer[65536];
-  const ssize_t got = read(from.get(), buffer, sizeof buffer);
+  const ssize_t got = read(from, buffer, sizeof buffer);
   if (got > 0) {
     to.append(buffer, static_cast<std::size_t>(got));
   } else if (got == 0 || errno != EINTR) {
-    from.reset();  // a terminal whose program has gone reports an error, not an end
+    close_end(from);  // a terminal whose program has gone reports an error, not an end
   }
-}
-
-int wait_for_end(pid_t pid) {
-  int status = 0;
-  check(waitpid(pid, &status, 0) == pid, "waitpid");
-  return WIFSIGNALED(status) ? -WTERMSIG(status) : WEXITSTATUS(status);
 }
 
 }  // namespace
@@ -146,21 +118,23 @@ run_result run_tarvelctl(const kernel_dir &kernel, const words &line, const run_
   channel err = make_pipe();
   const pid_t pid = fork();
   check(pid >= 0, "fork");
-  const int err_fd = options.merged ? out.program.get() : err.program.get();
-  if (pid == 0) become_tarvelctl(kernel, line, options, out.program.get(), err_fd);
-  out.program.reset();
-  err.program.reset();
+  if (pid == 0)
+    become_tarvelctl(kernel, line, options, out.program, options.merged ? out.program : err.program);
+  close_end(out.program);
+  close_end(err.program);
 
   run_result result;
-  while (out.test.get() >= 0 || err.test.get() >= 0) {
-    pollfd ready[] = {{out.test.get(), POLLIN, 0}, {err.test.get(), POLLIN, 0}};
+  while (out.test >= 0 || err.test >= 0) {
+    pollfd ready[] = {{out.test, POLLIN, 0}, {err.test, POLLIN, 0}};
     poll(ready, 2, options.meanwhile ? 5 : -1);
     if (ready[0].revents) read_some(out.test, result.out);
     if (ready[1].revents) read_some(err.test, result.err);
-    if (options.reader_leaves && !result.out.empty()) out.test.reset();
+    if (options.reader_leaves && !result.out.empty()) close_end(out.test);
     if (options.meanwhile) options.meanwhile({pid, result.out, result.err});
   }
-  result.status = wait_for_end(pid);
+  int status = 0;
+  check(waitpid(pid, &status, 0) == pid, "waitpid");
+  result.status = WIFSIGNALED(status) ? -WTERMSIG(status) : WEXITSTATUS(status);
   return result;
 }
 
@@ -170,17 +144,9 @@ std::size_t count_of(const std::string &text, const std::string &part) {
   return count;
 }
 
-std::string hide_times(std::string text) {
-  constexpr std::string_view shape = "0000-00-00 00:00:00";
-  const auto fits = [](char expected, char found) {
-    return expected == '0' ? found >= '0' && found <= '9' : found == expected;
-  };
-  for (;;) {
-    const auto at = std::search(text.begin(), text.end(), shape.begin(), shape.end(),
-                                [&](char found, char expected) { return fits(expected, found); });
-    if (at == text.end()) return text;
-    text.replace(at, at + shape.size(), "<time>");
-  }
+std::string hide_times(const std::string &text) {
+  static const std::regex time(R"(\d{4}-\d\d-\d\d \d\d:\d\d:\d\d)");
+  return std::regex_replace(text, time, "<time>");
 }
 
 std::function<void(const running &)> interrupt_after(std::size_t times, const std::string &text) {

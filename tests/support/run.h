@@ -65,7 +65,7 @@ run_result run_tarvelctl(const kernel_dir &kernel, const words &line, const run_
 std::size_t count_of(const std::string &text, const std::string &part);
 
 // The text with "<time>" in the place of every date and time such as "2026-02-28 23:59:59".
-std::string hide_times(std::string text);
+std::string hide_times(const std::string &text);
 
 // For run_options::meanwhile: sends SIGINT once `text` has appeared `times` times on the two outputs
 // together.
