@@ -8,7 +8,9 @@ at the end of a line.
 """
 
 import argparse
+import collections
 import os
+import pathlib
 import random
 import re
 import select
@@ -25,21 +27,14 @@ HEADING = re.compile(rb"\n(\d{4}-\d\d-\d\d \d\d:\d\d:\d\d\n)?")
 
 
 def make_providers(count, randomness):
-    """Returns a provider table and its true listing with details."""
     table, listing = [], []
     for index in range(count):
         name = f"provider-{index}"
         own, *instances = (uuid.UUID(int=randomness.getrandbits(128)) for _ in range(1 + randomness.randrange(4)))
-        tx, rx = randomness.randrange(100), -index
-        record = bytearray(264)
-        record[0:16] = own.bytes
-        record[64 : 64 + len(name)] = name.encode()
-        struct.pack_into("<II", record, 128, len(name), 2)
-        struct.pack_into("<ii", record, 152, tx, rx)
-        struct.pack_into("<I", record, 256, len(instances))
-        table.append(bytes(record) + b"".join(instance.bytes for instance in instances))
+        table.append(struct.pack("<16s48x64sII16xii96xI4x", own.bytes, name.encode(), len(name), 2, index, -index,
+                                 len(instances)) + b"".join(instance.bytes for instance in instances))
         listing.append(f"net-if {name} {str(own).upper()}\n")
-        listing.append(f"\trings: tx {tx} rx {rx} slots: tx 0 rx 0 bufsize 0 metasize 0 mhints 0\n")
+        listing.append(f"\trings: tx {index} rx {-index} slots: tx 0 rx 0 bufsize 0 metasize 0 mhints 0\n")
         listing.extend(f"\tinstance {str(instance).upper()}\n" for instance in instances)
     return b"".join(table), "".join(listing).encode()
 
@@ -91,24 +86,24 @@ def wait_for_handler(pid):
     """Returns once the process catches SIGINT."""
     mask = 1 << (signal.SIGINT - 1)
     while True:
-        with open(f"/proc/{pid}/status", encoding="ascii") as status:
-            caught = re.search(r"^SigCgt:\s*(\w+)", status.read(), re.MULTILINE)
+        caught = re.search(r"^SigCgt:\s*(\w+)", pathlib.Path(f"/proc/{pid}/status").read_text(), re.MULTILINE)
         if int(caught[1], 16) & mask:
             return
+
+
+def fail_unless(condition, message):
+    if not condition:
+        raise AssertionError(message)
 
 
 class Torture:
     def __init__(self, program, root, listing, limit, randomness):
         self.program, self.root, self.listing, self.limit = program, root, listing, limit
-        self.random = randomness
+        self.random, self.environment = randomness, {**os.environ, "TARVEL_ROOT": root}
         started = time.monotonic()
-        true_output = subprocess.run([program, "provider", "-D"], env=self.environment(), capture_output=True)
+        true_output = subprocess.run([program, "provider", "-D"], env=self.environment, capture_output=True)
         self.run_time = time.monotonic() - started
-        if true_output.stdout != listing:
-            sys.exit("the listing is wrong even without interrupts")
-
-    def environment(self):
-        return {**os.environ, "TARVEL_ROOT": self.root}
+        fail_unless(true_output.stdout == listing, "the listing is wrong even without interrupts")
 
     def moment(self):
         """Mostly inside the first run, now and then in the sleep or the second run."""
@@ -118,16 +113,13 @@ class Torture:
         """Returns where the output of one run ends and how long the process took to end, or raises."""
         path = os.path.join(self.root, "output")
         redirection = ["-f", path] if kind == "file" else []
-        with open(path, "wb"):
-            pass
+        pathlib.Path(path).write_bytes(b"")
         process = subprocess.Popen(
-            [self.program, "-w", "1", *redirection, "provider", "-D"],
-            env=self.environment(), stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
-        limit = self.random.randrange(len(self.listing)) if kind == "stopped pipe" else None
-        reader = Reader(process.stdout.fileno(), limit)
+            [self.program, "-w", "1", *redirection, "provider", "-D"], env=self.environment,
+            stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        reader = Reader(process.stdout.fileno(), self.random.randrange(len(self.listing)) if kind == "stopped pipe" else None)
         wait_for_handler(process.pid)
         time.sleep(self.moment())
-
         interrupted = time.monotonic()
         process.send_signal(signal.SIGINT)
         end = os.pidfd_open(process.pid)
@@ -139,27 +131,22 @@ class Torture:
         output, errors = reader.rest(), process.stderr.read()
         process.stdout.close()
         process.stderr.close()
-        if process.wait() != 0 or errors:
-            raise AssertionError(f"status {process.returncode}, standard error {errors!r}")
-        if took > self.limit:
-            raise AssertionError(f"ended only after {took:.3f} s")
+        fail_unless(process.wait() == 0 and not errors, f"status {process.returncode}, standard error {errors!r}")
+        fail_unless(took <= self.limit, f"ended only after {took:.3f} s")
         if kind == "file":
-            if output:
-                raise AssertionError(f"{len(output)} bytes on standard output")
-            with open(path, "rb") as file:
-                output = file.read()
+            fail_unless(not output, f"{len(output)} bytes on standard output")
+            output = pathlib.Path(path).read_bytes()
         cut = where_cut(output, self.listing)
-        if cut is None:
-            raise AssertionError(f"{len(output)} bytes of output are no prefix; they end in {output[-60:]!r}")
+        fail_unless(cut, f"{len(output)} bytes of output are no prefix; they end in {output[-60:]!r}")
         return cut, took
 
     def interrupt_many(self, kind, count):
         """Returns the number of runs that failed."""
-        failed, slowest, cuts = 0, 0.0, {}
+        failed, slowest, cuts = 0, 0.0, collections.Counter()
         for number in range(count):
             try:
                 cut, took = self.interrupt_one(kind)
-                cuts[cut] = cuts.get(cut, 0) + 1
+                cuts[cut] += 1
                 slowest = max(slowest, took)
             except AssertionError as reason:
                 failed += 1
@@ -175,21 +162,17 @@ def main():
     parser.add_argument("--count", type=int, default=1000, help="interrupts for each kind of output")
     parser.add_argument("--limit", type=float, default=0.2, help="seconds that a process may take to end")
     parser.add_argument("--providers", type=int, default=10_000)
-    parser.add_argument("--seed", type=int, default=None)
+    parser.add_argument("--seed", type=int, default=random.randrange(2**32))
     options = parser.parse_args()
-    seed = random.randrange(2**32) if options.seed is None else options.seed
-    print(f"seed {seed}")
-    randomness = random.Random(seed)
+    print(f"seed {options.seed}")
+    randomness = random.Random(options.seed)
     table, listing = make_providers(options.providers, randomness)
     with tempfile.TemporaryDirectory() as root:
-        node = os.path.join(root, "proc/sys/kern/tarvel/nexus_provider_list")
-        os.makedirs(os.path.dirname(node))
-        with open(node, "wb") as file:
-            file.write(table)
+        node = pathlib.Path(root, "proc/sys/kern/tarvel/nexus_provider_list")
+        node.parent.mkdir(parents=True)
+        node.write_bytes(table)
         torture = Torture(options.program, root, listing, options.limit, randomness)
-        kinds = ["file", "pipe", "stopped pipe"]
-        failed = sum([torture.interrupt_many(kind, options.count) for kind in kinds])
-    sys.exit(1 if failed else 0)
+        sys.exit(any([torture.interrupt_many(kind, options.count) for kind in ("file", "pipe", "stopped pipe")]))
 
 
 if __name__ == "__main__":

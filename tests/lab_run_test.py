@@ -7,7 +7,6 @@ import os
 import pathlib
 import pty
 import signal
-import subprocess
 import sys
 import time
 import unittest
@@ -18,11 +17,8 @@ from lab_kernel import Kernel, LabTest, files, lab, node_dir, run, u32, u64  # n
 
 class Simulate(LabTest):
     def simulate(self, *options):
-        process = subprocess.Popen([lab, "simulate", self.directory, *options], stdout=subprocess.PIPE, text=True)
-        self.addCleanup(process.stdout.close)
-        self.addCleanup(process.wait)
-        self.addCleanup(process.kill)
-        self.assertEqual(process.stdout.readline(), f"simulating in {self.directory}\n")
+        process, line = self.start("simulate", self.directory, *options)
+        self.assertEqual(line, f"simulating in {self.directory}")
         return process, Kernel(self.directory)
 
     def test_ReadersMeetWholeTablesOnly(self):
@@ -68,19 +64,11 @@ class Run(LabTest):
         super().setUp()
         self.env = {**os.environ, "TMPDIR": str(self.directory)}
 
-    def start(self, script, **options):
-        process = subprocess.Popen([lab, "run", "--interval", "20", "--", "sh", "-c", script], env=self.env,
-                                   stdout=subprocess.PIPE, text=True, **options)
-        self.addCleanup(process.stdout.close)
-        self.addCleanup(process.wait)
-        self.addCleanup(process.kill)
-        return process, process.stdout.readline().strip()
+    def start_run(self, script):
+        return self.start("run", "--interval", "20", "--", "sh", "-c", script, env=self.env)
 
     def nothing_left(self):
-        if any(self.directory.iterdir()):
-            return False
-        told = [p for p in pathlib.Path("/proc").glob("[0-9]*/environ") if self.mentions(p)]
-        return not told
+        return not any(self.directory.iterdir()) and not any(map(self.mentions, pathlib.Path("/proc").glob("[0-9]*/environ")))
 
     def mentions(self, path):
         try:
@@ -89,10 +77,9 @@ class Run(LabTest):
             return False
 
     def test_StatusIsTheCommandsOwn(self):
-        for script, status in (("exit 0", 0), ("exit 7", 7), ("kill -KILL $$", -9), ("kill -TERM $$", -15)):
-            self.assertEqual(run("run", "--", "sh", "-c", script, env=self.env).returncode, status)
-        self.assertEqual(run("run", "--", "no-such-command", env=self.env).returncode, 127)
-        self.assertEqual(run("run", "--", "/dev/null", env=self.env).returncode, 126)
+        for status, *command in ((0, "true"), (7, "sh", "-c", "exit 7"), (-9, "sh", "-c", "kill -KILL $$"),
+                                 (-15, "sh", "-c", "kill -TERM $$"), (127, "no-such-command"), (126, "/dev/null")):
+            self.assertEqual(run("run", "--", *command, env=self.env).returncode, status)
         self.assertEqual(run("run", self.directory / "none", "--", "true", env=self.env).returncode, 1)
         self.assertTrue(self.nothing_left())
 
@@ -105,11 +92,11 @@ class Run(LabTest):
 
     def test_SignalsArePassedOnAndAllIsCleanedUp(self):
         for number in signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGQUIT:
-            process, _ = self.start(f"trap 'exit 9' {int(number)}; echo ready; while :; do sleep 0.01; done")
+            process, _ = self.start_run(f"trap 'exit 9' {int(number)}; echo ready; while :; do sleep 0.01; done")
             process.send_signal(number)
             self.assertEqual(process.wait(5), 9)
             self.assertTrue(self.nothing_left())
-            process, _ = self.start("echo ready; exec sleep 60")
+            process, _ = self.start_run("echo ready; exec sleep 60")
             process.send_signal(number)
             self.assertEqual(process.wait(5), -number)
             self.assertTrue(self.nothing_left())
@@ -131,7 +118,7 @@ class Run(LabTest):
         self.assertTrue(self.nothing_left())
 
     def test_TheSimulationDoesNotOutliveAKilledRun(self):
-        process, child = self.start("echo $$; exec sleep 60")
+        process, child = self.start_run("echo $$; exec sleep 60")
         process.kill()
         process.wait()
         os.kill(int(child), signal.SIGKILL)
@@ -167,12 +154,11 @@ class Capture(LabTest):
         for name, keep, damage in (("nexus_channel_list", 3000, (16, b"\xff" * 4)), ("nexus_channel_list", 71, (60, b"\xff" * 8)),
                                    ("stats/flow_adv", 59, (36, b"\xff" * 4)), ("stats/flow", 639, (68, b"\xff" * 4)),
                                    ("stats/arena", 2607, (0, b"")), ("stats/userstack", 1, (0, b""))):
-            table = bytearray(kernel.table(name)[:keep])
-            at, value = damage
-            table[at:at + len(value)] = value
+            table, (at, value) = kernel.table(name)[:keep], damage
+            table = table[:at] + value + table[at + len(value):]
             (kernel.root / node_dir / name).write_bytes(table)
             self.assertEqual(self.capture(kernel.root).returncode, 0)
-            self.assertEqual(Kernel(self.directory / "saved").table(name), bytes(table))
+            self.assertEqual(Kernel(self.directory / "saved").table(name), table)
 
 
 if __name__ == "__main__":

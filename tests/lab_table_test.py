@@ -14,16 +14,17 @@ from lab_kernel import LabTest, files, none, run, text, u32, u64  # noqa: E402
 
 class Generate(LabTest):
     def test_SameSeedSameBytesAnotherSeedOthers(self):
-        self.generate("--seed", 7)
-        self.generate("--seed", 7, name="again")
-        self.generate("--seed", 8, name="other")
-        self.assertEqual(files(self.directory / "made"), files(self.directory / "again"))
-        self.assertNotEqual(files(self.directory / "made"), files(self.directory / "other"))
+        made, again, other = (files(self.generate("--seed", seed, name=name).root) for seed, name in ((7, "a"), (7, "b"), (8, "c")))
+        self.assertEqual(made, again)
+        self.assertNotEqual(made, other)
 
     def test_ReferencesBetweenTablesHold(self):
         for options in ((), ("--flows", 3000), ("--channels", 400, "--nexuses", 60), ("--processes", 1)):
-            with self.subTest(options=options):
-                self.check_references(self.generate(*options))
+            self.check_references(self.generate(*options))
+        for size in "providers", "nexuses", "channels", "processes":  # nothing stands on nothing
+            kernel = self.generate("--" + size, 0)
+            self.assertEqual(kernel.flows(), [], size)
+            self.check_references(kernel)
 
     def check_references(self, kernel):
         instances = [i for _, items in kernel.providers() for i in items]
@@ -63,8 +64,7 @@ class Generate(LabTest):
         kernel = self.generate("--rings", 3)
         head, items = kernel.providers()[0]
         self.assertEqual((text(head, 64, 64), u32(head, 128)), ("com.example.multistack.en0", 26))
-        self.assertEqual((u32(head, 132), u32(head, 184), u32(head, 256)), (3, 1, len(items)))
-        self.assertEqual((u32(head, 152), u32(head, 156), u32(head, 168)), (2, 1, 2048))
+        self.assertEqual([u32(head, at) for at in (132, 184, 256, 152, 156, 168)], [3, 1, len(items), 2, 1, 2048])
         self.assertEqual({u32(h, 132) for h, _ in kernel.providers()}, {0, 1, 2, 3})
         self.assertIn(1, {u32(h, 144) for h, _ in kernel.providers()})
         self.assertEqual(kernel.table("ring_stat_enable"), b"\1")
@@ -96,19 +96,11 @@ class Generate(LabTest):
     def test_SizesAreKeptToTheLastRecord(self):
         kernel = self.generate("--providers", 30, "--nexuses", 77, "--channels", 500, "--flows", 4000, "--stacks", 90,
                                "--arenas", 41, "--namespaces", 25, "--rings", 0)
-        self.assertEqual(len(kernel.providers()), 30)
-        self.assertEqual(sum(len(items) for _, items in kernel.providers()), 77)
+        self.assertEqual((len(kernel.providers()), sum(len(items) for _, items in kernel.providers())), (30, 77))
         self.assertEqual(sum(entry is not None for _, entry, _ in kernel.channels()), 500)
         self.assertEqual(len(kernel.flows()), 4000)
-        self.assertEqual(len(kernel.records("stats/userstack", 2496)), 90)
-        self.assertEqual(len(kernel.records("stats/arena", 2608)), 41)
+        self.assertEqual([len(kernel.records("stats/" + n, size)) for n, size in (("userstack", 2496), ("arena", 2608))], [90, 41])
         self.assertEqual(len(list(kernel.chains("stats/netns", 32, 18, 32))), 25)
-
-    def test_NothingStandsOnNothing(self):
-        for size in "providers", "nexuses", "channels", "processes":
-            kernel = self.generate("--" + size, 0)
-            self.assertEqual(kernel.flows(), [], size)
-            self.check_references(kernel)
 
     def test_WrongWordsAreUsageErrors(self):
         for words in ("", "nothing", "generate", "generate a b", "generate a --flows", "generate a --flows -1",

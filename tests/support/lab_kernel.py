@@ -36,8 +36,6 @@ def files(root):
 
 
 class Kernel:
-    """A directory with tables, read by the offsets of the formats."""
-
     def __init__(self, root):
         self.root = pathlib.Path(root)
 
@@ -53,11 +51,10 @@ class Kernel:
         """Records with so many items behind each, as (head, items)."""
         table, at = self.table(name), 0
         while at < len(table):
-            head = table[at:at + head_size]
-            count = struct.unpack_from("<B" if name == "stats/netns" else "<I", head, count_at)[0]
-            at += head_size
-            yield head, [table[at + i * item_size:at + (i + 1) * item_size] for i in range(count)]
-            at += count * item_size
+            head, at = table[at:at + head_size], at + head_size
+            end = at + item_size * (head[count_at] if name == "stats/netns" else u32(head, count_at))
+            yield head, [table[i:i + item_size] for i in range(at, end, item_size)]
+            at = end
         assert at == len(table)
 
     def providers(self):
@@ -67,25 +64,21 @@ class Kernel:
         """(nexus, entry, rings) of each channel; a nexus without any is (nexus, None, [])."""
         table, at = self.table("nexus_channel_list"), 0
         while at < len(table):
-            nexus, count = table[at:at + 16], u32(table, at + 16)
-            at += 24
+            nexus, count, at = table[at:at + 16], u32(table, at + 16), at + 24
             if not count:
                 yield nexus, None, []
             for _ in range(count):
-                entry = table[at:at + 48]
-                rings = u32(entry, 32) + u32(entry, 36)
-                at += 48
-                yield nexus, entry, [table[at + i * 184:at + (i + 1) * 184] for i in range(rings)]
-                at += rings * 184
+                entry, at = table[at:at + 48], at + 48
+                end = at + 184 * (u32(entry, 32) + u32(entry, 36))
+                yield nexus, entry, [table[i:i + 184] for i in range(at, end, 184)]
+                at = end
         assert at == len(table)
 
     def flows(self):
         return self.records("stats/flow", 320)
 
     def pids(self):
-        for _, entry, _ in self.channels():
-            if entry:
-                yield u32(entry, 20)
+        yield from (u32(entry, 20) for _, entry, _ in self.channels() if entry)
         for name, size, at, count in (("flow", 320, 68, 1), ("flow_owner", 128, 68, 1), ("userstack", 2496, 32, 1),
                                       ("arena", 2608, 2576, 8)):
             for record in self.records("stats/" + name, size):
@@ -101,6 +94,13 @@ class LabTest(unittest.TestCase):
         made = run("generate", self.directory / name, *options)
         self.assertEqual((made.returncode, made.stderr), (0, ""))
         return Kernel(self.directory / name)
+
+    def start(self, *words, **options):
+        """Returns the lab, running, and the first line that it prints."""
+        process = subprocess.Popen([lab, *words], stdout=subprocess.PIPE, text=True, **options)
+        for clean_up in process.stdout.close, process.wait, process.kill:
+            self.addCleanup(clean_up)
+        return process, process.stdout.readline().strip()
 
     def wait_for(self, condition, seconds=10):
         end = time.monotonic() + seconds
