@@ -91,14 +91,12 @@ TEST_F(front_end, ValueIsNeverTakenForAnOption) {
 
 // The option error ends the loop after one run, which the timestamp in front of it tells from a single run.
 TEST_F(front_end, IntervalsAreDecimalNumbers) {
-  for (const char *value : {"1", "+1", " 1", "010", "2147483647"}) {
-    EXPECT_EQ(hide_times(run({"provider", "-x", "-w", value}).out), "\n<time>\n") << "'" << value << "'";
-  }
+  for (const char *value : {"1", "+1", " 1", "010", "2147483647"})
+    EXPECT_EQ(hide_times(run({"provider", "-x", "-w", value}).out), "\n<time>\n") << value;
   for (const char *value : {"0", "00", "-0", "+0"}) EXPECT_EQ(run({"provider", "-w", value}), report);
   for (const char *value : {"2x", "x", "", " ", "-1", "1 ", "0x1", "1.5", "2147483648", "4294967296",
-                            "9223372036854775808", "99999999999999999999", "-99999999999999999999"}) {
-    EXPECT_EQ(run({"provider", "-w", value}), usage_error) << "'" << value << "'";
-  }
+                            "9223372036854775808", "99999999999999999999", "-99999999999999999999"})
+    EXPECT_EQ(run({"provider", "-w", value}), usage_error) << value;
 }
 
 TEST_F(front_end, OutputFilesAreEmptiedAndTheLastOneWins) {
@@ -178,8 +176,8 @@ TEST_F(front_end, TableThatIsMissingOrEmptyIsReportedIfAtAll) {
     EXPECT_EQ(run_on(std::string("kern.tarvel.") + table, "", line), printed(out)) << line;
     EXPECT_EQ(run_tarvelctl(kernel_dir(), line).err, error) << line;
   }
-  EXPECT_EQ(run_tarvelctl(kernel_dir(), "provider").out, "");
-  EXPECT_EQ(run_tarvelctl(kernel_dir(), "channel").out, "No channels\n");
+  EXPECT_EQ(run_tarvelctl(kernel_dir(), "provider").out + run_tarvelctl(kernel_dir(), "channel").out,
+            "No channels\n");
   for (const std::string line :
        {"tree", "tree AAAAAAAA-0000-0000-0000-00000000000A", "show", "channel-stats"})
     EXPECT_EQ(run_tarvelctl(kernel_dir(), line), complained(missing)) << line;

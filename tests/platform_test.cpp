@@ -23,15 +23,11 @@ class platform_test : public testing::Test {
   ~platform_test() override { unsetenv("TARVEL_ROOT"); }
 
   // What a call left behind: the error number or 0, and the length.
-  struct answer {
-    int error;
-    std::size_t length;
-    bool operator==(const answer &) const = default;
-  };
+  using answer = std::pair<int, std::size_t>;
 
   static answer measure(const std::string &name) {
     answer result{0, 12345};
-    if (sysctlbyname(name.c_str(), nullptr, &result.length, nullptr, 0) != 0) result.error = errno;
+    if (sysctlbyname(name.c_str(), nullptr, &result.second, nullptr, 0) != 0) result.first = errno;
     return result;
   }
 
@@ -39,9 +35,9 @@ class platform_test : public testing::Test {
   answer read(const char *name, std::size_t size) {
     data = std::string(size + 64, '#');
     answer result{0, size};
-    if (sysctlbyname(name, data.data(), &result.length, nullptr, 0) != 0) result.error = errno;
+    if (sysctlbyname(name, data.data(), &result.second, nullptr, 0) != 0) result.first = errno;
     EXPECT_EQ(data.substr(size), std::string(64, '#'));
-    data.resize(result.error ? 0 : result.length);
+    data.resize(result.first ? 0 : result.second);
     return result;
   }
 
@@ -63,7 +59,7 @@ TEST_F(sysctl_test, DeliversTheFileWhereItFits) {
   EXPECT_EQ(measure(node), (answer{0, 10}));
   EXPECT_EQ(read(node, 10), (answer{0, 10}));
   EXPECT_EQ(data, "ten bytes.");
-  for (const std::size_t size : {0U, 1U, 9U}) EXPECT_EQ(read(node, size).error, ENOMEM) << size;
+  for (const std::size_t size : {0U, 1U, 9U}) EXPECT_EQ(read(node, size).first, ENOMEM) << size;
   kernel.table(node, "short");
   EXPECT_EQ(read(node, 10), (answer{0, 5}));
   EXPECT_EQ(data, "short");
@@ -71,7 +67,7 @@ TEST_F(sysctl_test, DeliversTheFileWhereItFits) {
   EXPECT_EQ(measure(node), (answer{0, 0}));
   EXPECT_EQ(read(node, 0), (answer{0, 0}));
   kernel.table(node, std::string(100'000, 'x'));
-  EXPECT_EQ(read(node, 99'999).error, ENOMEM);
+  EXPECT_EQ(read(node, 99'999).first, ENOMEM);
   EXPECT_EQ(read(node, 100'000), (answer{0, 100'000}));
 }
 
@@ -80,9 +76,9 @@ TEST_F(sysctl_test, NamesThatNoVariableHasAreENOENT) {
   write_file(kernel.root() / "proc/secret", "x");
   for (const std::string &name : {std::string(), std::string("a/b"), std::string("a.b/../../../secret"),
                                   std::string("../secret"), std::string(5000, 'x'), std::string(node)}) {
-    EXPECT_EQ(measure(name).error, ENOENT) << name.substr(0, 40);
+    EXPECT_EQ(measure(name).first, ENOENT) << name.substr(0, 40);
   }
-  EXPECT_EQ(read(node, 10).error, ENOENT);
+  EXPECT_EQ(read(node, 10).first, ENOENT);
   const std::string long_name = "kern." + std::string(200, 'x') + ".y";
   kernel.table(long_name, "found");
   EXPECT_EQ(measure(long_name), (answer{0, 5}));
@@ -90,12 +86,12 @@ TEST_F(sysctl_test, NamesThatNoVariableHasAreENOENT) {
 
 TEST_F(sysctl_test, WhatIsNoReadableFileIsRefused) {
   kernel.table(node, "x").table("kern.open", "y").table("kern.pipe", "");
-  EXPECT_EQ(measure("kern.tarvel.stats").error, EISDIR);
-  EXPECT_EQ(read("kern.tarvel", 10).error, EISDIR);
+  EXPECT_EQ(measure("kern.tarvel.stats").first, EISDIR);
+  EXPECT_EQ(read("kern.tarvel", 10).first, EISDIR);
   remove(kernel.table_path("kern.pipe"));
   ASSERT_EQ(mkfifo(kernel.table_path("kern.pipe").c_str(), 0666), 0);
-  EXPECT_NE(measure("kern.pipe").error, 0);
-  EXPECT_NE(read("kern.pipe", 10).error, 0);
+  EXPECT_NE(measure("kern.pipe").first, 0);
+  EXPECT_NE(read("kern.pipe", 10).first, 0);
 
   chmod(kernel.table_path(node).c_str(), 0);
   const bool root = geteuid() == 0;  // who may read everything
@@ -103,22 +99,20 @@ TEST_F(sysctl_test, WhatIsNoReadableFileIsRefused) {
   const answer open = measure("kern.open");
   const answer closed = measure(node);
   ASSERT_TRUE(!root || seteuid(0) == 0);
-  if (open.error == EACCES) GTEST_SKIP() << "the way to the temporary directory is closed to others";
+  if (open.first == EACCES) GTEST_SKIP() << "the way to the temporary directory is closed to others";
   EXPECT_EQ(open, (answer{0, 1}));
-  EXPECT_EQ(closed.error, EACCES);
+  EXPECT_EQ(closed.first, EACCES);
 }
 
 TEST_F(sysctl_test, NewValueIsEPERM) {
   kernel.table(node, "x");
   std::size_t length = 0;
-  errno = 0;
-  EXPECT_EQ(sysctlbyname(node, nullptr, &length, "y", 1), -1);
-  EXPECT_EQ(errno, EPERM);
+  EXPECT_EQ(sysctlbyname(node, nullptr, &length, "y", 1) == -1 ? errno : 0, EPERM);
   EXPECT_EQ(contents_of(kernel.table_path(node)), "x");
 }
 
 TEST_F(platform_test, LiveMachineIsSeenOnlyWithoutAnotherRoot) {
-  EXPECT_EQ(measure("kernel.ostype").error, ENOENT);
+  EXPECT_EQ(measure("kernel.ostype").first, ENOENT);
   EXPECT_EQ(process_name(getpid()), "(none)");
   unsetenv("TARVEL_ROOT");
   prctl(PR_SET_NAME, "a tarvel test");

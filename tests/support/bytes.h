@@ -11,12 +11,9 @@
 #include <string>
 #include <string_view>
 
-// A record of `size` zero bytes, to be filled at offsets:
-//
+// A record of `size` zero bytes, to be filled at offsets and put together with others by "+":
 //   bytes(264).text(64, "en0").u32(128, 3) + bytes(264)
-//
-// A record is a std::string and is put together with others by "+". Writing past the end is an error of the
-// test.
+// Writing past the end is an error of the test.
 class bytes : public std::string {
  public:
   explicit bytes(std::size_t size) : std::string(size, '\0') {}
@@ -40,10 +37,8 @@ class bytes : public std::string {
 
   // From canonical form.
   bytes &uuid(std::size_t at, std::string_view canonical) {
-    std::string digits;
-    for (const char digit : canonical) {
-      if (digit != '-') digits += digit;
-    }
+    std::string digits(canonical);
+    std::erase(digits, '-');
     for (std::size_t i = 0; i < 16; ++i) {
       u8(at + i, static_cast<std::uint8_t>(std::stoul(digits.substr(2 * i, 2), nullptr, 16)));
     }

@@ -20,15 +20,9 @@ struct kernel_answer {
   std::string data{};
 };
 
-inline kernel_answer fails(int error) {
-  return {.error = error};
-}
-inline kernel_answer needs(std::size_t size) {
-  return {.size = size};
-}
-inline kernel_answer delivers(const std::string &data) {
-  return {.size = data.size(), .data = data};
-}
+constexpr auto fails = [](int error) { return kernel_answer{.error = error}; };
+constexpr auto needs = [](std::size_t size) { return kernel_answer{.size = size}; };
+constexpr auto delivers = [](const std::string &data) { return kernel_answer{0, data.size(), data}; };
 
 // One call as the kernel saw it.
 struct kernel_call {
@@ -41,12 +35,10 @@ struct kernel_call {
   bool operator==(const kernel_call &) const = default;
 };
 
-struct fake_kernel {
+inline struct {
   std::vector<kernel_answer> script;  // an answer for each call in turn; a call beyond it fails the test
   std::vector<kernel_call> calls;
-};
-
-inline fake_kernel the_kernel;
+} the_kernel;
 
 extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, const void *new_value,
                             std::size_t new_length) {

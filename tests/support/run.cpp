@@ -17,8 +17,9 @@
 
 namespace {
 
-void check(bool done, const char *what) {
-  if (!done) throw std::system_error(errno, std::generic_category(), what);
+int check(int result, const char *what) {
+  if (result < 0) throw std::system_error(errno, std::generic_category(), what);
+  return result;
 }
 
 // The two ends of an output: what the program writes to, and what the test reads from or -1.
@@ -34,7 +35,7 @@ void close_end(int &fd) {
 
 channel make_pipe() {
   int ends[2];
-  check(pipe2(ends, O_CLOEXEC) == 0, "pipe");
+  check(pipe2(ends, O_CLOEXEC), "pipe");
   return {ends[1], ends[0]};
 }
 
@@ -42,7 +43,7 @@ channel make_terminal() {
   channel terminal{};
   termios raw{};
   cfmakeraw(&raw);  // line ends arrive as they were written
-  check(openpty(&terminal.test, &terminal.program, nullptr, &raw, nullptr) == 0, "openpty");
+  check(openpty(&terminal.test, &terminal.program, nullptr, &raw, nullptr), "openpty");
   for (const int fd : {terminal.test, terminal.program}) fcntl(fd, F_SETFD, FD_CLOEXEC);
   return terminal;
 }
@@ -50,9 +51,7 @@ channel make_terminal() {
 channel make_stdout(const run_options &options) {
   if (options.terminal) return make_terminal();
   if (options.stdout_path.empty()) return make_pipe();
-  const channel file{open(options.stdout_path.c_str(), O_WRONLY | O_CLOEXEC)};
-  check(file.program >= 0, options.stdout_path.c_str());
-  return file;
+  return {check(open(options.stdout_path.c_str(), O_WRONLY | O_CLOEXEC), options.stdout_path.c_str())};
 }
 
 [[noreturn]] void become_tarvelctl(const kernel_dir &kernel, const words &line, const run_options &options,
@@ -116,8 +115,7 @@ void PrintTo(const run_result &result, std::ostream *to) {
 run_result run_tarvelctl(const kernel_dir &kernel, const words &line, const run_options &options) {
   channel out = make_stdout(options);
   channel err = make_pipe();
-  const pid_t pid = fork();
-  check(pid >= 0, "fork");
+  const pid_t pid = check(fork(), "fork");
   if (pid == 0)
     become_tarvelctl(kernel, line, options, out.program, options.merged ? out.program : err.program);
   close_end(out.program);
@@ -133,7 +131,7 @@ run_result run_tarvelctl(const kernel_dir &kernel, const words &line, const run_
     if (options.meanwhile) options.meanwhile({pid, result.out, result.err});
   }
   int status = 0;
-  check(waitpid(pid, &status, 0) == pid, "waitpid");
+  check(waitpid(pid, &status, 0), "waitpid");
   result.status = WIFSIGNALED(status) ? -WTERMSIG(status) : WEXITSTATUS(status);
   return result;
 }
