@@ -66,9 +66,8 @@ const outcome no_buf{ENOMEM, "sysctl for buf failed, Cannot allocate memory\n"};
 TEST(sysctl_fetch_test, ReadsWhatThereIsIntoABufferOfTheSizeAnswered) {
   const script enough = {needs(4), delivers("data")};
   EXPECT_EQ(fetch(enough), fetched);
-  const std::string name = "kern.tarvel.test";
-  EXPECT_EQ(the_kernel.calls[0], (kernel_call{name, false, the_kernel.calls[0].length, nullptr, 0}));
-  EXPECT_EQ(the_kernel.calls[1], (kernel_call{name, true, 4, nullptr, 0}));
+  EXPECT_EQ(the_kernel.calls[0], (kernel_call{"kern.tarvel.test", false, 7, nullptr, 0}));
+  EXPECT_EQ(the_kernel.calls[1], (kernel_call{"kern.tarvel.test", true, 4, nullptr, 0}));
   EXPECT_EQ(fetch({needs(100), delivers("data")}), fetched);
   EXPECT_EQ(fetch({needs(0)}), nothing);
   EXPECT_EQ(fetch({needs(2), fails(ENOMEM), needs(4), delivers("data")}), fetched);

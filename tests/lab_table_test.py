@@ -78,8 +78,8 @@ class Generate(LabTest):
             self.assertEqual(u64(stack, 48 + 8 * 15) + u64(stack, 400 + 8 * 11), u64(stack, 688 + 8 * 15) + u64(stack, 2320 + 8 * 9))
         for route in kernel.records("stats/flow_route", 256):
             self.assertEqual(route[73], route[101])
-        namespaces = [(head[17], head[16]) for head, _ in kernel.chains("stats/netns", 32, 18, 32)]
-        self.assertEqual(namespaces[:4], [(6, 0), (17, 0), (6, 4), (17, 4)])
+        namespaces = [tuple(head[16:18]) for head, _ in kernel.chains("stats/netns", 32, 18, 32)]
+        self.assertEqual(namespaces[:4], [(0, 6), (0, 17), (4, 6), (4, 17)])
 
     def test_SharedRegionsAreTheSameInAllArenas(self):
         regions, shared = {}, 0

@@ -1,4 +1,4 @@
-// Kernel variables and process names as files; bounds of tables.
+// Kernel variables and process names as files.
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -6,9 +6,7 @@
 #include <unistd.h>
 
 #include <cstring>
-#include <memory>
 
-#include "common/record_walk.h"
 #include "platform/process.h"
 #include "platform/sysctl.h"
 #include "tests/support/kernel_dir.h"
@@ -141,54 +139,6 @@ TEST_F(process_test, NameIsTheTextUpToItsLineEndCutAt15Bytes) {
   }
   kernel.process(0, "zero\n").process(-1, "negative\n").process(3, "");
   for (const int pid : {0, -1, -2147483647 - 1, 2, 3}) EXPECT_EQ(process_name(pid), "(none)") << pid;
-}
-
-// Claims what follows it, as kernel records do.
-struct claim {
-  std::uint32_t bytes;
-  std::uint64_t trailing_size() const { return std::uint64_t{bytes} * 16; }
-};
-
-// A table of its own allocation, so that a sanitizer sees its end; it starts at an odd address.
-struct odd_table {
-  odd_table(std::uint32_t claimed, std::size_t size)
-      : block(new std::byte[size + 1]{}), bytes(block.get() + 1, size) {
-    std::memcpy(block.get() + 1, &claimed, std::min(size, sizeof claimed));
-  }
-  std::unique_ptr<std::byte[]> block;
-  std::span<const std::byte> bytes;
-};
-
-TEST(record_walk, TakesARecordAndWhatFollowsIt) {
-  const odd_table table(2, 4 + 32 + 4);
-  record_walk walk(table.bytes);
-  claim record{};
-  std::span<const std::byte> trailing;
-  ASSERT_TRUE(walk.take(record, trailing));
-  EXPECT_EQ(record.bytes, 2U);
-  EXPECT_EQ(trailing.data(), table.bytes.data() + 4);
-  EXPECT_EQ(trailing.size(), 32U);
-  EXPECT_EQ(walk.remaining(), 4U);
-  ASSERT_TRUE(walk.take(record, trailing));
-  EXPECT_TRUE(trailing.empty() && walk.at_end());
-  EXPECT_FALSE(walk.take(record));
-  EXPECT_EQ(record_at<claim>(table.bytes, 0).bytes, 2U);
-  EXPECT_EQ(record_at<claim>(table.bytes, 9).bytes, 0U);
-}
-
-TEST(record_walk, StaysWhereAStepDoesNotFit) {
-  std::vector<std::pair<std::uint32_t, std::size_t>> cases = {
-      {0x0FFFFFFF, 64}, {0x10000000, 64}, {0x10000001, 64}, {0xFFFFFFFF, 64}};
-  for (std::size_t size = 0; size < 4 + 32; ++size) cases.emplace_back(2, size);
-  for (const auto &[count, size] : cases) {
-    const odd_table table(count, size);
-    record_walk walk(table.bytes);
-    claim record{};
-    std::span<const std::byte> trailing;
-    EXPECT_FALSE(walk.take(record, trailing)) << count << " in " << size;
-    EXPECT_EQ(walk.remaining(), size);
-    EXPECT_EQ(walk.at_end(), size == 0);
-  }
 }
 
 }  // namespace

@@ -45,8 +45,7 @@ class kernel_dir {
   kernel_dir(const kernel_dir &) = delete;
   kernel_dir &operator=(const kernel_dir &) = delete;
 
-  // Publishes a kernel variable such as "kern.tarvel.stats.flow", also in place of its former contents:
-  // whoever reads along gets the one or the other.
+  // Publishes a kernel variable; whoever reads along gets its old contents or the new ones.
   kernel_dir &table(std::string_view name, std::string_view contents) {
     write_file(file("unpublished"), contents);
     std::filesystem::create_directories(table_path(name).parent_path());
