@@ -157,7 +157,7 @@ TEST_F(front_end, SomeCommandsSkipWrongOptions) {
 TEST_F(front_end, TableThatIsMissingOrEmptyIsReportedIfAtAll) {
   const struct {
     const char *line, *table;
-    std::string error = missing, out = "";
+    std::string error = missing, out{};
   } cases[] = {
       {"list-providers -D", "nexus_provider_list",
        missing + "failed to retrieve nexus provider list, No such file or directory\n", "No providers\n"},

@@ -4,9 +4,31 @@
 
 #include <gtest/gtest.h>
 
+#include <cerrno>
+#include <cstring>
+
 #include "common/output.h"
+#include "platform/sysctl.h"
 #include "tests/support/capture.h"
 #include "tests/support/fake_kernel.h"
+
+extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, const void *new_value,
+                            std::size_t new_length) {
+  const std::size_t turn = the_kernel.calls.size();
+  the_kernel.calls.push_back({name, old_value != nullptr, *old_length, new_value, new_length});
+  EXPECT_LT(turn, the_kernel.script.size());
+  const kernel_answer answer = turn < the_kernel.script.size() ? the_kernel.script[turn] : fails(ENOSYS);
+  if (answer.error) {
+    errno = answer.error;
+    return -1;
+  }
+  if (old_value) {
+    EXPECT_LE(answer.data.size(), *old_length);
+    std::memcpy(old_value, answer.data.data(), answer.data.size());
+  }
+  *old_length = answer.size;
+  return 0;
+}
 
 namespace {
 

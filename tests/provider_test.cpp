@@ -33,9 +33,10 @@ TEST(provider, ListsInTheOrderOfTheTable) {
 }
 
 TEST(provider, DetailsStandBetweenHeadingAndInstances) {
+  const run_result detailed = printed(wifi_heading + wifi_rings + wifi_instances);
   for (const char *line : {"provider -D", "provider -DD", "provider --d", "provider x -D", "provider -D x",
                            "LIST-PROVIDERS --details"}) {
-    EXPECT_EQ(list(wifi, line), printed(wifi_heading + wifi_rings + wifi_instances)) << line;
+    EXPECT_EQ(list(wifi, line), detailed) << line;
   }
 }
 
@@ -99,7 +100,8 @@ TEST(provider, InstanceCountsThatLieAreNotFollowed) {
   EXPECT_EQ(list(wifi + provider("p").u32(256, 0) + instance),
             complained(too_short, 0, wifi_listing + heading("user-pipe p")));
   for (const std::uint32_t count : {2U, 0x0FFFFFFFU, 0x10000000U, 0x10000001U, 0x80000000U, 0xFFFFFFFFU})
-    EXPECT_EQ(list(wifi + provider("p").u32(256, count) + instance), cut_off) << count;
+    EXPECT_EQ(list(std::string(wifi).append(provider("p").u32(256, count)).append(instance)), cut_off)
+        << count;
 }
 
 }  // namespace

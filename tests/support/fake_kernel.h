@@ -4,14 +4,9 @@
 #ifndef TARVELCTL_TESTS_SUPPORT_FAKE_KERNEL_H
 #define TARVELCTL_TESTS_SUPPORT_FAKE_KERNEL_H
 
-#include <gtest/gtest.h>
-
-#include <cerrno>
-#include <cstring>
+#include <cstddef>
 #include <string>
 #include <vector>
-
-#include "platform/sysctl.h"
 
 // One answer: an error, the size of a table, or its data.
 struct kernel_answer {
@@ -39,23 +34,5 @@ inline struct {
   std::vector<kernel_answer> script;  // an answer for each call in turn; a call beyond it fails the test
   std::vector<kernel_call> calls;
 } the_kernel;
-
-extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, const void *new_value,
-                            std::size_t new_length) {
-  const std::size_t turn = the_kernel.calls.size();
-  the_kernel.calls.push_back({name, old_value != nullptr, *old_length, new_value, new_length});
-  EXPECT_LT(turn, the_kernel.script.size());
-  const kernel_answer answer = turn < the_kernel.script.size() ? the_kernel.script[turn] : fails(ENOSYS);
-  if (answer.error) {
-    errno = answer.error;
-    return -1;
-  }
-  if (old_value) {
-    EXPECT_LE(answer.data.size(), *old_length);
-    std::memcpy(old_value, answer.data.data(), answer.data.size());
-  }
-  *old_length = answer.size;
-  return 0;
-}
 
 #endif
