@@ -154,7 +154,11 @@ std::vector<sort_key> object_tree::find_channels() {
 // Adds a copy of `child` behind the children of `parent`. Siblings have ascending numbers.
 object_id object_tree::append_child(object_id parent, const object_node &child) {
   const auto id = static_cast<object_id>(nodes_.size());
-  nodes_.push_back({.node = child});
+  const entry &over = nodes_[parent];
+  const entry &far = nodes_[over.jump];
+  const bool is_even = over.depth - far.depth == far.depth - nodes_[far.jump].depth;
+  const object_id jump = is_even ? far.jump : parent;
+  nodes_.push_back({.node = child, .depth = over.depth + 1, .jump = jump});
   nodes_[id].node.parent = parent;
   object_node &above = nodes_[parent].node;
   if (above.has_children()) {
@@ -186,56 +190,43 @@ void object_tree::release_children(object_id top) {
 // has none.
 void object_tree::make_findable(object_id id) {
   const uuid &key = nodes_[id].node.uuid;
-  if (by_uuid_.add(key, id)) {
-    nodes_[id].found = id;
-    return;
+  if (by_uuid_.add(key, id)) return;
+  const object_id first = by_uuid_.find(key);
+  if (nodes_[first].rivals == no_rivals) {
+    nodes_[first].rivals = static_cast<std::uint32_t>(rivals_.size());
+    rivals_.emplace_back(in_pre_order{this}).insert(first);
   }
-  entry &first = nodes_[by_uuid_.find(key)];
-  nodes_[id].next_same = first.next_same;
-  first.next_same = id;
-  if (first.found != no_object && !nodes_[first.found].released && precedes(id, first.found))
-    first.found = id;
+  rivals_[nodes_[first].rivals].insert(id);
 }
 
 object_id object_tree::find_object(const uuid &key) {
-  const object_id first_same = by_uuid_.find(key);
-  if (first_same == uuid_index::none) return no_object;
-  const object_id found = nodes_[first_same].found;
-  return found != no_object && !nodes_[found].released ? found : search(first_same);
-}
-
-// Finds the first of the nodes with one UUID anew, after the one known was taken out of the tree.
-object_id object_tree::search(object_id first_same) {
-  object_id found = no_object;
-  object_id *link = nullptr;
-  for (object_id id = first_same; id != no_object; id = nodes_[id].next_same) {
-    if (nodes_[id].released) {
-      if (link) *link = nodes_[id].next_same;
-    } else if (found == no_object || precedes(id, found)) {
-      found = id;
-    }
-    if (!nodes_[id].released || !link) link = &nodes_[id].next_same;
-  }
-  return nodes_[first_same].found = found;
+  const object_id first = by_uuid_.find(key);
+  if (first == uuid_index::none) return no_object;
+  if (nodes_[first].rivals == no_rivals) return nodes_[first].released ? no_object : first;
+  rival_set &rivals = rivals_[nodes_[first].rivals];
+  while (!rivals.empty() && nodes_[*rivals.begin()].released) rivals.erase(rivals.begin());
+  return rivals.empty() ? no_object : *rivals.begin();
 }
 
 // Whether `a` comes before `b` in depth-first pre-order.
 bool object_tree::precedes(object_id a, object_id b) const {
-  unsigned depth_a = depth(a);
-  unsigned depth_b = depth(b);
-  const bool a_is_higher = depth_a < depth_b;
-  for (; depth_a > depth_b; --depth_a) a = nodes_[a].node.parent;
-  for (; depth_b > depth_a; --depth_b) b = nodes_[b].node.parent;
+  const bool a_is_higher = nodes_[a].depth < nodes_[b].depth;
+  const unsigned depth = std::min(nodes_[a].depth, nodes_[b].depth);
+  a = ancestor_at(a, depth);
+  b = ancestor_at(b, depth);
   if (a == b) return a_is_higher;
   while (nodes_[a].node.parent != nodes_[b].node.parent) {
-    a = nodes_[a].node.parent;
-    b = nodes_[b].node.parent;
+    const bool is_too_far = nodes_[a].jump == nodes_[b].jump;
+    a = is_too_far ? nodes_[a].node.parent : nodes_[a].jump;
+    b = is_too_far ? nodes_[b].node.parent : nodes_[b].jump;
   }
   return a < b;
 }
 
-unsigned object_tree::depth(object_id id) const {
-  unsigned levels = 0;
-  for (; id != root; id = nodes_[id].node.parent) ++levels;
-  return levels;
+object_id object_tree::ancestor_at(object_id id, unsigned depth) const {
+  while (nodes_[id].depth > depth) {
+    const object_id jump = nodes_[id].jump;
+    id = nodes_[jump].depth >= depth ? jump : nodes_[id].node.parent;
+  }
+  return id;
 }

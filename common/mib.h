@@ -7,6 +7,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <set>
 #include <vector>
 
 #include "common/flow.h"
@@ -81,14 +82,23 @@ class object_tree {
   void dump_object(object_id top) const;
 
  private:
-  // A node and what the search needs. The nodes with one UUID are a list that starts at the first of them
-  // ever made, which also keeps the one that a search finds.
+  // A node and what the search needs.
   struct entry {
     object_node node;
-    object_id next_same = no_object;
-    object_id found = no_object;
+    unsigned depth = 0;
+    object_id jump = root;  // an ancestor, near or far, so that any ancestor is few steps away
+    std::uint32_t rivals = no_rivals;
     bool released = false;
   };
+
+  // Orders nodes as a depth-first walk meets them. What was taken out of the tree keeps its place in the
+  // order.
+  struct in_pre_order {
+    const object_tree *tree;
+    bool operator()(object_id a, object_id b) const { return tree->precedes(a, b); }
+  };
+  using rival_set = std::set<object_id, in_pre_order>;
+  static constexpr std::uint32_t no_rivals = UINT32_MAX;
 
   int scrape_providers();
   void scrape_channels();
@@ -98,16 +108,16 @@ class object_tree {
   std::vector<sort_key> find_channels();
 
   object_id append_child(object_id parent, const object_node &child);
-  void release_children(object_id id);
+  void release_children(object_id top);
   void make_findable(object_id id);
-  object_id search(object_id first_same);
   bool precedes(object_id a, object_id b) const;
-  unsigned depth(object_id id) const;
+  object_id ancestor_at(object_id id, unsigned depth) const;
 
   kernel_table providers_, channels_, flows_;
   std::vector<entry> nodes_;
-  uuid_index by_uuid_;
-  uuid_index by_port_;  // channels, by the number of their parent and their port
+  uuid_index by_uuid_;             // the node that came first with a UUID
+  std::vector<rival_set> rivals_;  // all nodes with one UUID, where there are several
+  uuid_index by_port_;             // channels, by the number of their parent and their port
 };
 
 #endif
