@@ -4,6 +4,7 @@
 #include <limits.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <time.h>
 #include <unistd.h>
@@ -88,8 +89,8 @@ void output::attach(int fd) {
   fstat(fd, &status);
   is_terminal_ = S_ISCHR(status.st_mode) && isatty(fd);
   is_pipe_ = S_ISFIFO(status.st_mode);
-  const bool has_reader = is_terminal_ || is_pipe_ || S_ISSOCK(status.st_mode);
-  may_block_ = has_reader && !platform::make_writes_nonblocking(fd);
+  is_socket_ = S_ISSOCK(status.st_mode);
+  may_block_ = (is_terminal_ || is_pipe_) && !platform::make_writes_nonblocking(fd);
 }
 
 void output::close() {
@@ -112,6 +113,7 @@ std::size_t output::next_piece(const char *upto) const {
 // also when it has some room. Then SIGINT has to come through, and what it cuts off is dropped: how much was
 // written is not known.
 ssize_t output::write_piece(std::size_t size, const sigset_t &unheld) {
+  if (is_socket_) return send(fd_, begin_, size, MSG_DONTWAIT);
   if (!may_block_) return write(fd_, begin_, size);
   wait_for_room(fd_, nullptr, &unheld);
   if (!is_terminal_) return write(fd_, begin_, size);
@@ -128,29 +130,28 @@ ssize_t output::write_piece(std::size_t size, const sigset_t &unheld) {
 
 // Writes the bytes up to `upto`, lines_end_ or end_, and moves what follows to the buffer's front.
 void output::drain(const char *upto) {
-  int error = 0;
   {
     const interrupt_hold hold;
-    while (begin_ < upto && !error) {
+    while (begin_ < upto && !error_) {
       const ssize_t written = write_piece(next_piece(upto), hold.before());
       if (written > 0) {
         begin_ += written;
       } else if (written == 0) {
-        error = EIO;
+        error_ = EIO;
       } else if (errno == EAGAIN) {
         wait_for_room(fd_, nullptr, &hold.before());
       } else if (errno != EINTR) {
-        error = errno;
+        error_ = errno;
       }
     }
-    if (error) begin_ = end_;
+    if (error_) begin_ = end_;
     const auto rest = static_cast<std::size_t>(end_ - begin_);
     std::memmove(storage_, begin_, rest);
     begin_ = storage_;
     end_ = storage_ + rest;
     lines_end_.store(storage_, std::memory_order_release);
   }
-  if (error) fail(error);
+  if (error_) fail(error_);
 }
 
 // Makes room for a row that goes on after the whole lines are out, if need be in a larger buffer.
@@ -170,27 +171,34 @@ void output::make_room(std::size_t size) {
 }
 
 void output::fail(int error) {
-  if (on_failure_ == failure::ignored) return;
+  if (on_failure_ == failure::ignored) {
+    error_ = 0;
+    return;
+  }
   if (error == EPIPE) end_by_broken_pipe();
   complain<"write error: %s\n">(strerror(error));
   std::exit(exit_status::output_failed);
 }
 
 int output::abandon() noexcept {
+  signal(SIGPIPE, SIG_IGN);  // who interrupts is told nothing of a reader that has gone
   if (write_is_open_) return 0;
+  if (error_) return error_ == EPIPE ? 0 : error_;
   const std::int64_t deadline = monotonic_time() + nanoseconds / 10;
   const char *const upto = lines_end_.load(std::memory_order_acquire);
   bool wait = may_block_;
   while (begin_ < upto) {
     const timespec left = time_until(deadline);
     if (wait && !wait_for_room(fd_, &left, nullptr)) return 0;
-    const ssize_t written = write(fd_, begin_, next_piece(upto));
+    const std::size_t size = next_piece(upto);
+    const ssize_t written = is_socket_ ? send(fd_, begin_, size, MSG_DONTWAIT) : write(fd_, begin_, size);
     if (written > 0) {
       begin_ += written;
     } else if (written < 0 && errno == EAGAIN) {
       wait = true;
     } else if (written == 0 || errno != EINTR) {
-      return written == 0 ? EIO : errno;
+      const int error = written == 0 ? EIO : errno;
+      return error == EPIPE ? 0 : error;
     }
   }
   return 0;
@@ -201,5 +209,7 @@ void attach_standard_outputs() {
     if (fcntl(fd, F_GETFD) < 0 && errno == EBADF) open("/dev/null", O_RDONLY);
   }
   report.attach(STDOUT_FILENO);
-  diagnostics.attach(STDERR_FILENO);
+  // The C library writes to standard error too, and would lose what a full pipe does not take at once.
+  const int own = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+  diagnostics.attach(own < 0 ? STDERR_FILENO : own);
 }

@@ -39,7 +39,7 @@ class output {
         storage_(storage.data()),
         on_failure_(on_failure) {}
 
-  // Owns `fd` from here on. Called once, before anything is printed.
+  // Writes to `fd` from here on, and closes it by close(). Nothing may be buffered.
   void attach(int fd);
 
   // Writes what is buffered, then lets the descriptor stand for the open file of `fd`, which it takes over.
@@ -99,6 +99,8 @@ class output {
   failure on_failure_;
   bool is_terminal_ = false;
   bool is_pipe_ = false;
+  bool is_socket_ = false;
+  int error_ = 0;                            // of the write that ends the process
   std::atomic<bool> write_is_open_ = false;  // a write that SIGINT may cut off is going on
   bool may_block_ = false;                   // a pipe, socket or terminal, on whose reader a write can wait
 };
