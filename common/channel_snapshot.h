@@ -48,8 +48,8 @@ class channel_snapshot {
   kernel_table table_;
   std::uint32_t nexus_count_ = 0;
   std::unique_ptr<channel_ref[], c_free> refs_;
-  std::uint32_t ref_count_ = 0;
-  std::uint32_t capacity_ = 0;
+  std::size_t ref_count_ = 0;
+  std::size_t capacity_ = 0;
   mutable uuid_index by_channel_;  // made when it is first asked
 };
 

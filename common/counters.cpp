@@ -1,5 +1,7 @@
 #include "common/counters.h"
 
+#include <iterator>
+
 // IP, of a user-space stack.
 const char *const ip_counter_names[] = {
     "TotalRcvd",  "BadCsum",   "PktTooShort", "DataTooSmall", "BadHdrLen",  "BadLen",      "FragRcvd",
@@ -335,3 +337,10 @@ const char *const flow_switch_counter_names[] = {
     "ChanErrUppAlloc",
     "",
 };
+
+static_assert(std::size(ip_counter_names) == ip_counter_count + 1);
+static_assert(std::size(ip6_counter_names) == ip6_counter_count + 1);
+static_assert(std::size(tcp_counter_names) == tcp_counter_count + 1);
+static_assert(std::size(udp_counter_names) == udp_counter_count + 1);
+static_assert(std::size(net_if_counter_names) == net_if_counter_count + 1);
+static_assert(std::size(flow_switch_counter_names) == flow_switch_counter_count + 1);

@@ -10,7 +10,7 @@
 #include "common/text.h"
 #include "common/uuid.h"
 
-inline constexpr char flow_node_name[] = "kern.tarvel.stats.flow";
+inline constexpr char flow_node[] = "kern.tarvel.stats.flow";
 inline constexpr char flow_adv_node[] = "kern.tarvel.stats.flow_adv";
 inline constexpr char flow_owner_node[] = "kern.tarvel.stats.flow_owner";
 inline constexpr char flow_route_node[] = "kern.tarvel.stats.flow_route";

@@ -12,9 +12,9 @@
 // Reads the kernel variable `name` into a new buffer of exactly the size that the kernel answers.
 //
 // On success stores in `*buffer` a block of the C allocator, which the caller owns, and in `*length` the
-// number of valid bytes in it, which may be fewer than the buffer has; an empty table is a null buffer and
-// length 0. `new_value` and `new_length` are handed to every kernel call as they are: null and 0 for a plain
-// read.
+// number of valid bytes in it, which may be fewer than the buffer has, even none where the table has shrunk.
+// An empty table is a null buffer and length 0. `new_value` and `new_length` are handed to every kernel call
+// as they are: null and 0 for a plain read.
 //
 // A table that grows between the size query and the read (ENOMEM) is asked for again, up to the 11th such
 // failure. Returns 0; 12 (ENOMEM) when the buffer cannot be allocated; otherwise the error number of the

@@ -117,7 +117,7 @@ void object_tree::index_ports() {
 }
 
 int object_tree::scrape_flows() {
-  if (const int error = flows_.fetch(flow_node_name)) return error;
+  if (const int error = flows_.fetch(flow_node)) return error;
   require(flows_.size() % sizeof(tv_stats_flow) == 0,
           {"scrape_flows", "common/mib", 223, "(length % sizeof (*sf)) == 0"});
   // The flows of a channel get numbers in a row, in the order in which the tree is walked.

@@ -88,7 +88,8 @@ class output {
   void fail(int error);
 
   // begin_ <= lines_end_ <= end_ <= limit_. Bytes before begin_ are written, bytes up to lines_end_ are whole
-  // lines. While a write may change begin_, or the buffer moves, SIGINT is held back.
+  // lines. While a write may change begin_, or the buffer moves, SIGINT is held back, but for a terminal that
+  // makes a write wait: write_is_open_ then says that nothing is known of begin_.
   char *begin_;
   char *end_;
   char *limit_;
@@ -102,7 +103,7 @@ class output {
   bool is_socket_ = false;
   int error_ = 0;                            // of the write that ends the process
   std::atomic<bool> write_is_open_ = false;  // a write that SIGINT may cut off is going on
-  bool may_block_ = false;                   // a pipe, socket or terminal, on whose reader a write can wait
+  bool may_block_ = false;                   // a pipe or terminal on whose reader a write waits
 };
 
 // Standard output, or the file that replaces it.

@@ -3,8 +3,8 @@
 //   print<"\tPort[%2u] %-22s (fd %d)\t">(port, name, fd);
 //
 // gives the bytes of printf for the same format. The number and types of the arguments are checked by the
-// compiler; what is left for run time is one check for room and straight-line appends into a buffer. Nothing
-// is allocated and no locale is consulted.
+// compiler; what is left for run time is one check for room and straight-line appends into a buffer. No
+// locale is consulted, and nothing allocated but for a row that is longer than the buffer.
 //
 // Conversions: %d (signed), %u %x %o (unsigned), %c (char), %s (text), %f %g (double) and %%. Flags "-" and
 // "0", width and precision as numbers. 64-bit integers need "ll" or "q", all others must not have it, as in

@@ -11,7 +11,7 @@
 
 inline constexpr char provider_list_node[] = "kern.tarvel.nexus_provider_list";
 
-// What the instances of a provider get. The object tree keeps a copy of exactly this block.
+// What the instances of a provider get.
 struct nexus_provider_parameters {
   static constexpr std::int32_t anonymous = 1;  // a bit of `flags`
 

@@ -16,7 +16,6 @@ class record_walk {
 
   bool at_end() const { return rest_.empty(); }
   const std::byte *position() const { return rest_.data(); }
-  std::size_t remaining() const { return rest_.size(); }
 
   // Copies the record here, which may lie at any address, and steps over it. False where too few bytes
   // remain.

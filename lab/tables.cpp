@@ -23,7 +23,7 @@ constexpr table all_tables[] = {
     {userstack_node, write_userstacks, pids_of_array<tv_stats_userstack, &tv_stats_userstack::pid>},
     {arena_node, write_arenas, pids_of_arenas},
     {netns_node, write_namespaces, nullptr},
-    {flow_node_name, write_flows, pids_of_array<tv_stats_flow, &tv_stats_flow::sf_pid>},
+    {flow_node, write_flows, pids_of_array<tv_stats_flow, &tv_stats_flow::sf_pid>},
 };
 
 }  // namespace

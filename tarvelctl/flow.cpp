@@ -93,7 +93,7 @@ int list_flows() {
   if (!netstat_options.all_flows) netstat_options.numerical = 1;
   forget_scopes();
   kernel_table table;
-  if (const int error = table.fetch(flow_node_name)) return error;
+  if (const int error = table.fetch(flow_node)) return error;
   if (table.empty()) return 0;
 
   print<

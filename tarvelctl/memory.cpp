@@ -44,7 +44,7 @@ void print_separator(char character) {
   print<"%s\n">(line);
 }
 
-// Bytes, as they were and as they are shown.
+// Bytes in all, and those of them that are wired.
 struct memory_size {
   std::uint64_t total = 0;
   std::uint64_t wired = 0;

@@ -24,11 +24,8 @@ void print_provider(const nexus_provider_record &record, std::span<const std::by
     print<"\trings: tx %d rx %d slots: tx %d rx %d bufsize %d metasize %d mhints %d\n">(
         p.tx_rings, p.rx_rings, p.tx_slots, p.rx_slots, p.buf_size, p.meta_size, p.mhints);
   }
-  for (record_walk walk(instances); !walk.at_end();) {
-    uuid instance;
-    walk.take(instance);
-    print<"\tinstance %s\n">(instance);
-  }
+  record_walk walk(instances);
+  for (uuid instance; walk.take(instance);) print<"\tinstance %s\n">(instance);
 }
 
 }  // namespace

@@ -7,13 +7,13 @@
 void region_set::add(const tv_stats_region &region) {
   if (by_uuid_.find(region.region_uuid) != uuid_index::none) return;
   if (count_ == capacity_) grow();
-  by_uuid_.add(region.region_uuid, count_);
+  by_uuid_.add(region.region_uuid, static_cast<std::uint32_t>(count_));
   items_[count_++] = {region.region_uuid, static_cast<std::uint32_t>(region.type), region.mem_total,
                       region.mem_wired};
 }
 
 void region_set::grow() {
-  constexpr std::uint32_t first_capacity = 1024;
+  constexpr std::size_t first_capacity = 1024;
   capacity_ = capacity_ ? 2 * capacity_ : first_capacity;
   void *const grown = std::realloc(items_.get(), capacity_ * sizeof(item));
   if (!grown) {

@@ -31,8 +31,8 @@ class region_set {
   void grow();
 
   std::unique_ptr<item[], c_free> items_;
-  std::uint32_t count_ = 0;
-  std::uint32_t capacity_ = 0;
+  std::size_t count_ = 0;
+  std::size_t capacity_ = 0;
   uuid_index by_uuid_;
 };
 

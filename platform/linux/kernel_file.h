@@ -1,8 +1,8 @@
 // Files that stand for the kernel's own, on Linux.
 //
 // The environment variable TARVEL_ROOT puts a directory in front of every path, so that a simulated or
-// captured kernel can be looked at. Once it is set nothing falls back to the live machine. It is ignored
-// where the process runs with more rights than its caller.
+// captured kernel can be looked at. Once it is set, and not empty, nothing falls back to the live machine. It
+// is ignored where the process runs with more rights than its caller.
 
 #ifndef TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
 #define TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
