@@ -9,10 +9,11 @@
 #include <termios.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <ostream>
-#include <regex>
 #include <sstream>
+#include <string_view>
 #include <utility>
 
 namespace {
@@ -143,8 +144,16 @@ std::size_t count_of(const std::string &text, const std::string &part) {
 }
 
 std::string hide_times(const std::string &text) {
-  static const std::regex time(R"(\d{4}-\d\d-\d\d \d\d:\d\d:\d\d)");
-  return std::regex_replace(text, time, "<time>");
+  static constexpr std::string_view form = "dddd-dd-dd dd:dd:dd";
+  const auto is_time = [&text](std::size_t at) {
+    return std::equal(form.begin(), form.end(), text.begin() + static_cast<std::ptrdiff_t>(at),
+                      [](char f, char c) { return f == 'd' ? c >= '0' && c <= '9' : c == f; });
+  };
+  std::string hidden = text;
+  for (std::size_t at = text.size(); at-- > 0;) {
+    if (at + form.size() <= text.size() && is_time(at)) hidden.replace(at, form.size(), "<time>");
+  }
+  return hidden;
 }
 
 std::function<void(const running &)> interrupt_after(std::size_t times, const std::string &text) {
