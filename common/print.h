@@ -29,81 +29,9 @@
 #include <type_traits>
 #include <utility>
 
+#include "common/format_text.h"
+
 namespace format {
-
-// A format text as a template argument.
-template <std::size_t N>
-struct text {
-  char chars[N];
-  consteval text(const char (&source)[N]) { std::copy_n(source, N, chars); }
-};
-
-inline constexpr std::size_t no_precision = SIZE_MAX;
-
-// One conversion, with the literal text in front of it.
-struct piece {
-  std::size_t literal = 0;  // offset into parsed_text::literals
-  std::size_t literal_size = 0;
-  std::size_t width = 0;
-  std::size_t precision = no_precision;
-  char kind = 0;  // the conversion's letter; 0 for the literal text after the last one
-  bool left = false;
-  bool zero = false;
-  bool wide = false;  // "ll" or "q": a 64-bit argument
-};
-
-template <std::size_t N>
-struct parsed_text {
-  std::array<char, N> literals{};  // all literal text, with %% reduced to %
-  std::size_t literals_size = 0;
-  std::array<piece, N> pieces{};  // one per conversion, then the tail
-  std::size_t conversions = 0;
-};
-
-// Never defined: a call to it while a format is read stops the compiler here, with the reason in the call.
-void malformed_format(const char *reason);
-
-template <std::size_t N>
-consteval parsed_text<N> parse(const text<N> &format) {
-  parsed_text<N> parsed;
-  piece current;
-  const char *at = format.chars;
-  const auto number = [&at] {
-    std::size_t value = 0;
-    while (*at >= '0' && *at <= '9') value = value * 10 + static_cast<std::size_t>(*at++ - '0');
-    return value;
-  };
-  while (*at) {
-    if (*at != '%' || *++at == '%') {
-      parsed.literals[parsed.literals_size++] = *at++;
-      ++current.literal_size;
-      continue;
-    }
-    for (; *at == '-' || *at == '0'; ++at) (*at == '-' ? current.left : current.zero) = true;
-    current.width = number();
-    if (*at == '.') {
-      ++at;
-      current.precision = number();
-    }
-    if (*at == 'q') {
-      current.wide = true;
-      ++at;
-    } else if (*at == 'l') {
-      if (*++at != 'l') malformed_format("a single l is not portable");
-      current.wide = true;
-      ++at;
-    }
-    if (*at == 0 || std::string_view("duxocsfg").find(*at) == std::string_view::npos) {
-      malformed_format("unknown conversion");
-    }
-    current.kind = *at++;
-    parsed.pieces[parsed.conversions++] = current;
-    current = {};
-    current.literal = parsed.literals_size;
-  }
-  parsed.pieces[parsed.conversions] = current;
-  return parsed;
-}
 
 // A text to print. `data` need not be terminated.
 struct text_view {
@@ -412,11 +340,19 @@ struct scratch {
 
 template <text F>
 consteval bool texts_are_bounded() {
-  return std::all_of(parsed<F>.pieces.begin(), parsed<F>.pieces.end(),
-                     [](const piece &p) { return p.kind != 's' || p.precision < 64; });
+  return std::all_of(parsed<F>.pieces.begin(), parsed<F>.pieces.end(), [](const piece &p) {
+    return p.width <= double_size && (p.kind != 's' || p.precision < 64);
+  });
 }
 
-// A text of at most `Capacity` - 1 bytes; what does not fit is cut. Texts in it have a precision.
+template <class T>
+bool is_foreign(const T &argument) {
+  if constexpr (requires { argument.foreign; }) return argument.foreign;
+  return false;
+}
+
+// A text of at most `Capacity` - 1 bytes; what does not fit is cut. Texts in it have a precision. It is
+// foreign if one of them is.
 template <text F, std::size_t Capacity, class... Args>
 small_text<Capacity> text_of(const Args &...args) {
   static_assert(texts_are_bounded<F>(), "%s needs a precision here");
@@ -425,6 +361,7 @@ small_text<Capacity> text_of(const Args &...args) {
   small_text<Capacity> result;
   result.size = std::min(static_cast<std::size_t>(all.end - all.chars), Capacity - 1);
   std::memcpy(result.chars, all.chars, result.size);
+  result.foreign = (false || ... || is_foreign(prepare(args)));
   return result;
 }
 
