@@ -75,7 +75,8 @@ class object_tree {
   }
 
   // The first node with this UUID in depth-first pre-order, or no_object. Flows are not searched. The cost
-  // does not depend on the size of the tree.
+  // does not depend on the size of the tree; where many nodes have one UUID it grows with the logarithm of
+  // their number.
   object_id find_object(const uuid &key);
 
   // Prints a node and all below it as nested JSON objects, without a line end behind the last brace.

@@ -109,18 +109,21 @@ std::size_t output::next_piece(const char *upto) const {
   return last ? static_cast<std::size_t>(last + 1 - begin_) : PIPE_BUF;
 }
 
+// One write of at most `size` bytes. A socket cannot be opened anew, but told not to wait each time.
+ssize_t output::write_once(std::size_t size) const {
+  return is_socket_ ? send(fd_, begin_, size, MSG_DONTWAIT) : write(fd_, begin_, size);
+}
+
 // Writes at most `size` bytes, waiting for room where writing cannot be told not to wait. A terminal may wait
 // also when it has some room. Then SIGINT has to come through, and what it cuts off is dropped: how much was
 // written is not known.
 ssize_t output::write_piece(std::size_t size, const sigset_t &unheld) {
-  if (is_socket_) return send(fd_, begin_, size, MSG_DONTWAIT);
-  if (!may_block_) return write(fd_, begin_, size);
-  wait_for_room(fd_, nullptr, &unheld);
-  if (!is_terminal_) return write(fd_, begin_, size);
+  if (may_block_) wait_for_room(fd_, nullptr, &unheld);
+  if (!may_block_ || !is_terminal_) return write_once(size);
   write_is_open_ = true;
   sigset_t held;
   sigprocmask(SIG_SETMASK, &unheld, &held);
-  const ssize_t written = write(fd_, begin_, size);
+  const ssize_t written = write_once(size);
   const int error = errno;
   sigprocmask(SIG_SETMASK, &held, nullptr);
   errno = error;
@@ -190,8 +193,7 @@ int output::abandon() noexcept {
   while (begin_ < upto) {
     const timespec left = time_until(deadline);
     if (wait && !wait_for_room(fd_, &left, nullptr)) return 0;
-    const std::size_t size = next_piece(upto);
-    const ssize_t written = is_socket_ ? send(fd_, begin_, size, MSG_DONTWAIT) : write(fd_, begin_, size);
+    const ssize_t written = write_once(next_piece(upto));
     if (written > 0) {
       begin_ += written;
     } else if (written < 0 && errno == EAGAIN) {

@@ -82,6 +82,7 @@ class output {
   static constexpr std::ptrdiff_t flush_size = 32 * 1024;
 
   std::size_t next_piece(const char *upto) const;
+  ssize_t write_once(std::size_t size) const;
   ssize_t write_piece(std::size_t size, const sigset_t &unheld);
   void make_room(std::size_t size);
   void drain(const char *upto);
