@@ -3,8 +3,8 @@
 
 cd "$(dirname "${BASH_SOURCE[0]}")/.." || exit
 
-build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase python3 clang
-  libclang-rt-14-dev)
+build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase python3)
+fuzz_packages=(clang-14 libclang-rt-14-dev)
 lint_packages=(clang-format clang-tidy shellcheck)
 
 # Installs those of the named Debian packages that are missing. Silent when none is, and on systems whose packages
