@@ -12,7 +12,8 @@ extern "C" {
 // Without a buffer (`old_value` null) stores in `*old_length` the number of bytes that the variable holds
 // now. With one, `*old_length` is its size on entry and the number of bytes delivered on success; nothing is
 // ever written past it. Each call is a snapshot of its own: the variable may grow, shrink or vanish in
-// between.
+// between. Only where a variable of one byte is read several times in a row, and is a file that someone
+// replaces meanwhile, the old file may answer.
 //
 // Returns 0, or -1 with the reason in errno:
 //   ENOENT   there is no such variable

@@ -102,6 +102,27 @@ TEST_F(sysctl_test, WhatIsNoReadableFileIsRefused) {
   EXPECT_EQ(closed.first, EACCES);
 }
 
+TEST_F(sysctl_test, SwitchThatIsAskedForAgainAnswersAnew) {
+  kernel.table("kern.one", "1").table("kern.two", "2");
+  for (const std::string value : {"a", "b", "c"}) {
+    write_file(kernel.table_path("kern.one"), value);
+    EXPECT_EQ(read("kern.one", 1), (answer{0, 1}));
+    EXPECT_EQ(data, value);
+    EXPECT_EQ(read("kern.two", 1), (answer{0, 1}));
+    EXPECT_EQ(data, "2");
+  }
+  kernel.table("kern.two", "3");
+  EXPECT_EQ(measure("kern.one"), (answer{0, 1}));
+  EXPECT_EQ(read("kern.two", 1), (answer{0, 1}));
+  EXPECT_EQ(data, "3");
+  kernel.table("kern.two", "too long");
+  EXPECT_EQ(read("kern.one", 1), (answer{0, 1}));
+  EXPECT_EQ(read("kern.two", 1).first, ENOMEM);
+  remove(kernel.table_path("kern.two"));
+  EXPECT_EQ(read("kern.two", 1).first, ENOENT);
+  EXPECT_EQ(read("kern.two", 1).first, ENOENT);
+}
+
 TEST_F(sysctl_test, NewValueIsEPERM) {
   kernel.table(node, "x");
   std::size_t length = 0;

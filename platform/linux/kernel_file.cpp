@@ -54,10 +54,11 @@ kernel_file::~kernel_file() {
 long kernel_file::read(void *to, std::size_t size) {
   std::size_t done = 0;
   while (done < size) {
-    const ssize_t got = ::read(fd_, static_cast<char *>(to) + done, size - done);
+    const ssize_t got = pread(fd_, static_cast<char *>(to) + done, size - done, offset_);
     if (got == 0) break;
     if (got > 0) {
       done += static_cast<std::size_t>(got);
+      offset_ += got;
     } else if (errno != EINTR) {
       return -1;
     }

@@ -7,6 +7,8 @@
 #ifndef TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
 #define TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
 
+#include <sys/types.h>
+
 #include <cstddef>
 #include <string_view>
 
@@ -32,8 +34,12 @@ class kernel_file {
   // Reads on until `size` bytes are there or the file ends. Returns the number read, or -1 with errno set.
   long read(void *to, std::size_t size);
 
+  // Lets the next read begin at the front again, where the kernel then says what holds now.
+  void rewind() { offset_ = 0; }
+
  private:
   int fd_ = -1;
+  off_t offset_ = 0;
   std::size_t stated_size_ = 0;
 };
 
