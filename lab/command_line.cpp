@@ -1,6 +1,7 @@
 #include "lab/command_line.h"
 
 #include <charconv>
+#include <cmath>
 #include <string_view>
 
 #include "common/output.h"
@@ -41,15 +42,17 @@ struct command {
   bool makes_world;  // takes sizes and a seed
   bool moves_world;  // takes an interval
   bool runs_command;
+  bool captures;  // takes the times of moments and a wish to redact
 };
 
 constexpr command commands[] = {
-    {"generate", "DIR [sizes] [--seed N]", "make one snapshot", generate, true, true, false, false},
+    {"generate", "DIR [sizes] [--seed N]", "make one snapshot", generate, true, true, false, false, false},
     {"simulate", "DIR [sizes] [--seed N] [--interval MS]", "make one and keep it moving until interrupted",
-     simulate, true, true, true, false},
+     simulate, true, true, true, false, false},
     {"run", "[DIR | [sizes] [--seed N] [--interval MS]] -- COMMAND...",
-     "run COMMAND on DIR, or on a simulation of its own", run, false, true, true, true},
-    {"capture", "DIR", "save the tables of the kernel in sight", capture, true, false, false, false},
+     "run COMMAND on DIR, or on a simulation of its own", run, false, true, true, true, false},
+    {"capture", "DIR [--every SECONDS --count N] [--redact]",
+     "save the tables of the kernel in sight, once or N times", capture, true, false, false, false, true},
 };
 
 int usage() {
@@ -69,10 +72,25 @@ bool parse_number(const char *text, Number least, Number most, Number &number) {
   return error == std::errc() && end == view.data() + view.size() && number >= least && number <= most;
 }
 
+// Seconds, with decimals or without, in milliseconds.
+bool parse_seconds(const char *text, std::uint32_t least, std::uint32_t most, std::uint32_t &milliseconds) {
+  const std::string_view view = text ? text : "";
+  double seconds = 0;
+  const auto [end, error] =
+      std::from_chars(view.data(), view.data() + view.size(), seconds, std::chars_format::fixed);
+  if (error != std::errc() || end != view.data() + view.size()) return false;
+  // In this order a number that is none is refused.
+  if (!(seconds * 1000 >= least && seconds * 1000 <= most)) return false;
+  milliseconds = static_cast<std::uint32_t>(std::lround(seconds * 1000));
+  return true;
+}
+
 // Takes one option with its value. False where the command does not know it or the value is no such number.
 bool take_option(const command &row, std::string_view name, const char *value, options &asked) {
   if (name == "--seed")
     return row.makes_world && parse_number<std::uint64_t>(value, 0, UINT64_MAX, asked.seed);
+  if (name == "--every") return row.captures && parse_seconds(value, 10, 3'600'000, asked.every);
+  if (name == "--count") return row.captures && parse_number(value, 1U, most_records, asked.count);
   for (const number_option &known : number_options) {
     if (known.name != name) continue;
     if (known.size ? !row.makes_world : !row.moves_world) return false;
@@ -89,7 +107,9 @@ bool parse(const command &row, char **argument, options &asked) {
       asked.command = argument + 1;
       break;
     }
-    if (word.starts_with("--")) {
+    if (word == "--redact" && row.captures) {
+      asked.redact = true;
+    } else if (word.starts_with("--")) {
       if (!take_option(row, word, argument[1], asked)) return false;
       shaped = true;
       ++argument;
@@ -100,7 +120,7 @@ bool parse(const command &row, char **argument, options &asked) {
     }
   }
   if (row.needs_directory && asked.directory.empty()) return false;
-  if (!row.runs_command) return true;
+  if (!row.runs_command) return asked.count == 1 || asked.every;
   // A directory is there already: nothing is left to choose about it.
   return asked.command && *asked.command && !(shaped && !asked.directory.empty());
 }

@@ -15,8 +15,11 @@ struct options {
   sizes size;
   std::uint64_t seed = 1;
   std::uint32_t interval = 1000;  // milliseconds between two snapshots
-  std::string directory;          // empty: none given
-  char **command = nullptr;       // what stands behind "--", ended by a null entry
+  std::uint32_t every = 0;        // milliseconds between two captured moments
+  std::uint32_t count = 1;        // captured moments
+  bool redact = false;
+  std::string directory;     // empty: none given
+  char **command = nullptr;  // what stands behind "--", ended by a null entry
 };
 
 // Runs the command line. Returns the exit status: 0, 64 after a usage error, 1 after a failure, or, for

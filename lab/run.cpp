@@ -1,7 +1,7 @@
-// run: a command on a kernel of its own.
+// run: a command on a kernel of its own, or on a captured one.
 //
-// The simulation is a child in a process group of its own, so that what a terminal sends to the group of the
-// command leaves it alone. It ends with this process, however that ends.
+// What moves the kernel is a child in a process group of its own, so that what a terminal sends to the group
+// of the command leaves it alone. It ends with this process, however that ends.
 
 #include <signal.h>
 #include <sys/prctl.h>
@@ -11,13 +11,17 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <string_view>
 #include <system_error>
+#include <vector>
 
 #include "common/output.h"
+#include "lab/capture_directory.h"
+#include "lab/clock.h"
 #include "lab/command_line.h"
 #include "lab/root_directory.h"
 #include "lab/simulation.h"
@@ -59,23 +63,22 @@ class temporary_directory {
   std::string path_;
 };
 
-// A child process that simulates a kernel, from its first snapshot on. Ends with its owner.
-class simulator {
+// A child process that keeps the kernel in a temporary directory moving. Ends with its owner.
+class mover {
  public:
-  simulator() = default;
-  ~simulator() {
+  mover() = default;
+  ~mover() {
     if (pid_ <= 0) return;
     kill(pid_, SIGKILL);
     waitpid(pid_, nullptr, 0);
   }
-  simulator(const simulator &) = delete;
-  simulator &operator=(const simulator &) = delete;
+  mover(const mover &) = delete;
+  mover &operator=(const mover &) = delete;
 
-  // False, with a message, where the first snapshot cannot be made.
-  bool start(const options &asked, const temporary_directory &directory) {
-    root_directory root(directory.path());
-    world state = make_world(asked.size, asked.seed);
-    if (!root.prepare(0700) || !root.publish(state)) return false;
+  // `move` is to go on until a signal in the set that it is given, which is blocked, arrives. False, with a
+  // message, where there can be no child.
+  template <class Move>
+  bool start(const temporary_directory &directory, Move move) {
     const pid_t owner = getpid();
     pid_ = fork();
     if (pid_ < 0) return complain_about("fork", errno);
@@ -85,8 +88,8 @@ class simulator {
     sigset_t stop;
     sigemptyset(&stop);
     sigaddset(&stop, SIGTERM);
-    if (getppid() == owner) keep_moving(state, root, asked.interval, stop);
-    // The owner stops its simulator in a harder way: here it is gone, and its directory left behind.
+    if (getppid() == owner) move(stop);
+    // The owner stops its child in a harder way: here it is gone, and its directory left behind.
     if (getppid() != owner) directory.remove();
     _exit(EXIT_SUCCESS);
   }
@@ -94,6 +97,40 @@ class simulator {
  private:
   pid_t pid_ = -1;
 };
+
+// Makes a world in the directory and keeps it moving.
+bool start_simulation(const options &asked, const temporary_directory &directory, mover &kernel) {
+  root_directory root(directory.path());
+  world state = make_world(asked.size, asked.seed);
+  if (!root.prepare(0700) || !root.publish(state)) return false;
+  return kernel.start(directory,
+                      [&](const sigset_t &stop) { keep_moving(state, root, asked.interval, stop); });
+}
+
+// Puts a moment of a capture into the place of the one before, all of it at once: the files stay where they
+// are.
+bool show(const std::string &moment, const temporary_directory &directory) {
+  const std::string place = directory.path() + "/proc";
+  const std::string next = directory.path() + "/.proc";
+  if (symlink((moment + "/proc").c_str(), next.c_str()) != 0) return complain_about(next, errno);
+  return std::rename(next.c_str(), place.c_str()) == 0 || complain_about(place, errno);
+}
+
+// Shows the first moment and then the others, at the pace at which they were taken. All come a little earlier
+// after the first than they did, a quarter of the first interval: a watch that starts with the command and
+// has their interval reads each once, in the quarters that are left, though it comes later from read to read.
+bool start_replay(const std::string &first, const std::vector<captured_moment> &later,
+                  const temporary_directory &directory, mover &kernel) {
+  if (!show(first, directory)) return false;
+  const std::int64_t began = monotonic_milliseconds() - later[0].offset / 4;
+  return kernel.start(directory, [&](const sigset_t &stop) {
+    for (const captured_moment &moment : later) {
+      if (stopped_before(began + moment.offset, stop) || !show(moment.path, directory)) return;
+    }
+    int signal;
+    sigwait(&stop, &signal);
+  });
+}
 
 // Where a program of this name stands beside this one; otherwise empty.
 std::string beside_this_program(const char *name) {
@@ -180,18 +217,23 @@ int run(const options &asked) {
   sigprocmask(SIG_BLOCK, &signals, &before);
   signal(SIGCHLD, SIG_DFL);  // a caller that ignores it would take the command's status with it
 
+  std::string given;
+  std::vector<captured_moment> later;
   if (!asked.directory.empty()) {
     std::error_code error;
-    const std::filesystem::path root = std::filesystem::canonical(asked.directory, error);
-    if (!error) return end_like(run_command(asked.command, root, signals, before));
-    complain_about(asked.directory, error.value());
-    return EXIT_FAILURE;
+    given = std::filesystem::canonical(asked.directory, error);
+    if (error) complain_about(asked.directory, error.value());
+    if (error || !find_moments(given, later)) return EXIT_FAILURE;
+    if (later.empty()) return end_like(run_command(asked.command, given, signals, before));
   }
   int status;
   {
     const temporary_directory directory;
-    simulator kernel;
-    if (directory.path().empty() || !kernel.start(asked, directory)) return EXIT_FAILURE;
+    if (directory.path().empty()) return EXIT_FAILURE;
+    mover kernel;
+    const bool started = given.empty() ? start_simulation(asked, directory, kernel)
+                                       : start_replay(given, later, directory, kernel);
+    if (!started) return EXIT_FAILURE;
     const int early = early_signal(signals);
     status = early ? W_EXITCODE(0, early) : run_command(asked.command, directory.path(), signals, before);
   }

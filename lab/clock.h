@@ -1,0 +1,24 @@
+// Waiting for moments that do not drift.
+
+#ifndef TARVELCTL_LAB_CLOCK_H
+#define TARVELCTL_LAB_CLOCK_H
+
+#include <signal.h>
+
+#include <cstdint>
+
+namespace lab {
+
+// Milliseconds on a clock that no one sets.
+std::int64_t monotonic_milliseconds();
+
+// The signals that end what goes on by itself, SIGINT and SIGTERM, which it blocks.
+sigset_t block_stop_signals();
+
+// Waits until the clock is at `due`. Returns true, earlier, where one of the signals in `stop`, which must be
+// blocked, arrives.
+bool stopped_before(std::int64_t due, const sigset_t &stop);
+
+}  // namespace lab
+
+#endif
