@@ -120,7 +120,7 @@ bool parse(const command &row, char **argument, options &asked) {
     }
   }
   if (row.needs_directory && asked.directory.empty()) return false;
-  if (!row.runs_command) return asked.count == 1 || asked.every;
+  if (!row.runs_command) return (asked.count == 0) == (asked.every == 0);
   // A directory is there already: nothing is left to choose about it.
   return asked.command && *asked.command && !(shaped && !asked.directory.empty());
 }

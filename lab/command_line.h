@@ -15,8 +15,8 @@ struct options {
   sizes size;
   std::uint64_t seed = 1;
   std::uint32_t interval = 1000;  // milliseconds between two snapshots
-  std::uint32_t every = 0;        // milliseconds between two captured moments
-  std::uint32_t count = 1;        // captured moments
+  std::uint32_t every = 0;        // milliseconds between two captured moments; 0: there is one
+  std::uint32_t count = 0;        // captured moments, where there are several
   bool redact = false;
   std::string directory;     // empty: none given
   char **command = nullptr;  // what stands behind "--", ended by a null entry

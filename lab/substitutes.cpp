@@ -133,16 +133,18 @@ void substitutes::replace_mac(std::uint8_t (&address)[6]) {
 
 std::string substitutes::process(std::string_view name) {
   if (name.empty()) return {};
-  const auto next = static_cast<std::uint32_t>(processes_.size()) + 1;
-  return process_number(
-      processes_.try_emplace(std::string(name.substr(0, known_length)), next).first->second);
+  const auto [known, is_new] = processes_.try_emplace(std::string(name.substr(0, known_length)), used_ + 1);
+  used_ += is_new;
+  const std::uint32_t number = known->second;
+  if (name.size() > known_length) processes_.try_emplace(std::string(name), number);
+  return process_number(number);
 }
 
-// The length of the longest known name that `text` begins with, and what stands for it; 0 where there is
-// none. Behind a name of which only the beginning is known, the rest of the word belongs to it.
+// The length of the longest known name that `text` begins with, and what stands for it; 0 where there is none.
+// Behind a name of which only the beginning is known, the rest of the word belongs to it.
 std::size_t substitutes::process_at(std::string_view text, std::string &substitute) const {
-  for (std::size_t length = std::min(text.size(), known_length); length; --length) {
-    if (length < known_length && !is_boundary(text, length)) continue;
+  for (std::size_t length = text.size(); length; --length) {
+    if (length != known_length && !is_boundary(text, length)) continue;
     const auto known = processes_.find(text.substr(0, length));
     if (known == processes_.end()) continue;
     substitute = process_number(known->second);

@@ -28,8 +28,8 @@ class substitutes {
   // 02:00 and a number. The null and the broadcast address stay.
   void replace_mac(std::uint8_t (&address)[6]);
 
-  // "process" and a number; empty where the name is. A process is known by the first 15 bytes of its name,
-  // which is what some texts have of it.
+  // "process" and a number; empty where the name is. A process is known by the first 15 bytes of its name:
+  // some texts have no more of it.
   std::string process(std::string_view name);
 
   // The text with a substitute for each name seen so far that stands in it by itself, no letter beside it.
@@ -52,7 +52,8 @@ class substitutes {
   numbering ipv4_[ipv4_kinds];
   numbering ipv6_;
   numbering macs_;
-  std::map<std::string, std::uint32_t, std::less<>> processes_;
+  std::map<std::string, std::uint32_t, std::less<>> processes_;  // by what is known of the name, and in full
+  std::uint32_t used_ = 0;                                       // numbers of processes
 };
 
 }  // namespace lab

@@ -13,6 +13,7 @@ namespace {
 
 constexpr table all_tables[] = {
     {provider_list_node, write_providers, nullptr},
+    {arena_node, write_arenas, pids_of_arenas},
     {ring_stat_enable_node, write_ring_stat_enable, nullptr},
     {channel_list_node, write_channels, pids_of_channels},
     {flow_adv_node, write_advisories, pids_of_advisories},
@@ -21,7 +22,6 @@ constexpr table all_tables[] = {
     {net_if_node, write_net_ifs, nullptr},
     {flow_switch_node, write_flow_switches, nullptr},
     {userstack_node, write_userstacks, pids_of_array<tv_stats_userstack, &tv_stats_userstack::pid>},
-    {arena_node, write_arenas, pids_of_arenas},
     {netns_node, write_namespaces, nullptr},
     {flow_node, write_flows, pids_of_array<tv_stats_flow, &tv_stats_flow::sf_pid>},
 };

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Tests of how the lab's tables move, of what `run` leaves behind and of what `capture` saves.
+"""Tests of how the lab's tables move and of what `run` leaves behind.
 
 usage: lab_run_test.py TARVELLAB [unittest options]
 """
@@ -123,42 +123,6 @@ class Run(LabTest):
         process.wait()
         os.kill(int(child), signal.SIGKILL)
         self.wait_for(self.nothing_left)
-
-
-class Capture(LabTest):
-    def capture(self, root, name="saved"):
-        return run("capture", self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)})
-
-    def test_CapturedKernelIsTheSameByteForByte(self):
-        kernel = self.generate()
-        self.assertEqual(self.capture(kernel.root).returncode, 0)
-        made, saved = files(kernel.root), files(self.directory / "saved")
-        mentioned = {f"proc/{pid}/comm" for pid in kernel.pids()}
-        self.assertEqual(saved, {name: made[name] for name in made if "comm" not in name or name in mentioned})
-        self.assertEqual((self.directory / "saved").stat().st_mode & 0o777, 0o700)
-        self.assertEqual(self.capture(kernel.root, "made").returncode, 0)  # onto itself
-        self.assertEqual(files(kernel.root), made)
-
-    def test_MissingTablesAreLeftOut(self):
-        kernel = self.generate()
-        self.capture(kernel.root)
-        (kernel.root / node_dir / "stats/flow").unlink()
-        again = self.capture(kernel.root)
-        self.assertEqual(again.returncode, 0)
-        self.assertIn("kern.tarvel.stats.flow is left out", again.stderr)
-        self.assertEqual(files(self.directory / "saved").keys() & {node_dir + "stats/flow"}, set())
-        self.assertEqual(self.capture(self.directory / "empty").returncode, 1)
-
-    def test_DamagedTablesAreSavedAsTheyAre(self):
-        kernel = self.generate()
-        for name, keep, damage in (("nexus_channel_list", 3000, (16, b"\xff" * 4)), ("nexus_channel_list", 71, (60, b"\xff" * 8)),
-                                   ("stats/flow_adv", 59, (36, b"\xff" * 4)), ("stats/flow", 639, (68, b"\xff" * 4)),
-                                   ("stats/arena", 2607, (0, b"")), ("stats/userstack", 1, (0, b""))):
-            table, (at, value) = kernel.table(name)[:keep], damage
-            table = table[:at] + value + table[at + len(value):]
-            (kernel.root / node_dir / name).write_bytes(table)
-            self.assertEqual(self.capture(kernel.root).returncode, 0)
-            self.assertEqual(Kernel(self.directory / "saved").table(name), table)
 
 
 if __name__ == "__main__":

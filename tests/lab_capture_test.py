@@ -1,0 +1,327 @@
+#!/usr/bin/env python3
+"""Tests of captures: what they save, what they hide, and how they are shown again.
+
+usage: lab_capture_test.py TARVELLAB [unittest options]
+"""
+import ipaddress
+import os
+import pathlib
+import random
+import shutil
+import signal
+import struct
+import subprocess
+import sys
+import time
+import unittest
+
+sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
+from lab_kernel import Kernel, LabTest, files, lab, node_dir, run, text, u32  # noqa: E402
+
+commands = ("channel", "flow -n", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a",
+            "provider -D", "show -n", "tree", "channel-stats -n", "list-providers", "netstat -a -n")
+tarvelctl = pathlib.Path(lab).with_name("tarvelctl")
+
+
+class CaptureTest(LabTest):
+    def capture(self, root, *options, name="saved", status=0):
+        saved = run("capture", *options, self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)})
+        self.assertEqual(saved.returncode, status, saved.stderr)
+        return saved.stderr
+
+    def saved(self, name="saved"):
+        return Kernel(self.directory / name)
+
+    def recapture(self, root, *options):
+        shutil.rmtree(self.directory / "saved", ignore_errors=True)
+        return self.capture(root, *options)
+
+    def write(self, path, content=b""):
+        (self.directory / path).parent.mkdir(parents=True, exist_ok=True)
+        (self.directory / path).write_bytes(content)
+
+
+class Capture(CaptureTest):
+    def test_EveryCommandPrintsTheSameElsewhere(self):
+        kernel = self.generate()
+        named = sorted(kernel.root.glob("proc/*/comm"))
+        for path, name in zip(named, (b"\n", b"a\nb\n", b"\x1b[2J\xff\n", b"fifteen bytes ..", b"")):
+            path.write_bytes(name)
+        named[5].unlink()
+        self.capture(kernel.root)
+        for command in commands:
+            live, elsewhere = (subprocess.run([*map(str, words), *command.split()], capture_output=True, env={**os.environ, "TARVEL_ROOT": root})
+                               for words, root in (([tarvelctl], str(kernel.root)),
+                                                   ([lab, "run", self.directory / "saved", "--", "tarvelctl"], "/")))
+            self.assertEqual((live.stdout, live.stderr, live.returncode), (elsewhere.stdout, elsewhere.stderr, elsewhere.returncode))
+            self.assertGreater(len(live.stdout), 300, command)
+
+    def test_CapturedKernelIsTheSameByteForByteForItsOwnerOnly(self):
+        kernel = self.generate()
+        before = time.strftime("%Y-%m-%dT%H:%M:%SZ", time.gmtime())
+        self.assertIn("holds addresses and process names", self.capture(kernel.root))
+        made, saved = files(kernel.root), files(self.directory / "saved")
+        note = dict(line.split(": ") for line in saved.pop("capture.txt").decode().splitlines())
+        self.assertTrue(before <= note.pop("time") <= time.strftime("%Y-%m-%dT%H:%M:%SZ", time.gmtime()))
+        self.assertEqual(note, {"format": "1", "host": os.uname().nodename, "redacted": "no"})
+        mentioned = {f"proc/{pid}/comm" for pid in kernel.pids()}
+        self.assertEqual(saved, {name: made[name] for name in made if "comm" not in name or name in mentioned})
+        modes = {(p.is_dir(), p.stat().st_mode & 0o777) for p in (self.directory / "saved", *(self.directory / "saved").rglob("*"))}
+        self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
+
+    def test_NothingIsOverwritten(self):
+        kernel = self.generate()
+        made = files(kernel.root)
+        self.assertIn("Directory not empty", self.capture(kernel.root, name="made", status=1))
+        self.assertEqual(files(kernel.root), made)
+        self.write("file")
+        self.assertIn("Not a directory", self.capture(kernel.root, name="file", status=1))
+        (self.directory / "empty").mkdir()
+        self.capture(kernel.root, name="empty")
+
+    def test_MissingTablesAreLeftOut(self):
+        kernel = self.generate()
+        (kernel.root / node_dir / "stats/flow").unlink()
+        self.assertIn("kern.tarvel.stats.flow is left out", self.capture(kernel.root))
+        self.assertEqual(files(self.directory / "saved").keys() & {node_dir + "stats/flow"}, set())
+        self.capture(self.directory / "empty", name="nothing", status=1)
+        self.assertFalse((self.directory / "nothing").exists())
+
+    def test_DamagedTablesAreSavedAsTheyAre(self):
+        kernel = self.generate()
+        for name, keep, damage in (("nexus_channel_list", 3000, (16, b"\xff" * 4)), ("nexus_channel_list", 71, (60, b"\xff" * 8)),
+                                   ("stats/flow_adv", 59, (36, b"\xff" * 4)), ("stats/flow", 639, (68, b"\xff" * 4)),
+                                   ("stats/arena", 2607, (0, b"")), ("stats/userstack", 1, (0, b""))):
+            table, (at, value) = kernel.table(name)[:keep], damage
+            table = table[:at] + value + table[at + len(value):]
+            (kernel.root / node_dir / name).write_bytes(table)
+            self.recapture(kernel.root)
+            self.assertEqual(self.saved().table(name), table)
+
+    def test_WrongArgumentsShowTheUsage(self):
+        for words in ("", "a b", "--redact", "--every 1 a", "--count 2 a", "--seed 1 a", "--every 1 --count 0 a", "--every 1 --count a",
+                      *(f"--every {every} --count 2 a" for every in ("0", "0.009", "3601", "-1", "nan", "inf", "1e1", "1s", ""))):
+            wrong = run("capture", *words.split(" "), cwd=self.directory)
+            self.assertEqual((wrong.returncode, wrong.stderr[:7]), (64, "usage:\n"), words)
+        for command in "generate", "simulate":
+            self.assertEqual(run(command, "--redact", "a").returncode, 64)
+
+
+class Moments(CaptureTest):
+    def moment(self, offset, comm=None, flows=None, channels=None):
+        """Adds a moment to a capture by hand; all else in it is the first's."""
+        root = self.directory / "made" / ("moments/" + offset if offset else "")
+        if offset:
+            shutil.copytree(self.directory / "made/proc", root / "proc")
+        for path, content in (("proc/94/comm", comm), (node_dir + "stats/flow", flows), (node_dir + "nexus_channel_list", channels)):
+            (root / path).unlink(missing_ok=True)
+            if content is not None:
+                (root / path).write_bytes(content)
+
+    def make(self):
+        kernel = self.generate("--flows", 3)
+        (kernel.root / "capture.txt").write_text("format: 1\n")
+        return kernel
+
+    def replay(self, *command, **options):
+        return run("run", self.directory / "made", "--", *command, env={**os.environ, "TMPDIR": str(self.directory)}, **options)
+
+    def test_MomentsAreTakenInTimeUntilInterrupted(self):
+        process, _ = self.start("simulate", self.directory / "made", "--interval", "20")
+        self.capture(self.directory / "made", "--every", ".25", "--count", 4)
+        offsets = [float(p.name) for p in sorted((self.directory / "saved/moments").iterdir())]
+        self.assertEqual(len(offsets), 3)
+        self.assertLess(max(offset % .25 for offset in offsets), .1)
+        for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
+            self.assertGreater(len(list(Kernel(root).channels())), 10)
+            self.assertLessEqual({f"proc/{pid}/comm" for pid in Kernel(root).pids()} - files(root).keys(), {"proc/0/comm"})
+        long = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", self.directory / "long"],
+                                stderr=subprocess.DEVNULL, env={**os.environ, "TARVEL_ROOT": str(self.directory / "made")})
+        self.wait_for(lambda: len(list(self.directory.glob("long/moments/[0-9]*"))) > 2)
+        long.send_signal(signal.SIGINT)
+        self.assertEqual(long.wait(5), 0)
+        self.assertEqual([p for p in files(self.directory / "long") if "/." in p], [])
+        process.kill()
+
+    def test_ACommandSeesEachMomentInItsTime(self):
+        self.make()
+        self.moment("", b"first\n", b"1" * 320)
+        self.moment("0.400", None, b"2" * 640)
+        self.moment("0.800", b"third\n", None)
+        seen = self.replay("sh", "-c", "cd $TARVEL_ROOT/proc/..; i=0; while [ $i -lt 12 ]; do cat proc/94/comm; wc -c <proc/sys/kern/tarvel/stats/flow;"
+                           "sleep 0.1; i=$((i+1)); done 2>/dev/null; ls -A; readlink -f .").stdout.split()
+        self.assertFalse(pathlib.Path(seen.pop()).exists())
+        self.assertEqual(seen.pop(), "proc")
+        views = "first 320", "640", "third"
+        self.assertEqual([view for view in views if view in " ".join(seen)], list(views))
+        self.assertEqual(" ".join(dict.fromkeys(seen)), "first 320 640 third")
+
+    def test_AWatchShowsTheRatesOfThen(self):
+        kernel = self.make()
+        shutil.rmtree(kernel.root / "proc/94")
+        (kernel.root / "proc/94").mkdir()
+        moved = 0
+        for number in range(4):
+            moved += 1000 * number * number
+            ring = struct.pack("<8xQQ", 0, moved).ljust(184, b"\0")
+            self.moment(f"{number}.000" if number else "", channels=b"n" * 16 + struct.pack("<Q", 1) + b"c" * 16
+                        + struct.pack("<6I8x", 0, 94, 1, 0, 1, 0) + ring)
+        watch = self.replay("timeout", "--preserve-status", "-s", "INT", "4.4", tarvelctl, "-w", "1", "channel")
+        self.assertEqual([line.split()[3] for line in watch.stdout.splitlines() if line.startswith("TX[0]")],
+                         ["1.00K", "4.00K", "9.00K", "0.00"])
+
+    def test_OtherFormatsAreRefused(self):
+        kernel = self.make()
+        note = kernel.root / "capture.txt"
+        for content, message in (("format: 2\n", "format 2 is newer than this program, which knows 1"), ("host: a\nformat: 99999999999999999999", "is newer"),
+                                 ("", "does not state"), ("format: 0\n", "does not state"), ("format: -1\n", "does not state"),
+                                 ("format: \x1b[2J\n", "does not state"), ("x" * 10**6 + "\nformat: 1\n", "does not state")):
+            note.write_text(content)
+            seen = self.replay("true")
+            self.assertEqual(seen.returncode, 1, content[:50])
+            self.assertIn(f"{note}: {message}" if "is" not in message else message, seen.stderr)
+        for make in os.mkfifo, os.mkdir, lambda path: os.symlink("/dev/zero", path):
+            note.unlink()
+            make(note)
+            seen = self.replay("true")
+            self.assertEqual((seen.returncode, seen.stderr.count("\n")), (1, 1))
+            note.rmdir() if note.is_dir() else None
+            note.touch()
+
+    def test_WhatIsNoMomentDoesNotCount(self):
+        kernel = self.make()
+        moments = kernel.root / "moments"
+        for name in "1e1.000", "-1.000", "0.000", ".000", "99999999999999999999.000", "9" * 30, "x", ".new", "0.1", "nan.000", "0.1000":
+            shutil.copytree(kernel.root / "proc", moments / name / "proc")
+        (moments / "0.100").symlink_to("/")
+        os.mkfifo(moments / "0.200")
+        self.assertEqual(self.replay("sh", "-c", "echo $TARVEL_ROOT").stdout, f"{kernel.root.resolve()}\n")
+        (moments / "0.010").mkdir()  # without any table
+        self.moment("99999999999.000")  # never comes
+        seen = self.replay("sh", "-c", f"sleep 0.2; {tarvelctl} provider")
+        self.assertIn("No such file or directory", seen.stderr)
+        for path, make in (("nexus_provider_list", os.mkfifo), ("stats/flow", lambda path: os.symlink(path, path)),
+                           ("stats/arena", lambda path: os.truncate(os.open(path, os.O_CREAT | os.O_RDWR), 2**42))):
+            (kernel.root / node_dir / path).unlink()
+            make(kernel.root / node_dir / path)
+        for command in "provider", "flow", "memory":
+            self.assertEqual(self.replay("tarvelctl", command).stdout, "")
+
+
+v4, v6 = (lambda t: ipaddress.ip_address(t).packed), (lambda t: ipaddress.ip_address(t).packed)
+
+
+class Redact(CaptureTest):
+    def redacted(self, tables, message=""):
+        """What becomes of tables, by name."""
+        shutil.rmtree(self.directory / "bare", ignore_errors=True)
+        for name, table in tables.items():
+            self.write(f"bare/{node_dir}{name}", table)
+        errors = self.recapture(self.directory / "bare", "--redact")
+        self.assertIn(message, errors)
+        self.assertNotIn("holds", errors)
+        return {name: self.saved().table(name) for name in tables}
+
+    # Of each format: its size; what no one reads, as (offset, width); fields as (offset, before, after).
+    ends = [(137, 3), (148, 4), (176, 40), (240, 80)]
+    formats = {
+        "stats/flow": (
+            (320, ends + [(88, 16), (116, 16)], [(36, b"browser\0".ljust(32, b"x"), b"process1"), (81, b"\2"), (84, v4("10.0.0.1"), v4("240.0.0.1")),
+                                                 (109, b"\x1e"), (112, v4("10.0.0.2"), v4("240.0.0.2"))]),
+            (320, ends + [(84, 4), (112, 4)], [(36, b"com.example.browser".ljust(32, b"\0"), b"process2"), (81, b"\x1e"),
+                                               (88, v6("2001:db8::7"), v6("3fff::1")), (116, v6("fe80:4::7"), v6("fe80:4::3fff:0:0:2"))]),
+            (320, ends + [(84, 4), (88, 16), (112, 4), (116, 16)], [(36, bytes(32), b""), (81, b"\3")]),
+            (320, ends + [(88, 16), (116, 16)], [(36, b"com.example.bro".ljust(32, b"\0"), b"process2"), (81, b"\2"), (84, v4("10.0.0.2"), v4("240.0.0.2")),
+                                                 (112, v4("127.0.0.9"), v4("127.0.0.9"))])),
+        "stats/flow_route": (
+            (256, [(0, 32), (80, 16), (108, 16), (136, 16), (156, 36), (198, 58)],
+             [(101, b"\2"), (76, bytes(4), bytes(4)), (104, v4("224.0.0.251"), v4("239.0.0.1")), (132, v4("169.254.7.7"), v4("169.254.0.1")),
+              (192, b"\1\2\3\4\5\6", b"\3\0\0\0\0\1")]),
+            (256, [(0, 32), (76, 4), (104, 4), (132, 4), (156, 36), (198, 58)],
+             [(101, b"\x1e"), (80, v6("::1"), v6("::1")), (108, v6("ff02:5::fb"), v6("ff02:5::3fff:0:0:1")), (136, v6("::ffff:10.0.0.1"), v6("::ffff:240.0.0.1")),
+              (192, b"\0" * 6, b"\0" * 6)])),
+        "stats/flow_owner": ((128, [(84, 44)], [(36, b"x" * 32, b"process1")]),),
+        "stats/netns": (
+            (32, [(4, 12), (19, 13)], [(0, v4("10.0.0.7"), v4("240.0.0.1")), (16, b"\4"), (18, b"\0")]),
+            (32, [(19, 13)], [(0, v6("fe80::7"), v6("fe80::3fff:0:0:1")), (16, b"\x10"), (18, b"\1")]),
+            (32, [(12, 4), (20, 12)], []),
+            (32, [(0, 16), (19, 13)], [(16, b"\0"), (18, b"\0")])),
+        "stats/net_if": ((320, [(264, 56)], []),),
+        "stats/flow_switch": ((448, [], []),),
+        "stats/userstack": ((2496, [(36, 12), (392, 8), (2312, 8)], []),),
+        "stats/flow_adv": ((40, [], [(36, b"\1\0\0\0")]), (20, [], [])),
+        "nexus_provider_list": ((264, [(16, 48), (136, 8), (176, 4), (196, 60), (260, 4)], [(256, b"\1\0\0\0")]), (16, [], [])),
+        "nexus_channel_list": ((24, [(20, 4)], [(16, b"\1\0\0\0")]), (48, [(40, 8)], [(32, b"\1\0\0\0\0\0\0\0")]),
+                               (184, [(4, 4), (64, 8), (144, 8), (176, 8)], [])),
+        "ring_stat_enable": ((1, [], []),),
+        "stats/arena": ((2608, [(68, 12)] + [(80 + 208 * i + 168, 8) for i in range(12)], []),),
+    }
+
+    def test_OnlyAddressesAndNamesChangeInEachRecord(self):
+        noise = random.Random(1)
+        for name, records in self.formats.items():
+            before = after = b""
+            for size, unread, fields in records:
+                # Neither NULs nor letters, but in fields: texts fill their width, and no word is a name.
+                record = bytearray(noise.choices([*range(1, 48), *range(128, 256)], k=size))
+                expected = bytearray(record)
+                for at, width in unread:
+                    expected[at:at + width] = bytes(width)
+                for at, value, *substitute in fields:
+                    record[at:at + len(value)] = value
+                    expected[at:at + len(value)] = (substitute or [value])[0].ljust(len(value), b"\0")
+                before, after = before + record, after + expected
+            self.assertEqual(self.redacted({name: before})[name], after, name)
+
+    def test_NamesOfProcessesStandInOtherNamesToo(self):
+        owner = bytes(36) + b"browser".ljust(32, b"\0") + struct.pack("<i", 7) + bytes(56)
+        long = bytes(36) + b"a.long.name.of.all".ljust(32, b"\0") + bytes(60)
+        names = b"browser", b"com.browser.3", b"browsers", b"x-browser94/browser", b"a.long.name.of.all.port", b"a.long.name"
+        shown = b"process1", b"com.process1.3", b"browsers", b"x-process194/process1", b"process2.port", b"a.long.name"
+        arena, provider = bytes(2608), bytes(264)
+        for name, expected in zip(names, shown):
+            seen = self.redacted({"stats/flow_owner": owner + long,
+                                  "stats/arena": name.ljust(80, b"\0") + name.ljust(208, b"\0") + arena[288:],
+                                  "nexus_provider_list": bytes(64) + name.ljust(64, b"\0") + struct.pack("<I", len(name)) + provider[132:]})
+            self.assertEqual([text(seen["stats/arena"], at, 64) for at in (0, 80)], [expected.decode()] * 2)
+            self.assertEqual((text(seen["nexus_provider_list"], 64, 64), u32(seen["nexus_provider_list"], 128)), (expected.decode(), len(expected)))
+
+    def test_WhatCannotBeDecodedIsLeftOut(self):
+        secret = b"secret".ljust(64, b"\0")
+        head, entry = bytes(16) + struct.pack("<Q", 0xffffffff), bytes(32) + struct.pack("<IIQ", 1, 0, 0)
+        for name, table, kept in (("stats/flow", bytes(640) + secret * 4, 640), ("stats/flow_owner", secret, 0), ("stats/flow_route", secret, 0),
+                                  ("stats/arena", secret * 40, 0), ("nexus_channel_list", head + entry + bytes(184) + entry + secret, 24 + 232),
+                                  ("stats/netns", bytes(32) + b"secret".ljust(18, b"\0") + b"\2".ljust(14, b"\0") + secret[:63], 32),
+                                  ("stats/flow_adv", bytes(40) + secret[:36] + b"\xff" * 4 + secret, 40),
+                                  ("nexus_provider_list", secret * 4 + b"\xff" * 8 + secret, 0), ("ring_stat_enable", b"\1secret", 1)):
+            seen = self.redacted({name: table}, f"{name.replace('/', '.')} is cut")
+            self.assertEqual((len(seen[name]), b"secret" in seen[name]), (kept, False), name)
+
+    def test_NoOriginalIsLeftAnywhere(self):
+        process, _ = self.start("simulate", self.directory / "made", "--interval", "50", "--flows", "300", "--seed", "3")
+        errors = self.capture(self.directory / "made", "--redact", "--every", "0.3", "--count", "3")
+        process.kill()
+        self.assertEqual(errors, "")
+        originals, saved = set(), files(self.directory / "saved")
+        made = Kernel(self.directory / "made")
+        for record in made.flows():
+            originals |= {record[at + 8:at + 24] if record[81] == 30 else record[at + 4:at + 8] for at in (80, 108)}
+        for record in made.records("stats/flow_route", 256):
+            originals |= {record[at + 16:at + 24] if record[101] == 30 else record[at + 4:at + 8] for at in (72, 100, 128)} | {record[192:198]}
+        originals |= {head[:head[16]] for head, _ in made.chains("stats/netns", 32, 18, 32) if head[16]}
+        originals = {original for original in originals if any(original[:-1])}  # all but unspecified, and the 1 of fe80::1
+        names = {path.read_bytes().strip() for path in made.root.glob("proc/*/comm")}
+        self.assertGreater(len(originals), 100)
+        self.assertGreater(len(names), 10)
+        self.assertEqual([(path, found) for path, content in saved.items() for found in originals | names if found in content], [])
+        self.assertIn(b"host: redacted\n", saved["capture.txt"])
+        # One process has one name, in every table and moment.
+        for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
+            for flow in Kernel(root).flows():
+                self.assertEqual(text(flow, 36, 32) + "\n", (root / f"proc/{u32(flow, 68)}/comm").read_text())
+            for owner in Kernel(root).records("stats/flow_owner", 128):
+                self.assertEqual(text(owner, 36, 32) + "\n", (root / f"proc/{u32(owner, 68)}/comm").read_text())
+
+
+if __name__ == "__main__":
+    unittest.main()
