@@ -78,6 +78,20 @@ bool understands(const std::string &path, std::string_view note) {
   return false;
 }
 
+// A capture comes from elsewhere: a link would lead out of it, and a device may do something when it is
+// opened.
+bool holds_only_files(const std::string &directory) {
+  std::error_code error;
+  fs::recursive_directory_iterator entry(directory, error);
+  for (; !error && entry != fs::recursive_directory_iterator(); entry.increment(error)) {
+    const fs::file_type type = entry->symlink_status(error).type();
+    if (error || type == fs::file_type::regular || type == fs::file_type::directory) continue;
+    complain<"tarvellab: %s: neither a file nor a directory\n">(foreign_text{entry->path().native()});
+    return false;
+  }
+  return !error || complain_about(directory, error.value());
+}
+
 // The milliseconds in "1.000". False for any other form, and beyond a thousand years.
 bool parse_offset(std::string_view name, std::int64_t &offset) {
   constexpr std::size_t decimals = 3;
@@ -142,15 +156,13 @@ bool find_moments(const std::string &directory, std::vector<captured_moment> &fo
   if (error == ENOENT || error == ENOTDIR) return true;
   if (error) return complain_about(note_of(directory), error);
   if (!understands(note_of(directory), note)) return false;
-  // A link would lead out of the capture.
+  if (!holds_only_files(directory)) return false;
   std::error_code ignored;
-  if (!fs::is_directory(fs::symlink_status(moments_of(directory), ignored))) return true;
   fs::directory_iterator entry(moments_of(directory), ignored);
   for (; entry != fs::directory_iterator(); entry.increment(ignored)) {
     std::int64_t offset = 0;
-    const std::string path = entry->path().string();
-    if (!fs::is_directory(entry->symlink_status(ignored))) continue;
-    if (parse_offset(entry->path().filename().string(), offset)) found.push_back({offset, path});
+    const bool is_moment = parse_offset(entry->path().filename().string(), offset);
+    if (is_moment && entry->is_directory(ignored)) found.push_back({offset, entry->path().string()});
   }
   std::ranges::sort(found, {}, &captured_moment::offset);
   return true;

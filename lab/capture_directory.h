@@ -32,9 +32,9 @@ bool write_note(const std::string &directory, bool redacted);
 std::string moment_in_progress(const std::string &directory);
 bool finish_moment(const std::string &directory, std::int64_t offset);
 
-// Finds the moments of a capture behind the first, in order. There are none where the directory is no
-// capture. False where it is one that this program does not understand. The directory may hold anything:
-// what is no moment does not count.
+// Finds the moments of a capture behind the first, in order; what is no moment does not count. There are none
+// where the directory is no capture. False where it is one of a format that this program does not know, or
+// holds more than files and directories.
 bool find_moments(const std::string &directory, std::vector<captured_moment> &found);
 
 }  // namespace lab

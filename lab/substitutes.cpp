@@ -140,8 +140,8 @@ std::string substitutes::process(std::string_view name) {
   return process_number(number);
 }
 
-// The length of the longest known name that `text` begins with, and what stands for it; 0 where there is none.
-// Behind a name of which only the beginning is known, the rest of the word belongs to it.
+// The length of the longest known name that `text` begins with, and what stands for it; 0 where there is
+// none. Behind a name of which only the beginning is known, the rest of the word belongs to it.
 std::size_t substitutes::process_at(std::string_view text, std::string &substitute) const {
   for (std::size_t length = text.size(); length; --length) {
     if (length != known_length && !is_boundary(text, length)) continue;

@@ -193,19 +193,27 @@ class Moments(CaptureTest):
         moments = kernel.root / "moments"
         for name in "1e1.000", "-1.000", "0.000", ".000", "99999999999999999999.000", "9" * 30, "x", ".new", "0.1", "nan.000", "0.1000":
             shutil.copytree(kernel.root / "proc", moments / name / "proc")
-        (moments / "0.100").symlink_to("/")
-        os.mkfifo(moments / "0.200")
+        (moments / "0.100").touch()
         self.assertEqual(self.replay("sh", "-c", "echo $TARVEL_ROOT").stdout, f"{kernel.root.resolve()}\n")
         (moments / "0.010").mkdir()  # without any table
         self.moment("99999999999.000")  # never comes
-        seen = self.replay("sh", "-c", f"sleep 0.2; {tarvelctl} provider")
-        self.assertIn("No such file or directory", seen.stderr)
-        for path, make in (("nexus_provider_list", os.mkfifo), ("stats/flow", lambda path: os.symlink(path, path)),
-                           ("stats/arena", lambda path: os.truncate(os.open(path, os.O_CREAT | os.O_RDWR), 2**42))):
-            (kernel.root / node_dir / path).unlink()
-            make(kernel.root / node_dir / path)
-        for command in "provider", "flow", "memory":
-            self.assertEqual(self.replay("tarvelctl", command).stdout, "")
+        self.assertIn("No such file or directory", self.replay("sh", "-c", f"sleep 0.2; {tarvelctl} provider").stderr)
+        os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
+        self.assertEqual(self.replay("tarvelctl", "flow").stdout.count("\n"), 0)
+
+    def test_OnlyFilesAreReplayed(self):
+        kernel = self.make()
+        self.moment("0.100")
+        for path in "proc/94/comm", node_dir + "stats/flow", "moments/0.100/proc", "moments", "more":
+            for make in os.mkfifo, lambda path: os.symlink("/etc", path):
+                kept = (kernel.root / path).exists() and (kernel.root / path).rename(self.directory / "kept")
+                make(kernel.root / path)
+                seen = self.replay("echo", "seen")
+                self.assertEqual((seen.returncode, seen.stdout), (1, ""))
+                self.assertIn(f"{path}: neither a file nor a directory\n", seen.stderr)
+                (kernel.root / path).unlink()
+                kept and kept.rename(kernel.root / path)
+        self.assertEqual(self.replay("echo", "seen").stdout, "seen\n")
 
 
 v4, v6 = (lambda t: ipaddress.ip_address(t).packed), (lambda t: ipaddress.ip_address(t).packed)
