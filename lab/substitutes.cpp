@@ -34,7 +34,7 @@ std::uint32_t number_of(const ipv4_address &address) {
 // Writes a number to the last four bytes of an address.
 template <std::size_t Size>
 void put_number(std::uint32_t number, std::uint8_t (&bytes)[Size]) {
-  for (int i = 0; i < 4; ++i) bytes[Size - 1 - i] = static_cast<std::uint8_t>(number >> 8 * i);
+  for (std::size_t i = 0; i < 4; ++i) bytes[Size - 1 - i] = static_cast<std::uint8_t>(number >> 8 * i);
 }
 
 bool stays(std::uint32_t ipv4) {
