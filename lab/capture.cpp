@@ -1,6 +1,7 @@
 // capture: the kernel in sight, as a directory to look at elsewhere, at one moment or at several.
 
 #include <sys/stat.h>
+#include <time.h>
 
 #include <cstdlib>
 #include <filesystem>
@@ -114,6 +115,7 @@ int capture(const options &asked) {
   if (!is_vacant(asked.directory)) return EXIT_FAILURE;
   sigset_t stop{};
   if (asked.count > 1) stop = block_stop_signals();
+  const time_t taken = time(nullptr);
   const std::int64_t began = monotonic_milliseconds();
   substitutes redaction;
   substitutes *const by = asked.redact ? &redaction : nullptr;
@@ -121,7 +123,7 @@ int capture(const options &asked) {
     const snapshot first = fetch();
     if (first.tables.empty() || !save(first, asked.directory, by)) return EXIT_FAILURE;
   }
-  if (!write_note(asked.directory, asked.redact)) return EXIT_FAILURE;
+  if (!write_note(asked.directory, taken, asked.redact)) return EXIT_FAILURE;
   if (!asked.redact) {
     complain<"tarvellab: %s holds addresses and process names; --redact replaces them\n">(asked.directory);
   }

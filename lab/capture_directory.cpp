@@ -92,15 +92,13 @@ bool holds_only_files(const std::string &directory) {
   return !error || complain_about(directory, error.value());
 }
 
-// The milliseconds in "1.000". False for any other form, and beyond a thousand years.
+// The milliseconds in "1.000". False for any other form, and beyond what any capture lasts.
 bool parse_offset(std::string_view name, std::int64_t &offset) {
   constexpr std::size_t decimals = 3;
   constexpr std::size_t most_digits = 11;
   const std::size_t point = name.find('.');
   if (point == 0 || point > most_digits || name.size() != point + 1 + decimals) return false;
-  if (!is_digits(name.substr(0, point)) || !is_digits(name.substr(point + 1))) {
-    return false;
-  }
+  if (!is_digits(name.substr(0, point)) || !is_digits(name.substr(point + 1))) return false;
   std::int64_t seconds = 0;
   std::from_chars(name.data(), name.data() + point, seconds);
   std::from_chars(name.data() + point + 1, name.data() + name.size(), offset);
@@ -124,11 +122,10 @@ bool is_vacant(const std::string &directory) {
   return complain_about(directory, error ? error.value() : ENOTEMPTY);
 }
 
-bool write_note(const std::string &directory, bool redacted) {
-  const time_t now = ::time(nullptr);
+bool write_note(const std::string &directory, time_t taken, bool redacted) {
   tm utc;
   char time[32];
-  std::strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", gmtime_r(&now, &utc));
+  std::strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", gmtime_r(&taken, &utc));
   utsname machine{};
   uname(&machine);
   std::string host = redacted ? "redacted" : machine.nodename;

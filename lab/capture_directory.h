@@ -9,6 +9,8 @@
 #ifndef TARVELCTL_LAB_CAPTURE_DIRECTORY_H
 #define TARVELCTL_LAB_CAPTURE_DIRECTORY_H
 
+#include <time.h>
+
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -24,9 +26,9 @@ struct captured_moment {
 // below, returns false after a message on standard error.
 bool is_vacant(const std::string &directory);
 
-// Writes capture.txt, which makes a capture of the directory: now is its time, this machine, unless redacted,
-// its host.
-bool write_note(const std::string &directory, bool redacted);
+// Writes capture.txt, which makes a capture of the directory, with the time of its first moment and, unless
+// redacted, the name of this machine.
+bool write_note(const std::string &directory, time_t taken, bool redacted);
 
 // Where a moment is put together, hidden, and its move to its place when it is complete.
 std::string moment_in_progress(const std::string &directory);
