@@ -118,7 +118,7 @@ void channel_list_print(const channel_snapshot &current, const channel_snapshot 
 }  // namespace
 
 int cmd_channel(int argc, char **argv) {
-  if (getopt_long(argc, argv, "", no_options, nullptr) != -1) {
+  if (getopt_long(argc, argv, short_options_of(cmd_channel), no_options, nullptr) != -1) {
     print_options_usage(no_options, channel_option_flags);
     return exit_status::usage;
   }

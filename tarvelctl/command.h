@@ -27,6 +27,9 @@ struct command_entry {
 // The commands, ended by a row without a name.
 extern const command_entry command_table[];
 
+// The short options that a handler takes, as getopt_long wants them; empty where it takes none.
+const char *short_options_of(command_handler handler);
+
 // What the front end found on the command line. Set before a handler runs, then left alone.
 extern const char *progname;
 extern int refresh_interval;  // seconds; 0: run once

@@ -22,3 +22,21 @@ const command_entry command_table[] = {
     {"netstat", cmd_netstat, 0, nullptr, netstat_long_options, netstat_option_flags},
     {},
 };
+
+namespace {
+
+constexpr struct {
+  command_handler handler;
+  const char *letters;
+} short_options[] = {
+    {cmd_flow, "n"}, {cmd_flow_route, "n"}, {cmd_netns, "ai:p:"}, {cmd_netstat, "ansp:"}, {cmd_provider, "D"},
+};
+
+}  // namespace
+
+const char *short_options_of(command_handler handler) {
+  for (const auto &row : short_options) {
+    if (row.handler == handler) return row.letters;
+  }
+  return "";
+}

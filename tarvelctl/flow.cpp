@@ -108,7 +108,8 @@ int list_flows() {
 }
 
 void take_numerical_option(int argc, char **argv) {
-  for (int result; (result = getopt_long(argc, argv, "n", no_options, nullptr)) != -1;) {
+  const char *letters = short_options_of(cmd_flow);
+  for (int result; (result = getopt_long(argc, argv, letters, no_options, nullptr)) != -1;) {
     if (result == 'n') netstat_options.numerical = 1;
   }
 }

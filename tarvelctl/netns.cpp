@@ -14,6 +14,7 @@
 #include "common/output_helpers.h"
 #include "common/record_walk.h"
 #include "tarvelctl/command.h"
+#include "tarvelctl/protocol_words.h"
 
 const option netns_options[] = {
     {"all", no_argument, nullptr, 'a'},
@@ -60,13 +61,15 @@ void take_address(netns_request &request, const char *text) {
 }
 
 void take_protocol(netns_request &request, std::string_view name) {
-  if (name == "udp") request.protocol = tv_stats_netns::udp;
-  if (name == "tcp") request.protocol = tv_stats_netns::tcp;
+  for (const netns_protocol_word &known : netns_protocols) {
+    if (known.name == name) request.protocol = known.number;
+  }
 }
 
 // False where the option parser found something that it has reported.
 bool take_options(netns_request &request, int argc, char **argv) {
-  for (int result; (result = getopt_long(argc, argv, "ai:p:", netns_options, nullptr)) != -1;) {
+  const char *letters = short_options_of(cmd_netns);
+  for (int result; (result = getopt_long(argc, argv, letters, netns_options, nullptr)) != -1;) {
     switch (result) {
       case 'a':
         request.all = true;

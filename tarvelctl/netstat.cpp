@@ -7,6 +7,7 @@
 #include "common/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
+#include "tarvelctl/protocol_words.h"
 #include "tarvelctl/reports.h"
 
 netstat_settings netstat_options;
@@ -25,14 +26,6 @@ const std::uint32_t netstat_option_flags[13] = {};
 
 namespace {
 
-using setting = int netstat_settings::*;
-
-// A word of the command line and the setting that it turns on.
-struct named_setting {
-  std::string_view name;
-  setting turned_on;
-};
-
 constexpr named_setting long_settings[] = {
     {"global", &netstat_settings::global},         {"flow-adv", &netstat_settings::flow_adv},
     {"flow-owner", &netstat_settings::flow_owner}, {"netif", &netstat_settings::netif},
@@ -40,16 +33,9 @@ constexpr named_setting long_settings[] = {
     {"uuid", &netstat_settings::uuid_filter},      {"show-zeros", &netstat_settings::show_zeros},
 };
 
-constexpr named_setting protocol_settings[] = {
-    {"ip", &netstat_settings::proto_ip},
-    {"ip6", &netstat_settings::proto_ip6},
-    {"tcp", &netstat_settings::proto_tcp},
-    {"udp", &netstat_settings::proto_udp},
-};
-
 // The reports, in the order in which they run.
 constexpr struct {
-  setting selected;
+  int netstat_settings::*selected;
   int (*run)();
 } reports[] = {
     {&netstat_settings::all_flows, list_flows},        {&netstat_settings::proto_stats, cmd_userstack},
@@ -69,7 +55,7 @@ bool turn_on(std::span<const named_setting> settings, std::string_view word) {
 
 bool take_protocol(const char *name) {
   netstat_options.proto_filter = 1;
-  if (turn_on(protocol_settings, name)) return true;
+  if (turn_on(netstat_protocols, name)) return true;
   complain<"Unsupported protocol \"%s\"\n">(name);
   return false;
 }
@@ -85,8 +71,9 @@ bool take_long_option(std::string_view name) {
 // Fills the settings from the command line. False after a message about a bad value. Everything else that the
 // option parser cannot use it has reported itself.
 bool take_options(int argc, char **argv) {
+  const char *letters = short_options_of(cmd_netstat);
   int index = 0;
-  for (int result; (result = getopt_long(argc, argv, "ansp:", netstat_long_options, &index)) != -1;) {
+  for (int result; (result = getopt_long(argc, argv, letters, netstat_long_options, &index)) != -1;) {
     switch (result) {
       case 'a':
         netstat_options.all_flows = 1;
@@ -132,7 +119,7 @@ int cmd_netstat(int argc, char **argv) {
   report.flush();
   if (!take_options(argc, argv)) return -1;
   if (netstat_options.proto_stats && !netstat_options.proto_filter) {
-    for (const named_setting &each : protocol_settings) netstat_options.*each.turned_on = 1;
+    for (const named_setting &each : netstat_protocols) netstat_options.*each.turned_on = 1;
   }
   bool any = false;
   for (const auto &each : reports) {

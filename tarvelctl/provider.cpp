@@ -32,7 +32,8 @@ void print_provider(const nexus_provider_record &record, std::span<const std::by
 
 int cmd_provider(int argc, char **argv) {
   bool details = false;
-  for (int result; (result = getopt_long(argc, argv, "D", provider_options, nullptr)) != -1;) {
+  const char *letters = short_options_of(cmd_provider);
+  for (int result; (result = getopt_long(argc, argv, letters, provider_options, nullptr)) != -1;) {
     if (result != 'D') {
       print_options_usage(provider_options, provider_option_flags);
       return exit_status::usage;

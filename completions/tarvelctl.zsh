@@ -1,0 +1,24 @@
+#compdef tarvelctl
+# Completion of tarvelctl for zsh.
+
+# TABLES
+
+# Offers the live list that the last argument names, in upper case as it is printed.
+_tarvelctl_offer() {
+  local -a uuids=(${(f)"$(_tarvelctl_$argv[-1])"})
+  shift -p
+  compadd -M 'm:{a-f}={A-F}' "$@" -a uuids
+}
+
+local curcontext=$curcontext state line
+local -A opt_args
+local -a globals=('*-f:file:_files' '*-w:seconds: ')
+
+_arguments -C $globals '(-)1: :->command' '(-)*:: :->arguments' && return
+case $state in
+  command) compadd -M 'm:{A-Z}={a-z}' -- ${(ko)specs} ;;
+  arguments)
+    local -a known=(${(Q)${(z)specs[${(L)words[1]}]}})
+    _arguments $globals $known
+    ;;
+esac
