@@ -4,8 +4,9 @@
 cd "$(dirname "${BASH_SOURCE[0]}")/.." || exit
 
 build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase python3)
-fuzz_packages=(clang-14 libclang-rt-14-dev)
-lint_packages=(clang-format clang-tidy shellcheck)
+package_packages=(dpkg-dev file)
+test_packages=(clang-14 libclang-rt-14-dev zsh fish "${package_packages[@]}")
+lint_packages=(clang-format clang-tidy shellcheck mandoc)
 
 # Installs those of the named Debian packages that are missing. Silent when none is, and on systems whose packages
 # have other names.

@@ -1,0 +1,53 @@
+#!/usr/bin/env python3
+"""Makes the Debian package, installs it below an empty directory, shows everything from there, and removes it.
+
+usage: package_test.py CPACK CONFIGURATION SOURCES
+"""
+import os
+import pathlib
+import subprocess
+import sys
+import tempfile
+
+expected = {
+    "bin/tarvelctl", "bin/tarvellab", "share/bash-completion/completions/tarvelctl",
+    "share/doc/tarvelctl/changelog.Debian.gz", "share/doc/tarvelctl/copyright",
+    "share/fish/vendor_completions.d/tarvelctl.fish", "share/man/man1/tarvelctl.1.gz", "share/man/man1/tarvellab.1.gz",
+    "share/man/man5/tarvel-tables.5.gz", "share/zsh/vendor-completions/_tarvelctl",
+}
+cpack, configuration, sources = sys.argv[1:]
+
+
+def run(*words):
+    ended = subprocess.run(words, stdout=subprocess.PIPE, stderr=subprocess.STDOUT, text=True)
+    assert ended.returncode == 0, f"{words}: {ended.returncode}\n{ended.stdout}"
+    return ended.stdout
+
+
+with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
+    scratch = pathlib.Path(scratch)
+    run(cpack, "--config", configuration, "-G", "DEB", "-B", scratch / "made")
+    package, = scratch.glob("made/*.deb")
+    depends = run("dpkg-deb", "--field", package, "Depends")
+    assert "libc6" in depends and "libuuid1" in depends, depends
+
+    # What it depends on is installed elsewhere.
+    root = scratch / "root"
+    for name in "info", "updates":
+        (root / "var/lib/dpkg" / name).mkdir(parents=True)
+    (root / "var/lib/dpkg/status").touch()
+    dpkg = ("dpkg", f"--root={root}", f"--log={scratch}/log", "--force-depends", "--force-not-root")
+    run(*dpkg, "--install", package)
+    installed = {str(path.relative_to(root / "usr")) for path in root.glob("usr/**/*") if not path.is_dir()}
+    assert installed == expected, installed ^ expected
+
+    os.environ.pop("TARVEL_ROOT", None)
+    shown = run(f"{sources}/scripts/demo", root / "usr/bin")
+    for sign in f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14", "Proto Local Address", "LISTENER":
+        assert sign in shown, f"no {sign} in {shown}"
+    page = run("gzip", "-cd", root / "usr/share/man/man1/tarvelctl.1.gz")
+    assert page == pathlib.Path(sources, "docs/tarvelctl.1").read_text()
+
+    run(*dpkg, "--purge", "tarvelctl")
+    left = [path for path in root.iterdir() if path.name != "var"]
+    assert not left, left
