@@ -1,4 +1,4 @@
-# shellcheck shell=bash
+# shellcheck shell=bash disable=SC2154
 # Completion of tarvelctl for bash.
 
 # TABLES
