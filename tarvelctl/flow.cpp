@@ -107,14 +107,13 @@ int list_flows() {
   return 0;
 }
 
-void take_numerical_option(int argc, char **argv) {
-  const char *letters = short_options_of(cmd_flow);
+void take_numerical_option(int argc, char **argv, const char *letters) {
   for (int result; (result = getopt_long(argc, argv, letters, no_options, nullptr)) != -1;) {
     if (result == 'n') netstat_options.numerical = 1;
   }
 }
 
 int cmd_flow(int argc, char **argv) {
-  take_numerical_option(argc, argv);
+  take_numerical_option(argc, argv, short_options_of(cmd_flow));
   return list_flows();
 }

@@ -50,7 +50,7 @@ void print_route(const tv_stats_flow_route &route) {
 }  // namespace
 
 int cmd_flow_route(int argc, char **argv) {
-  take_numerical_option(argc, argv);
+  take_numerical_option(argc, argv, short_options_of(cmd_flow_route));
   forget_scopes();
   kernel_table table;
   if (const int error = table.fetch(flow_route_node)) return error;

@@ -11,8 +11,8 @@ int list_interfaces();
 int list_flow_switches();
 int cmd_userstack();
 
-// The option -n of the flow and route listings, taken from a command's arguments. Any other option is passed
-// over; the option parser has reported it.
-void take_numerical_option(int argc, char **argv);
+// The option -n of the flow and route listings, taken from the arguments of a command with these short
+// options. Any other option is passed over; the option parser has reported it.
+void take_numerical_option(int argc, char **argv, const char *letters);
 
 #endif
