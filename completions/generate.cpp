@@ -1,12 +1,9 @@
-// Writes a completion script: its body, with the program's own tables in place of the line that asks for
-// them.
+// Writes a completion script: its body, with the program's own tables in place of the line "# TABLES".
 //
 // usage: generate_completions bash|zsh|fish BODY, or, for tests, generate_completions words
 
 #include <cstdio>
-#include <cstring>
 #include <fstream>
-#include <iterator>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -71,8 +68,7 @@ struct completed_option {
   }
 };
 
-// The long options of a command, each with its letter if the handler takes it, then the letters without a
-// name.
+// The long options of a command, each with its letter if the handler takes it, then the other letters.
 std::vector<completed_option> options_of(const command_entry &row) {
   std::vector<completed_option> all;
   std::string letters = short_options_of(row.handler);
