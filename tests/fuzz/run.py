@@ -28,8 +28,10 @@ COMMAND_LINES = ["provider -D", "tree 00000000-0000-0000-0000-000000000000", "ne
                  "netns -i global -p udp", "netns --ip=10.0.0.1 --proto tcp", "-w 1 channel", "-f out memory",
                  "flow -n -- -w", "NETSTAT --uuid x --pid 3 --wait 1", "show -w", "list-providers --details -f",
                  "flow-adv", "flow-owner", "flow-route -n", "interface", "flow-switch", "channel-stats extra", "-w x"]
-LONG = {"print": 24_000_000, "arguments": 10_000_000}
-LONG_TABLE = 6_000_000
+# Executions of each target in the long form: fewer where a record fills pages.
+LONG = {"print": 40_000_000, "arguments": 12_000_000,
+        **{name: 3_000_000 if name in ("provider", "channel", "flow", "userstack", "arena") else 6_000_000
+           for name in TABLES}}
 CHUNK = 500_000  # executions of a process, which keeps what it has seen of memory regions and code
 
 
@@ -58,7 +60,7 @@ def execute(target, limits):
     """Returns the executions done, those per second, and what was found."""
     corpus = target.parent / "corpus" / target.name
     kept = pathlib.Path(__file__).parent / "findings" / target.name
-    options = ["-max_len=6000", "-timeout=5", "-rss_limit_mb=1024", "-malloc_limit_mb=64", "-print_final_stats=1",
+    options = ["-max_len=6000", "-timeout=5", "-rss_limit_mb=1024", "-malloc_limit_mb=64", "-entropic=0", "-print_final_stats=1",
                f"-artifact_prefix={target.parent}/finding-{target.name}-"]
     done = subprocess.run([target, *options, *limits, corpus, *([kept] if kept.is_dir() else [])],
                           stderr=subprocess.PIPE, stdout=subprocess.DEVNULL, text=True, errors="replace")
@@ -73,7 +75,7 @@ def fuzz(lab, folder, name, seconds):
     corpus.mkdir(parents=True, exist_ok=True)
     for number, seed in enumerate(seeds(lab, name)):
         (corpus / f"seed-{number}").write_bytes(seed)
-    wanted, runs, slowest, findings = LONG.get(name, LONG_TABLE), 0, None, 0
+    wanted, runs, slowest, findings = LONG[name], 0, None, 0
     while not findings and runs < (1 if seconds else wanted):
         limits = [f"-max_total_time={seconds}"] if seconds else [f"-runs={min(CHUNK, wanted - runs)}"]
         executed, speed, found = execute(target, limits)
@@ -82,6 +84,8 @@ def fuzz(lab, folder, name, seconds):
         if found:
             findings += 1
             print(f"{name}: {found[-4000:]}", flush=True)
+        if not seconds and runs < wanted:
+            print(f"{name}: {runs} runs so far", flush=True)
     print(f"{name}: {runs} runs, {slowest} a second at the slowest, {findings} findings", flush=True)
     return runs, findings
 
