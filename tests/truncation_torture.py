@@ -1,0 +1,207 @@
+#!/usr/bin/env python3
+"""Cuts every table inside its last three records, at every byte in the long form, and reads it with every command.
+
+Each ending is that of a table below: what is said of a cut table, and what is shown of its whole records. What the
+tool shows of whole records alone must be lines of the uncut report, one block for each record; sums are made here.
+"""
+import collections
+import functools
+import pathlib
+import re
+import signal
+import struct
+import sys
+
+sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
+from torture import Torture  # noqa: E402
+
+# A table's record: the size of its head, where the head counts what follows it and how, and the size of that.
+RECORDS = {"nexus_provider_list": (264, 256, "<I", 16), "stats/flow_adv": (40, 36, "<I", 20), "stats/netns": (32, 18, "<B", 32),
+           "stats/flow": (320,), "stats/flow_owner": (128,), "stats/flow_route": (256,), "stats/userstack": (2496,),
+           "stats/net_if": (320,), "stats/flow_switch": (448,), "stats/arena": (2608,), "nexus_channel_list": None}
+
+
+def broken(function, line, expression="scan == (buffer + length)", file="tarvelctl/tarvelctl"):
+    return f"Assertion failed: ({expression}), function {function}, file {file}, line {line}.\n".encode(), -signal.SIGABRT
+
+
+SHORT = b"Buffer too short\n", 0
+SCRAPE = broken("scrape_flows", 223, "(length % sizeof (*sf)) == 0", "common/mib")
+FLOW = broken("cmd_flow", 689, "(length % sizeof (*sf)) == 0")
+ADVISORY, STACK, ARENA = broken("cmd_flow_adv", 766), broken("cmd_userstack", 1038), broken("__memory_arena_stats", 1620)
+OWNER, ROUTE = broken("cmd_flow_owner", 817, "sfo == (buffer + length)"), broken("cmd_flow_route", 933, "sfr == (buffer + length)")
+WIDTH = "(length % width) == 0"
+INTERFACE, SWITCH = broken("cmd_interface", 1073, WIDTH), broken("cmd_flow_switch", 1138, WIDTH)
+
+
+def whole(report):
+    return report
+
+
+def title(report):
+    return report[:report.index(b"\n") + 1]
+
+
+def nothing(_):
+    return b""
+
+
+# Command, its table, how it ends on a cut one, what is shown then, and the line that a record starts with.
+CASES = [(command, *case) for commands, *case in (
+    (("provider", "list-providers -D"), "nexus_provider_list", SHORT, whole, r"\S.* [0-9A-F-]{36}( \[anon\])?$"),
+    (("tree", "show", "channel-stats"), "nexus_provider_list", SHORT, whole, None),
+    (("channel",), "nexus_channel_list", SHORT, lambda _: b"No channels\n", None),
+    (("tree", "show", "channel-stats"), "nexus_channel_list", SHORT, whole, None),
+    (("tree", "show", "channel-stats"), "stats/flow", SCRAPE, nothing, None),
+    (("flow", "netstat -an"), "stats/flow", FLOW, title, r" (tcp|udp)"),
+    (("flow-adv", "netstat --flow-adv"), "stats/flow_adv", ADVISORY, whole, " - "),
+    (("flow-owner", "netstat --flow-owner"), "stats/flow_owner", OWNER, whole, r".*\(\d+\)$"),
+    (("flow-route -n",), "stats/flow_route", ROUTE, whole, "[0-9a-f*]"),
+    (("netstat -s", "netstat -sp ip6 --show-zeros"), "stats/userstack", STACK, whole, " - "),
+    (("netstat -s --global",), "stats/userstack", STACK, whole, None),
+    (("interface", "netstat --netif"), "stats/net_if", INTERFACE, nothing, " - "),
+    (("netstat --netif --global",), "stats/net_if", INTERFACE, nothing, None),
+    (("flow-switch", "netstat --flowswitch"), "stats/flow_switch", SWITCH, nothing, " - "),
+    (("netstat --flowswitch --global",), "stats/flow_switch", SWITCH, nothing, None),
+    (("memory",), "stats/arena", ARENA, whole, ".* arena:  "),
+    (("netns -a",), "stats/netns", SHORT, whole, "(tcp|udp) .*reservations"),
+    (("netns -i global -p tcp", "netns -i LAST"), "stats/netns", SHORT, whole, None)) for command in commands]
+
+
+def walk(name, table):
+    """Where the records end. A channel ends with its rings; one record of groups is a channel, or a group without any."""
+    ends, at, groups = [0], 0, []
+    while at < len(table):
+        if name == "nexus_channel_list":
+            groups.append((at, struct.unpack_from("<I", table, at + 16)[0]))
+            at += 24
+            for _ in range(groups[-1][1]):
+                at += 48 + 184 * sum(struct.unpack_from("<II", table, at + 32))
+                ends.append(at)
+            if groups[-1][1]:
+                continue
+        else:
+            head, *counted = RECORDS[name]
+            at += head + (struct.unpack_from(counted[1], table, at + counted[0])[0] * counted[2] if counted else 0)
+        ends.append(at)
+    assert at == len(table), name
+    return ends, groups
+
+
+def whole_part(name, table, cut):
+    """The table of the whole records before `cut`. The group of channels that is cut counts those it still has."""
+    ends, groups = walk(name, table)
+    end = max(end for end in ends if end <= cut)
+    last = max((at for at, _ in groups if at + 24 <= cut), default=None)
+    if last is None:
+        return table[:end]
+    end = max(end, last + 24)
+    return table[:last + 16] + struct.pack("<I", sum(last + 24 < at <= end for at in ends)) + table[last + 20:end]
+
+
+def orphans(kernel, providers):
+    """What the tree says of flows whose nexus no provider has."""
+    ends, _ = walk("nexus_provider_list", providers)
+    known = {providers[at:at + 16] for start, end in zip(ends, ends[1:]) for at in range(start + 264, end, 16)}
+    flows = kernel.table("stats/flow")
+    return b"orphan flow orphan nx_uuid" * sum(flows[at:at + 16] not in known for at in range(0, len(flows), 320))
+
+
+def sums(name, table):
+    """The counters that are left of all records folded into one, without zeros."""
+    size, blocks = RECORDS[name][0], {"stats/userstack": ((48, 43), (400, 36), (688, 203), (2320, 22)), "stats/net_if": ((32, 29),),
+                                      "stats/flow_switch": ((32, 52),)}[name]
+    parts = [struct.unpack_from(f"<{count}Q", table, at + start) for at in range(0, len(table), size) for start, count in blocks]
+    folded = [sum(column) % 2**64 for block in range(len(blocks)) for column in zip(*parts[block::len(blocks)])]
+    return [value for value in folded if value]
+
+
+def region_sums(table):
+    """Total and wired memory in kilobytes for each of the twelve types, each region counted once."""
+    regions, by_type = {}, collections.Counter()
+    for at in (arena + 80 + 208 * slot for arena in range(0, len(table), 2608) for slot in range(12)):
+        regions.setdefault(table[at + 64:at + 80], struct.unpack_from("<i", table, at + 80) + struct.unpack_from("<QQ", table, at + 152))
+    for kind, total, wired in regions.values():
+        by_type[kind, 0] += total
+        by_type[kind, 1] += wired
+    return [(by_type[kind, 0] >> 10, by_type[kind, 1] >> 10) for kind in range(12)]
+
+
+def rows(report):
+    """The lines of objects, as they are whatever comes behind them."""
+    return [line.rstrip(", ") for line in report.partition("+" * 70)[0].splitlines()
+            if re.search(r"\w", line) and not re.search('"children"|Instances:', line)]
+
+
+def check_whole(torture, kernel, case, table, seen, uncut):
+    """Whether the report of whole records is right."""
+    command, name, _, _, start = case
+    report, all_rows = seen.out.decode(), iter(uncut)
+    records = len(walk(name, table)[0]) - 1
+    said = orphans(kernel, kernel.table("nexus_provider_list")) if command in ("tree", "show", "channel-stats") else b""
+    right = {"ends": (said, 0)}
+    found = {"ends": seen[1:]}
+    if "--global" in command:
+        right["sums"], found["sums"] = sums(name, table), [int(number) for number in re.findall(r": (\d+)$", report, re.MULTILINE)]
+    else:
+        right["strange rows"], found["strange rows"] = [], [row for row in rows(report) if row not in all_rows]
+    if start:
+        right["records"], found["records"] = records, sum(bool(re.match(start, line)) for line in report.splitlines())
+    if command == "memory":
+        right["summary"] = region_sums(table)
+        found["summary"] = [(int(a), int(b)) for a, b in re.findall(r"^ *[A-Z]+: +(\d+) KB +(\d+) KB$", report, re.MULTILINE)]
+    torture.expect(command, f"{records} whole records of {name}", found, right)
+
+
+def cuts(torture, ends):
+    first, last = ends[max(len(ends) - 4, 0)], ends[-1]
+    if torture.long:
+        return range(first + 1, last)
+    near = {end + step for end in ends[-4:] for step in (-17, -1, 0, 1, 15)}
+    return sorted(cut for cut in near | {torture.random.randrange(first, last) for _ in range(8)} if first < cut < last)
+
+
+def last_namespace(table):
+    at = walk("stats/netns", table)[0][-2]
+    address, length = table[at:at + 16], table[at + 16]
+    text = "global" if length == 0 else address_text(address, length)
+    return f"netns -i {text} -p {'udp' if table[at + 17] == 17 else 'tcp'}"
+
+
+def address_text(address, length):
+    return ".".join(map(str, address[:4])) if length == 4 else ":".join(f"{a:02x}{b:02x}" for a, b in zip(address[::2], address[1::2]))
+
+
+def torture_case(torture, kernel, case):
+    command, name, (message, status), shown, _ = case
+    table = kernel.table(name)
+    line = last_namespace(table) if "LAST" in command else command
+    uncut = rows(torture.run(kernel, line).out.decode())
+
+    @functools.cache
+    def run_whole(contents):
+        kernel.put(name, contents)
+        seen = torture.run(kernel, line)
+        check_whole(torture, kernel, case, contents, seen, uncut)
+        return seen
+
+    for cut in cuts(torture, walk(name, table)[0]):
+        expected = run_whole(whole_part(name, table, cut))
+        kernel.put(name, table[:cut])
+        if whole_part(name, table, cut) != table[:cut] and not ("netns -i" in line and expected.out):
+            expected = shown(expected.out), message + expected.err, status
+        torture.faults += 1
+        torture.expect(line, f"{name} cut at {cut} of {len(table)}", tuple(torture.run(kernel, line)), tuple(expected))
+    kernel.put(name, table)
+
+
+def main():
+    torture = Torture("truncation", __doc__)
+    kernel = torture.make_kernel()
+    for case in CASES:
+        torture_case(torture, kernel, case)
+    torture.end()
+
+
+if __name__ == "__main__":
+    main()
