@@ -1,0 +1,116 @@
+#!/usr/bin/env python3
+"""Puts every byte value and what terminals obey into every text, of tables, processes and name services alike.
+
+On a terminal each control character (0 to 31, 127 to 159) shows as "?" and nothing else moves; a pipe and a file get
+the bytes as they are. The expectation is a report in which the same texts are harmless, with the bytes put in.
+"""
+import os
+import pathlib
+import pty
+import re
+import struct
+import subprocess
+import sys
+import tty
+
+sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
+from torture import Torture, walk  # noqa: E402
+
+# Where the texts of a record are, and their widths.
+TEXTS = {"nexus_provider_list": ((64, 64),), "stats/flow": ((16, 16), (36, 32)), "stats/flow_adv": ((16, 16),),
+         "stats/flow_owner": ((16, 16), (36, 32)), "stats/flow_route": ((32, 16),), "stats/userstack": ((16, 16),),
+         "stats/net_if": ((16, 16),), "stats/flow_switch": ((16, 16),),
+         "stats/arena": ((0, 64), *((80 + 208 * slot, 64) for slot in range(12)))}
+# With how many texts on a kernel of one provider, three channels and two flows, at least.
+COMMANDS = {"channel": 3, "flow": 4, "flow-adv": 2, "flow-owner": 2, "flow-route -n": 1, "flow-route": 3, "flow-switch": 1, "interface": 0,
+            "memory": 4, "netstat -a": 8, "netstat -s": 2, "provider -D": 1, "show": 2, "tree": 6}
+SEQUENCES = (b"\x1b[31m", b"\x9b31m", b"\xc2\x9b31m", b"\x1b[2J\x1b[1;1H", b"\x1b[6n", b"\x1b[?1049h", b"\x1b]52;c;QQ==\x07", b"\x9d52;c;QQ\x9c",
+             b"\xc2\x9d52;c;Q\xc2\x9c", b"\x1b]0;t\x07", b"\x1b]2;t\x1b\\", b"\x9d0;t\x9c", b"\x1bP$q\"p\x1b\\", b"\x90$qm\x9c", b"\xc2\x90$qm\xc2\x9c",
+             b"\x1bc", b"\x1b#8", b"\x1bZ", b"\x1b_t\x1b\\", b"\x1b^t\x1b\\", b"\x8e\x8f\x0e\x0f", b"a\r\nb\x85\t\b\x7f", "\u00e4\u20ac\u00c0".encode())
+HARMLESS = b"\xe9"  # no control character, and nowhere else in a report
+
+
+def texts(is_long):
+    """Texts of 16 bytes, of which a process name takes 15."""
+    alphabet = bytes([*range(1, 256), 0])
+    yield from (alphabet[at:at + 15].ljust(15, b".") + b"x" for at in range(0, 256, 15))
+    yield from (sequence.ljust(16, b".") for sequence in SEQUENCES)
+    if is_long:
+        for value in alphabet:
+            yield from (bytes([value]), bytes([value]).ljust(16, b"."), bytes([value]).rjust(15, b"."), bytes([value]) * 16)
+
+
+def fill(kernel, tables, text):
+    """Makes it the text of everything; one of 16 bytes goes on to the end of its field."""
+    for name, places in TEXTS.items():
+        table = bytearray(tables[name])
+        for start in walk(name, tables[name])[0][:-1]:
+            for at, width in places:
+                table[start + at:start + at + width] = (text * (width // 16) if len(text) == 16 else text).ljust(width, b"\0")
+            if name == "nexus_provider_list":
+                struct.pack_into("<I", table, start + 128, 64)
+        kernel.put(name, bytes(table))
+    for name in kernel.root.glob("proc/*/comm"):
+        name.write_bytes(text[:15] + b"\n")
+    kernel.environment["NAME_SERVICES_ANSWER"] = os.fsdecode((text * 3).split(b"\0")[0])
+
+
+def on_terminal(torture, kernel, line):
+    reader, terminal = pty.openpty()
+    tty.setraw(terminal)  # line ends arrive as they were written
+    process = subprocess.Popen([torture.options.tarvelctl, *line.split()], env=kernel.environment, stdout=terminal, stderr=terminal)
+    os.close(terminal)
+    shown = b""
+    try:
+        while got := os.read(reader, 65536):
+            shown += got
+    except OSError:  # how a terminal ends
+        pass
+    os.close(reader)
+    torture.runs += 1
+    return shown, process.wait()
+
+
+def on_pipe(torture, kernel, line):
+    seen = torture.run(kernel, line)
+    return seen.out + seen.err, seen.status
+
+
+def in_file(torture, kernel, line):
+    path = os.path.join(torture.directory.name, "report")
+    seen = torture.run(kernel, f"-f {path} {line}")
+    return pathlib.Path(path).read_bytes() + seen.out + seen.err, seen.status
+
+
+def hidden(text):
+    return bytes(ord("?") if code < 32 or 127 <= code < 160 else code for code in text)
+
+
+def main():
+    torture = Torture("terminal", __doc__)
+    kernel = torture.make_kernel("--providers", 2, "--channels", 6, "--flows", 2, "--arenas", 1, "--processes", 2)
+    kernel.environment.update(torture.name_services())
+    tables = {name: kernel.table(name) for name in TEXTS}
+    sinks = {on_terminal: hidden, on_pipe: bytes, **({in_file: bytes} if torture.long else {})}
+    harmless = {}
+    for text in texts(torture.long):
+        shown = text.split(b"\0")[0]
+        whole = len(text) == 16 and shown == text
+        if (len(shown), whole) not in harmless:
+            fill(kernel, tables, HARMLESS * len(shown))
+            harmless[len(shown), whole] = {(command, sink): sink(torture, kernel, command) for command in COMMANDS for sink in sinks}
+            for command, least in COMMANDS.items():
+                (report, _), (plain, _) = (harmless[len(shown), whole][command, sink] for sink in (on_terminal, on_pipe))
+                torture.expect(command, "a harmless text on a terminal, without colours", re.sub(rb"\x1b\[3?[016]m", b"", report), plain)
+                torture.expect(command, "how many texts there are, at least", min(len(re.findall(HARMLESS + b"+", plain)), least), least if shown else 0)
+        fill(kernel, tables, text)
+        for (command, sink), (report, status) in harmless[len(shown), whole].items():
+            bytes_for = sinks[sink](shown)
+            expected = re.sub(HARMLESS + b"+", lambda run: (bytes_for * 4)[:len(run[0])], report)
+            torture.faults += 1
+            torture.expect(command, f"the text {text!r}, {sink.__name__}", sink(torture, kernel, command), (expected, status))
+    torture.end()
+
+
+if __name__ == "__main__":
+    main()
