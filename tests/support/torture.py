@@ -1,5 +1,6 @@
 """What the torture drivers share: their command line, kernels to damage, runs of the tool, and the account of them."""
 import argparse
+import atexit
 import collections
 import os
 import pathlib
@@ -67,8 +68,21 @@ class Torture:
         self.name, self.options = name, parser.parse_args()
         self.long, self.random = self.options.long, random.Random(self.options.seed)
         self.runs = self.faults = self.findings = 0
+        self.children = []
+        atexit.register(self.end_children)
         self.directory = tempfile.TemporaryDirectory(prefix="torture")
         print(f"seed {self.options.seed}")
+
+    def end_children(self):
+        for child in self.children:
+            if child.poll() is None:
+                child.kill()
+                child.wait()
+
+    def start(self, command, **options):
+        """Starts a program that does not outlive the test."""
+        self.children.append(subprocess.Popen(command, **options))
+        return self.children[-1]
 
     def make_kernel(self, *sizes):
         root = tempfile.mkdtemp(dir=self.directory.name)
