@@ -185,16 +185,4 @@ TEST(memory, SummaryRemembersTheRegionsOfEarlierRuns) {
       << result.out;
 }
 
-TEST(memory, PartialRecordAbortsAfterTheSummary) {
-  const std::string whole = arena("PLCY", 1, {});
-  const std::string whole_report = heading("    PLCY arena:  PLCY\n") + total("0 KB") + summary({}, nothing);
-  const auto aborted = [](const std::string &out) {
-    return inconsistent("__memory_arena_stats", 1620, "scan == (buffer + length)", out);
-  };
-  for (const std::size_t length : {1U, 2607U}) {
-    EXPECT_EQ(report(whole + bytes(length)), aborted(whole_report)) << length;
-    EXPECT_EQ(report(bytes(length)), aborted(summary({}, nothing))) << length;
-  }
-}
-
 }  // namespace

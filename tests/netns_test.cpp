@@ -131,14 +131,4 @@ TEST(netns, FailuresEndWithTheirText) {
   }
 }
 
-TEST(netns, TableThatEndsEarlyKeepsItsWholeRecords) {
-  const std::string last = space(v6, tcp, {{1, 2, 3, 4, 5}, {6, 7, 8, 9, 10}});
-  for (std::size_t length = 1; length < last.size(); ++length) {
-    EXPECT_EQ(report(table + last.substr(0, length), "netns -a"), complained(too_short, 0, all)) << length;
-  }
-  const std::string cut = table + last.substr(0, last.size() - 1);
-  EXPECT_EQ(report(cut, "netns -i fe80::1 -p tcp").out, "");
-  EXPECT_EQ(report(cut, "netns -i fe80::1 -p udp").out, v6_udp);
-}
-
 }  // namespace

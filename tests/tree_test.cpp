@@ -221,15 +221,6 @@ TEST_F(tree, TablesThatAreMissingLeaveTheRest) {
   EXPECT_EQ(run(), complained(missing + "orphan flow orphan nx_uuid", 0, at(0, root)));
 }
 
-TEST_F(tree, PartialFlowAborts) {
-  const run_result aborted =
-      inconsistent("scrape_flows", 223, "(length % sizeof (*sf)) == 0", "", "common/mib");
-  for (const std::size_t length : {319U, 321U}) {
-    kernel.table(flow_list, bytes(length));
-    for (const char *line : {"tree", "show"}) EXPECT_EQ(run(line), aborted) << line << length;
-  }
-}
-
 const std::string shown_a = "flow-switch AAAAAAAA-0000-0000-0000-00000000000A ";
 
 TEST_F(show, ShowsPortsAndFlowsOfMultistackFlowSwitches) {

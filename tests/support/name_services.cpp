@@ -1,5 +1,6 @@
-// Takes the place of the system's name services in a program that loads it first: each host and service has the
-// name that NAME_SERVICES_ANSWER holds, if any, and question number NAME_SERVICES_BLOCK_AT is never answered.
+// Takes the place of the system's name services in a program that loads it first: each host and service has
+// the name that NAME_SERVICES_ANSWER holds, if any, and question number NAME_SERVICES_BLOCK_AT is never
+// answered.
 
 #include <netdb.h>
 #include <poll.h>
