@@ -117,7 +117,7 @@ def cuts(torture, ends):
     first, last = ends[max(len(ends) - 4, 0)], ends[-1]
     if torture.long:
         return range(first + 1, last)
-    near = {end + step for end in ends[-4:] for step in (-1, 0, 1)}
+    near = {end + step for end in ends[-2:] for step in (-1, 0, 1)} | {first + 1}
     return sorted(cut for cut in near | {torture.random.randrange(first, last) for _ in range(4)} if first < cut < last)
 
 
