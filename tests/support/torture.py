@@ -94,10 +94,13 @@ class Torture:
         sanitizer = os.environ.get("ASAN_OPTIONS", "") + ":verify_asan_link_order=0"
         return {"LD_PRELOAD": self.options.name_services, "ASAN_OPTIONS": sanitizer, **answers}
 
-    def run(self, kernel, line, **options):
+    def run(self, kernel, line):
         self.runs += 1
-        done = subprocess.run([self.options.tarvelctl, *line.split()], env=kernel.environment, stdin=subprocess.DEVNULL,
-                              stderr=subprocess.PIPE, timeout=60, **{"stdout": subprocess.PIPE, **options})
+        try:
+            done = subprocess.run([self.options.tarvelctl, *line.split()], env=kernel.environment, stdin=subprocess.DEVNULL,
+                                  capture_output=True, timeout=60)
+        except subprocess.TimeoutExpired:
+            return Result(b"", b"", "does not end")
         return Result(done.stdout, done.stderr, done.returncode)
 
     def expect(self, command, fault, seen, expected):
@@ -105,15 +108,13 @@ class Torture:
         if seen == expected:
             return
         self.findings += 1
+        texts = repr(expected), repr(seen)
+        at = max(len(os.path.commonprefix(texts)) - 300, 0)
         if self.findings <= 20:
-            print(f"{command}: {fault}\n  expected {shortened(expected)}\n  seen     {shortened(seen)}", flush=True)
+            expected, seen = (text[at:at + 1500] for text in texts)
+            print(f"{command}: {fault}\n  expected {expected}\n  seen     {seen}", flush=True)
 
     def end(self):
         self.directory.cleanup()
         print(f"{self.name}: {self.runs} runs, {self.faults} faults injected, {self.findings} findings")
         sys.exit(self.findings > 0)
-
-
-def shortened(value):
-    text = repr(value)
-    return text if len(text) <= 3000 else f"{text[:1400]} ... {text[-1400:]}"
