@@ -26,28 +26,35 @@ NAME, PROCESS, NETIF, INDEX, UNITS = r"[\w.-]+", r"(?:[\w-]+|<unknown>)\.-?\d+",
 COUNTERS, KB = r"(?:\t\t[\w$]+ *: \d+\n)*", r"\d+ KB"
 RTT = r"(?: *\d+\.\d\d ms| {10})(?: *\d+\.\d\d ms| {12})"
 FLOWS = (r"Proto Local Address.* Process\.PID\n"
-         rf"(?: (?:tcp|udp)[46] \S+ +\S+ +\d+ +\d+ +\d+ +\d+ +[A-Z]+ +{NETIF} +{INDEX} +{INDEX} +[a-z-]{{13}}  [A-Z_12]+ +[A-Z_12]+ +{RTT} {INDEX} +{PROCESS}\n)+")
+         rf"(?: (?:tcp|udp)[46] \S+ +\S+(?: +\d+){{4}} +[A-Z]+ +{NETIF} +{INDEX} +{INDEX} +[a-z-]{{13}}  "
+         rf"[A-Z_12]+ +[A-Z_12]+ +{RTT} {INDEX} +{PROCESS}\n)+")
 RING = rf"[TR]X\[\d+\](?: +{UNITS}){{9,10}}\n +\S+/\S+(?: +{UNITS}){{9,10}}\n(?: +Errors:(?: [A-Z][a-z ]+: {UNITS})+\n)?"
 CHANNEL = rf"\tPort\[ ?\d+\] {PROCESS} +\(fd \d+\)\t(?: flags=[0-9a-f]+<[A-Z_,]+>)?\n(?:Ring .*\n Mem .*\n)?(?:{RING})*\n"
 SHOW = rf"(?:flow-switch {UUID} {NAME}\n(?:\tPort\[ ?\d+\] {PROCESS} *(?:defunct)?\n(?:\t\t \S+\.\d+ <-> \S+\.\d+\n)*)*)+"
-REGION = (rf" *[A-Z]+ region:  {NAME}\n *allocs:  \d+\n *frees:  \d+\n *rescales:  \d+\n *mode:  0x[0-9a-f]+<[A-Z,]*>\n *objs:  \d+ per segment\n"
+REGION = (rf" *[A-Z]+ region:  {NAME}\n *allocs:  \d+\n *frees:  \d+\n *rescales:  \d+\n"
+          r" *mode:  0x[0-9a-f]+<[A-Z,]*>\n *objs:  \d+ per segment\n"
           r" objs cnt\*size:  \d+\*\d+ -> \d+\*\d+ \(\d+\.\d\d% inflation\)\n *segsize:  \d+ -> \d+ \(\d+\.\d\d% inflation\)\n"
           rf" *segments:  \d+/\d+ \(\d+\.\d\d% in use\)\n *(?:wired )?memory:  {KB}\n")
-ARENA = rf"={{70}}\n *[A-Z]+ arena:  {NAME}\n(?: +{PROCESS}\n){{0,8}}={{70}}\n(?:{REGION} +\|\n)*{REGION}-{{70}}\n +TOTAL:  {KB}(?: \(wired {KB}\))?\n-{{70}}\n\n"
+ARENA = (rf"={{70}}\n *[A-Z]+ arena:  {NAME}\n(?: +{PROCESS}\n){{0,8}}={{70}}\n(?:{REGION} +\|\n)*{REGION}"
+         rf"-{{70}}\n +TOTAL:  {KB}(?: \(wired {KB}\))?\n-{{70}}\n\n")
+NEXUS = rf"\tNexus UUID: {UUID}\n\tNetif     : {NETIF}\n"
+MAC = r"(?:[0-9a-f]{2}(?::[0-9a-f]{2}){5}|-)"
 STACK = "".join(rf"\t{protocol}:\n{COUNTERS}" for protocol in ("ip", "ip6", "tcp", "udp"))
 TREE = object()
 GRAMMARS = {
     "channel": rf"Instances: \d+\n(?:\d+\. {UUID}\n(?:{CHANNEL})*)+\n",
     "flow": FLOWS,
-    "flow-adv": rf"(?: - {PROCESS}\n\tNexus UUID: {UUID}\n\tNetif     : {NETIF}\n\tFlowAdvIdx .*Flags\n(?:\t    \[ *\d+\] : {UUID} flags=[0-3]<[A-Z,]*>\n)*)+",
+    "flow-adv": rf"(?: - {PROCESS}\n{NEXUS}\tFlowAdvIdx .*Flags\n(?:\t    \[ *\d+\] : {UUID} flags=[0-3]<[A-Z,]*>\n)*)+",
     "flow-owner": rf"NetIf .* Process\n(?:{NETIF} +\d+ +(?:PID-Bound)? +(?:Destroyed)? +\d+ +[\w-]+\(\d+\)\n)+",
-    "flow-route -n": rf"Local Address .* Flags\n(?:\S+ +\S+ +\S+ +(?:[0-9a-f]{{2}}(?::[0-9a-f]{{2}}){{5}}|-) +{NETIF} +\d+ +-?\d+ +\d+ +\d+  [ogrid-]{{5}}\n)+",
+    "flow-route -n": rf"Local Address .* Flags\n(?:\S+ +\S+ +\S+ +{MAC} +{NETIF} +\d+ +-?\d+ +\d+ +\d+  [ogrid-]{{5}}\n)+",
     "flow-switch": rf"flowswitch:\n(?: - \w+ +{UUID}\n{COUNTERS})+",
     "interface": rf"netif:\n(?: - {NETIF} +{UUID}\n{COUNTERS})+",
-    "memory": rf"(?:{ARENA})+\+{{70}}\n Tarvel .*\n\+{{70}}\n +Total +Wired\n(?: *[A-Z]+: +{KB} +{KB}\n){{12}}-{{70}}\n +TOTAL: +[\d.]+ MB +[\d.]+ MB\n-{{70}}\n",
-    "netns -a": r"(?:(?:tcp|udp) port reservations for (?:global namespace|\S+)\n +PORT\(S\) .*\n(?: *\d+(?:-\d+)?(?: +\d+){3}\n)*-{44}\n)+",
+    "memory": (rf"(?:{ARENA})+\+{{70}}\n Tarvel .*\n\+{{70}}\n +Total +Wired\n(?: *[A-Z]+: +{KB} +{KB}\n){{12}}"
+               r"-{70}\n +TOTAL: +[\d.]+ MB +[\d.]+ MB\n-{70}\n"),
+    "netns -a": (r"(?:(?:tcp|udp) port reservations for (?:global namespace|\S+)\n"
+                 r" +PORT\(S\) .*\n(?: *\d+(?:-\d+)?(?: +\d+){3}\n)*-{44}\n)+"),
     "netstat -an": FLOWS,
-    "netstat -s": rf"(?: - (?:<Closed Port Stats>|{PROCESS})\n\tNexus UUID: {UUID}\n\tNetif     : {NETIF}\n{STACK})+",
+    "netstat -s": rf"(?: - (?:<Closed Port Stats>|{PROCESS})\n{NEXUS}{STACK})+",
     "netstat -s --global --netif --flowswitch": rf"{STACK}netif:\n{COUNTERS}flowswitch:\n{COUNTERS}",
     "provider -D": rf"(?:[a-z-]+(?: \([a-z]+\))? {NAME} {UUID}(?: \[anon\])?\n\trings: .* mhints \d+\n(?:\tinstance {UUID}\n)*)+",
     "show": SHOW, "channel-stats": SHOW, "tree": TREE,
@@ -88,7 +95,7 @@ class Race(Torture):
     def __init__(self):
         super().__init__("race", __doc__)
         self.simulations = []
-        self.alone, self.beside, self.twice = ([self.simulate(*seeds) for seeds in ((1,), (2,), (3, 4))])
+        self.alone, self.beside, self.twice = (self.simulate(*seeds) for seeds in ((1,), (2,), (3, 4)))
         self.fast = self.make_kernel()
         sizes = [self.make_kernel("--flows", flows, "--channels", flows, "--arenas", flows) for flows in (30, 60)]
         self.swapping = multiprocessing.Process(target=swap, args=(self.fast.root, [size.root for size in sizes]), daemon=True)

@@ -21,8 +21,8 @@ sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
 from torture import Torture  # noqa: E402
 
 TIME, HEADING = re.compile(rb"^\d{4}-\d\d-\d\d \d\d:\d\d:\d\d$", re.MULTILINE), b"\n<time>\n"
-COMMANDS = ("channel", "flow", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a", "netstat -an",
-            "netstat -s", "provider -D", "show", "channel-stats", "tree", "list-providers")
+COMMANDS = ("channel", "flow", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a",
+            "netstat -an", "netstat -s", "provider -D", "show", "channel-stats", "tree", "list-providers")
 NAMING, SINKS = ("flow-route", "netstat -a"), ("file", "pipe", "slow pipe", "stopped pipe")
 SIZES = ("--flows", 1500, "--channels", 400, "--providers", 600, "--arenas", 60, "--namespaces", 800, "--processes", 60, "--stacks", 60)
 KILLERS = signal.SIGTERM, signal.SIGHUP, signal.SIGKILL
@@ -78,7 +78,8 @@ class Signals(Torture):
 
     def watch_of_channels(self):
         """What all runs but the first one print: that one prints nothing, and none but that one has a heading."""
-        watch, text = self.start([self.options.tarvelctl, "-w", "1", "channel"], env=self.kernel.environment, stdout=subprocess.PIPE), b""
+        text, watch = b"", self.start([self.options.tarvelctl, "-w", "1", "channel"], env=self.kernel.environment,
+                                      stdout=subprocess.PIPE)
         while text.count(b"Instances: ") < 2:
             text += os.read(watch.stdout.fileno(), 65536)
         watch.kill()
@@ -98,8 +99,9 @@ class Signals(Torture):
     def start_watch(self, command, sink, block_at):
         environment = {**self.kernel.environment, "NAME_SERVICES_BLOCK_AT": str(block_at)}
         pathlib.Path(self.file).write_bytes(b"")
-        process = subprocess.Popen([self.options.tarvelctl, "-w", "1", *(["-f", self.file] if sink == "file" else []), *command.split()],
-                                   env=environment, stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        redirection = ["-f", self.file] if sink == "file" else []
+        process = subprocess.Popen([self.options.tarvelctl, "-w", "1", *redirection, *command.split()], env=environment,
+                                   stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
         limit = self.random.randrange(max(len(self.listings[command]), 1)) if sink == "stopped pipe" else None
         return process, Reader(process.stdout.fileno(), limit, self.random.uniform(0.0001, 0.002) if sink == "slow pipe" else 0.0)
 
@@ -108,7 +110,7 @@ class Signals(Torture):
         size = len(HEADING) - len("<time>") + 19 + (0 if command == "channel" else len(self.listings[command]))
         while process.poll() is None and (os.path.getsize(self.file) if sink == "file" else len(reader.data)) < size:
             time.sleep(0.001)
-        time.sleep(self.random.uniform(0.005, 0.3))
+        time.sleep(self.random.uniform(0.005, 0.2))
 
     def signal_one(self, number, command, sink, state):
         self.runs += 1
@@ -154,7 +156,8 @@ def main():
     torture = Signals()
     count = torture.options.count or (10_000 if torture.long else 120)
     running = [(command, sink, "running") for command in COMMANDS for sink in SINKS]
-    others = [(command, sink, "blocked") for command in NAMING for sink in SINKS] + [(command, sink, "asleep") for command in COMMANDS for sink in SINKS[:2]]
+    others = [(command, sink, "blocked") for command in NAMING for sink in SINKS]
+    others += [(command, sink, "asleep") for command in COMMANDS for sink in SINKS[:2]]
     for turn in range(count):
         torture.signal_one(signal.SIGINT, *torture.random.choice(others if turn % 4 == 0 else running))
     for turn in range(count // 4):
