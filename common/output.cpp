@@ -34,6 +34,13 @@ class interrupt_hold {
   interrupt_hold(const interrupt_hold &) = delete;
   interrupt_hold &operator=(const interrupt_hold &) = delete;
 
+  // Lets in what has been held back so far.
+  void pause() const {
+    sigset_t held;
+    sigprocmask(SIG_SETMASK, &before_, &held);
+    sigprocmask(SIG_SETMASK, &held, nullptr);
+  }
+
   // The signals that were held back before.
   const sigset_t &before() const { return before_; }
 
@@ -143,6 +150,7 @@ void output::drain(const char *upto) {
         error_ = EIO;
       } else if (errno == EAGAIN) {
         wait_for_room(fd_, nullptr, &hold.before());
+        hold.pause();  // where there is room at once, waiting lets no signal in
       } else if (errno != EINTR) {
         error_ = errno;
       }
@@ -197,6 +205,7 @@ int output::abandon() noexcept {
     if (written > 0) {
       begin_ += written;
     } else if (written < 0 && errno == EAGAIN) {
+      if (monotonic_time() > deadline) return 0;  // it says that it has room, but takes nothing
       wait = true;
     } else if (written == 0 || errno != EINTR) {
       const int error = written == 0 ? EIO : errno;

@@ -61,6 +61,24 @@ TEST_F(output_test, LeavesItsBufferAtTheEndOfARow) {
   EXPECT_FALSE(captured.written().empty());
 }
 
+TEST_F(output_test, RowThatDoesNotFitSendsTheLinesBeforeItAway) {
+  const std::string line(1023, 'x');
+  const struct {
+    std::size_t lines, row, lines_gone;
+  } cases[] = {{31, 5000, 0}, {31, 9500, 31}, {1, 39 * 1024, 1}, {31, 100'000, 31}, {0, 100'000, 0}};
+  for (const auto &[lines, row, lines_gone] : cases) {
+    char buffer[output::buffer_size];
+    output to{buffer, output::failure::fatal};
+    capture captured(to);
+    std::string expected;
+    for (std::size_t i = 0; i < lines; ++i, expected += line + "\n") format::print_to<"%s\n">(to, line);
+    format::print_to<"%s">(to, std::string(row, 'y'));
+    EXPECT_EQ(captured.written().size(), lines_gone * 1024) << row;
+    format::print_to<"\n">(to);
+    EXPECT_EQ(captured.text(), expected + std::string(row, 'y') + "\n");
+  }
+}
+
 // What a read returns is what complete writes have left in the pipe.
 TEST_F(output_test, PipeReaderNeverMeetsATornRow) {
   int ends[2];
