@@ -15,7 +15,7 @@
 
 namespace {
 
-#if defined(__SANITIZE_ADDRESS__)
+#if defined(__SANITIZE_ADDRESS__) || !defined(__OPTIMIZE__)
 constexpr int rounds = 20'000;
 #else
 constexpr int rounds = 1'000'000;
