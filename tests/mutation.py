@@ -72,7 +72,8 @@ def is_noticed(build):
 def is_noticed_by_drivers(build, make):
     quietly(*make, "faulted_tarvelctl", "name_services")
     tests = pathlib.Path(__file__).parent
-    return any(not quietly("timeout", "120", tests / f"{name}_torture.py", *words, cwd=build)
+    return any(not quietly("timeout", "120", tests / f"{name}_torture.py",
+                           *(word if word.startswith("-") else (build / word).resolve() for word in words))
                for name, words in DRIVERS.items())
 
 
