@@ -140,7 +140,7 @@ void print_zsh() {
       for (const std::string &word : each.spellings()) {
         if (!each.takes_value) std::printf(" %s", word.c_str());
         if (each.takes_value)
-          std::printf(" '*%s%s%s'", word.c_str(), word.size() > 2 ? "=" : "",
+          std::printf(" '*%s%s%s'", word.c_str(), word.size() > 2 ? "=" : "+",
                       zsh_action(each.name, each.values).c_str());
       }
     }

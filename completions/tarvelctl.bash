@@ -42,7 +42,10 @@ _tarvelctl() {
   fi
 
   [[ $current != --*=* ]] || previous=${current%%=*} current=${current#*=}
-  [[ $previous != -[!-]* ]] || previous=-${previous: -1}
+  # Of letters in one word, the first that takes a value takes the rest of it, or the next word.
+  while [[ $previous == -[!-]?* && ! ${_tarvelctl_values["$command ${previous:0:2}"]+known} ]]; do
+    previous=-${previous:2}
+  done
   if [[ ${_tarvelctl_values["$command $previous"]+known} ]]; then
     values=${_tarvelctl_values["$command $previous"]}
   elif [[ $current == -* ]]; then

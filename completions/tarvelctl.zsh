@@ -19,6 +19,7 @@ case $state in
   command) compadd -M 'm:{A-Z}={a-z}' -- ${(ko)specs} ;;
   arguments)
     local -a known=(${(Q)${(z)specs[${(L)words[1]}]}})
-    _arguments $globals $known
+    [[ $words[CURRENT] == -[^-]* ]] && globals=()  # which go by themselves, not together with other letters
+    _arguments -s $globals $known
     ;;
 esac

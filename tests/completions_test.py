@@ -47,6 +47,8 @@ cases = [
     ("netns -i g", ["global"]),
     ("netstat -s -p ", ["ip", "ip6", "tcp", "udp"]),
     ("netstat -s -w 3 --per-protocol u", ["udp"]),
+    ("netstat -asp t", ["tcp"]),
+    ("netstat -s -pudp t", []),
     ("tree ", tree_ids),
     ("tree " + ids[1][:35].lower(), tree_ids),
     ("-f x tree " + ids[1], [ids[1]]),
