@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
 """Tests that the manual says what the program and the record formats are.
 
-usage: manual_test.py SOURCES GENERATE_COMPLETIONS [unittest options]
+usage: manual_test.py SOURCES GENERATE_COMPLETIONS TARVELLAB [unittest options]
 """
 import pathlib
 import re
@@ -9,8 +9,8 @@ import subprocess
 import sys
 import unittest
 
-sources, generate_completions = pathlib.Path(sys.argv[1]), sys.argv[2]
-del sys.argv[1:3]
+sources, generate_completions, tarvellab = pathlib.Path(sys.argv[1]), *sys.argv[2:4]
+del sys.argv[1:4]
 
 
 def sections(page, macro):
@@ -43,6 +43,14 @@ class Commands(unittest.TestCase):
             same = re.search(r"Another name for\n\.Ic (\S+)", text)
             with self.subTest(command=command):
                 self.assertEqual(options_in(text) | options_in(page[same[1]] if same else ""), program[command])
+
+    def test_LabHasItsCommandsAndOptionsAndNoOthers(self):
+        page = (sources / "docs/tarvellab.1").read_text()
+        usage = subprocess.run([tarvellab], capture_output=True, text=True).stderr
+        names = re.findall(r"^  tarvellab (\w+)", usage, flags=re.M)
+        self.assertGreater(len(names), 2)
+        self.assertEqual(re.findall(r"^\.It Cm (\w+)", page, flags=re.M), names)
+        self.assertEqual(options_in(page), set(re.findall(r"--[a-z]+", usage)))
 
 
 class Tables(unittest.TestCase):
