@@ -27,6 +27,7 @@ namespace fs = std::filesystem;
 
 constexpr std::string_view format_version = "1";
 constexpr std::size_t note_size = 4096;  // what is read of a note: far more than one has
+constexpr int deepest = 7;               // folders above moments/1.000/proc/sys/kern/tarvel/stats/flow
 
 std::string note_of(const std::string &directory) {
   return directory + "/capture.txt";
@@ -78,15 +79,16 @@ bool understands(const std::string &path, std::string_view note) {
   return false;
 }
 
-// A capture comes from elsewhere: a link would lead out of it, and a device may do something when it is
-// opened.
+// A capture comes from elsewhere: a link would lead out of it, a device may do something when it is opened,
+// and a chain of folders without end takes memory without end.
 bool holds_only_files(const std::string &directory) {
   std::error_code error;
   fs::recursive_directory_iterator entry(directory, error);
   for (; !error && entry != fs::recursive_directory_iterator(); entry.increment(error)) {
     const fs::file_type type = entry->symlink_status(error).type();
-    if (error || type == fs::file_type::regular || type == fs::file_type::directory) continue;
-    complain<"tarvellab: %s: neither a file nor a directory\n">(foreign_text{entry->path().native()});
+    const bool is_folder = type == fs::file_type::directory && entry.depth() < deepest;
+    if (error || type == fs::file_type::regular || is_folder) continue;
+    complain<"tarvellab: %s: no part of a capture\n">(foreign_text{entry->path().native()});
     return false;
   }
   return !error || complain_about(directory, error.value());

@@ -36,7 +36,7 @@ bool finish_moment(const std::string &directory, std::int64_t offset);
 
 // Finds the moments of a capture behind the first, in order; what is no moment does not count. There are none
 // where the directory is no capture. False where it is one of a format that this program does not know, or
-// holds more than files and directories.
+// holds more than files and directories, or directories below those of the tables.
 bool find_moments(const std::string &directory, std::vector<captured_moment> &found);
 
 }  // namespace lab
