@@ -3,11 +3,12 @@
 
 usage: docs_test.py FOLDER_OF_THE_PROGRAMS [unittest options]
 
-In a console block a line behind "$ " is a command, and the lines below it are what it prints:
+In a console block a line behind "$ " is a command, which "> " goes on with, and the lines below it are what it prints:
   ...      stands for lines left out, or inside a line for text left out
   ^C       interrupts the command, which has printed what is shown above
 Tabs are shown as blanks. A simulation moves: where a command makes one, a number stands for any number. The commands of
-a page run one after the other in an empty folder and end with status 0; messages count as printed.
+a page run one after the other in an empty folder and end with status 0; messages count as printed. Pages of the manual
+see the lab's kernel, and nothing is run of a block in which root, "# ", has the word.
 """
 import os
 import pathlib
@@ -21,18 +22,20 @@ import unittest
 
 top = pathlib.Path(__file__).resolve().parent.parent
 programs = pathlib.Path(sys.argv.pop(1)).resolve()
-pages = [top / "README.md", top / "CONTRIBUTING.md", *sorted((top / "docs").glob("*.md"))]
+pages = [top / "README.md", top / "CONTRIBUTING.md", *sorted((top / "docs").glob("*.*"))]
 number = r" *\b\d+(?:\.\d+)?[KMGT]?B?\b"
 
 
 def commands(page):
     """The commands of a page in order, as (line of the page, command, shown lines)."""
     found, console = [], False
-    for place, line in enumerate(page.read_text().splitlines(), 1):
-        if line.startswith("```"):
-            console = line == "```console"
+    for place, line in enumerate(page.read_text().expandtabs().replace(r"\(aq", "'").splitlines(), 1):
+        if line.startswith(("```", ".Bd -literal", ".Ed", "# ")):
+            console = line in ("```console", ".Bd -literal")
         elif console and line.startswith("$ "):
             found.append((place, line[2:], []))
+        elif console and line.startswith("> ") and not found[-1][2]:
+            found[-1] = (found[-1][0], found[-1][1] + "\n" + line[2:], [])
         elif console:
             found[-1][2].append(line)
     return found
@@ -72,8 +75,11 @@ class Docs(unittest.TestCase):
         env = {**os.environ, "PATH": f"{programs}:{os.environ['PATH']}", "TMPDIR": str(folder / "tmp"),
                "LC_ALL": "C.UTF-8"}
         env.pop("TARVEL_ROOT", None)
+        if page.suffix != ".md":
+            subprocess.run([programs / "tarvellab", "generate", folder / "kernel"], check=True)
+            env["TARVEL_ROOT"] = str(folder / "kernel")
         for place, command, shown in commands(page):
-            if export := re.fullmatch(r"export (\w+)=([\w/]+)", command):
+            if export := re.fullmatch(r"(?:export )?(\w+)=([\w/]+)", command):
                 env[export[1]] = export[2]
                 continue
             with self.subTest(f"{page.name}:{place}: {command}"):
