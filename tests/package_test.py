@@ -12,6 +12,7 @@ import tempfile
 expected = {
     "bin/tarvelctl", "bin/tarvellab", "share/bash-completion/completions/tarvelctl",
     "share/doc/tarvelctl/changelog.Debian.gz", "share/doc/tarvelctl/copyright",
+    "share/doc/tarvelctl/from-symptom-to-command.md",
     "share/fish/vendor_completions.d/tarvelctl.fish", "share/man/man1/tarvelctl.1.gz", "share/man/man1/tarvellab.1.gz",
     "share/man/man5/tarvel-tables.5.gz", "share/zsh/vendor-completions/_tarvelctl",
 }
