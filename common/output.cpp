@@ -217,7 +217,7 @@ int output::abandon() noexcept {
 
 void attach_standard_outputs() {
   for (int fd = STDIN_FILENO; fd <= STDERR_FILENO; ++fd) {
-    if (fcntl(fd, F_GETFD) < 0 && errno == EBADF) open("/dev/null", O_RDONLY);
+    if (fcntl(fd, F_GETFD) < 0) open("/dev/null", O_RDONLY);
   }
   report.attach(STDOUT_FILENO);
   // The C library writes to standard error too, and would lose what a full pipe does not take at once.

@@ -361,7 +361,7 @@ small_text<Capacity> text_of(const Args &...args) {
   small_text<Capacity> result;
   result.size = std::min(static_cast<std::size_t>(all.end - all.chars), Capacity - 1);
   std::memcpy(result.chars, all.chars, result.size);
-  result.foreign = (false || ... || is_foreign(prepare(args)));
+  result.foreign = (0 | ... | is_foreign(prepare(args))) != 0;
   return result;
 }
 

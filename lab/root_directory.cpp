@@ -72,10 +72,6 @@ bool root_directory::put_table(std::string_view node, std::span<const std::byte>
   return error ? complain_about(table_path(node), error) : true;
 }
 
-void root_directory::remove_table(std::string_view node) {
-  unlink(table_path(node).c_str());
-}
-
 bool root_directory::put_process(std::int32_t pid, std::string_view name) {
   const std::string folder = path_ + "/proc/" + std::to_string(pid);
   if (const int error = make_directories(folder, 0777)) return complain_about(folder, error);

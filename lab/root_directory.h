@@ -27,7 +27,6 @@ class root_directory {
   bool prepare(unsigned mode);
 
   bool put_table(std::string_view node, std::span<const std::byte> bytes);
-  void remove_table(std::string_view node);
 
   bool put_process(std::int32_t pid, std::string_view name);
   void remove_process(std::int32_t pid);

@@ -1,6 +1,7 @@
 // Names of hosts and endpoints, by name services that this file puts in the place of the system's.
 
 #include <arpa/inet.h>
+#include <dlfcn.h>
 #include <gtest/gtest.h>
 #include <netdb.h>
 
@@ -19,6 +20,7 @@ struct name_services {
   std::map<std::uint32_t, const char *> networks;  // by number; an entry may lack a name
   std::map<std::string, const char *> services;    // by "port/protocol"
   const char *host_name = nullptr;                 // nullptr: cannot be read
+  std::map<std::uint32_t, const char *> scoped;    // whole texts by scope; nullptr: cannot be rendered
   std::string asked;
 } services;
 
@@ -57,6 +59,19 @@ int gethostname(char *name, std::size_t size) noexcept {
   services.asked += "host name\n";
   if (!services.host_name) return -1;
   snprintf(name, size, "%s", services.host_name);
+  return 0;
+}
+
+// The system's own, but for scopes that the test knows.
+int getnameinfo(const sockaddr *address, socklen_t length, char *host, socklen_t host_size, char *service,
+                socklen_t service_size, int flags) {
+  const auto found = services.scoped.find(reinterpret_cast<const sockaddr_in6 *>(address)->sin6_scope_id);
+  if (found == services.scoped.end()) {
+    static const auto system = reinterpret_cast<decltype(&getnameinfo)>(dlsym(RTLD_NEXT, "getnameinfo"));
+    return system(address, length, host, host_size, service, service_size, flags);
+  }
+  if (!found->second) return EAI_FAMILY;
+  snprintf(host, host_size, "%s", found->second);
   return 0;
 }
 
@@ -166,6 +181,27 @@ TEST(flow_naming, NumbersAreAskedOfNobody) {
   EXPECT_EQ(end6(long6, 443, "tcp", true), std::string(long6, 37) + ".443");
   EXPECT_EQ(end6("::", 0, "tcp", true), "*.*");
   EXPECT_EQ(services.asked, "");
+}
+
+TEST(flow_naming, ScopesAreShownAsTheSystemHasThem) {
+  const std::string cut = "fe80::7%" + std::string(41, 'i'), whole = cut + "i";
+  services = {.scoped = {{0x101, nullptr},
+                         {0x102, "fe80::7%interface-of-15"},
+                         {0x103, "fe80::7%interface-of-16c"},
+                         {0x104, "fe80:104::7"},
+                         {0x105, whole.c_str()},
+                         {0x106, "fe80::7%en0"}}};
+  const std::pair<const char *, std::string> texts[] = {
+      {"fe80:101::7", "?"},           {"fe80:102::7", "fe80::7%interface-of-15"},
+      {"fe80:104::7", "fe80:104::7"}, {"fe80:103::7", "fe80::7%interface-of-16c"},
+      {"fe80:105::7", cut},           {"fe80:106::7", "fe80::7%en0"}};
+  for (const auto &[address, text] : texts) {
+    for (int times = 0; times < 2; ++times) EXPECT_EQ(host6(address, true), text);
+  }
+  services.scoped.clear();
+  EXPECT_EQ(host6("fe80:106::7", true), "fe80::7%en0");
+  forget_scopes();
+  EXPECT_EQ(host6("fe80:106::7", true), "fe80::7%262");
 }
 
 // The numeric form by the system's own means.

@@ -151,6 +151,14 @@ void ends_without_memory(Allocation allocate, const char *message) {
   EXPECT_EXIT(attempt(), testing::ExitedWithCode(255), message);
 }
 
+TEST(allocation, OfNothingIsABlockToo) {
+  void *const block = xmalloc(0);
+  EXPECT_NE(block, nullptr);
+  void *const resized = xrealloc(block, 0);
+  EXPECT_NE(resized, nullptr);
+  std::free(resized);
+}
+
 TEST(allocation, FailureEndsTheProcessWithStatus255) {
   ends_without_memory([](std::size_t size) { xmalloc(size); }, "malloc failed$");
   ends_without_memory([](std::size_t size) { xrealloc(nullptr, size); }, "realloc failed$");

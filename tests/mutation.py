@@ -29,7 +29,7 @@ OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
 # Where a fault says nothing of a decoder or a bound.
 LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|template|using|inline constexpr std::size_t slack)|prefetch|reserve\(|"
                       r"static_assert|print<|complain<|\"")
-TESTS = ["unit_tests", "kernel_table_tests", "flow_naming_tests", "program_tests"]
+TESTS = ["unit_tests", "blocking_output_tests", "kernel_table_tests", "flow_naming_tests", "program_tests"]
 SHARDS = 4
 # What is asked where those notice nothing, because it takes longer.
 DRIVERS = {"truncation": ["tarvelctl", "tarvellab"], "terminal": ["tarvelctl", "tarvellab", "--name-services",

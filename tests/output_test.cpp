@@ -6,9 +6,11 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <limits.h>
+#include <sys/resource.h>
 
 #include <thread>
 
+#include "common/mib.h"
 #include "common/output_helpers.h"
 #include "tests/support/capture.h"
 #include "tests/support/kernel_dir.h"
@@ -117,8 +119,13 @@ TEST_F(output_test, AbandonedOutputEndsWithItsLastWholeLineOrSaysWhyNot) {
       EXPECT_EQ(captured.written(), "one\ntwo\n");
     }
   }
+  int ends[2];
+  ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
+  close(ends[0]);
+  out.attach(ends[1]);
+  format::print_to<"unread\n">(out);
+  EXPECT_EQ(out.abandon(), 0);
   out.attach(open("/dev/full", O_WRONLY | O_CLOEXEC));
-  format::print_to<"lost\n">(out);
   EXPECT_EQ(out.abandon(), ENOSPC);
 }
 
@@ -147,6 +154,25 @@ TEST(complain, LetsTheReportGoFirst) {
   EXPECT_EQ(captured.written(), "");
   complain<"trouble\n">();
   EXPECT_EQ(captured.written(), "row\n");
+}
+
+TEST(attach_standard_outputs_test, DiagnosticsDoWithoutADescriptorOfTheirOwn) {
+  const auto say = [] {
+    rlimit files;
+    getrlimit(RLIMIT_NOFILE, &files);
+    const rlimit none{.rlim_cur = STDERR_FILENO + 1, .rlim_max = files.rlim_max};
+    setrlimit(RLIMIT_NOFILE, &none);
+    attach_standard_outputs();
+    setrlimit(RLIMIT_NOFILE, &files);
+    complain<"said\n">();
+    _exit(0);
+  };
+  EXPECT_EXIT(say(), testing::ExitedWithCode(0), "^said\n$");
+}
+
+TEST(object_type_name_test, NamesTypesOnly) {
+  EXPECT_STREQ(object_type_name(object_type::flow), "flow");
+  EXPECT_STREQ(object_type_name(object_type{5}), "???");
 }
 
 TEST(print_options_usage, BracketsWhatMayBeLeftOut) {

@@ -2,11 +2,15 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <limits.h>
+#include <sys/mman.h>
 #include <sys/prctl.h>
 #include <unistd.h>
 
 #include <cstring>
 
+#include "platform/descriptor.h"
+#include "platform/memory.h"
 #include "platform/process.h"
 #include "platform/sysctl.h"
 #include "tests/support/kernel_dir.h"
@@ -127,7 +131,61 @@ TEST_F(sysctl_test, NewValueIsEPERM) {
   kernel.table(node, "x");
   std::size_t length = 0;
   EXPECT_EQ(sysctlbyname(node, nullptr, &length, "y", 1) == -1 ? errno : 0, EPERM);
+  EXPECT_EQ(sysctlbyname(node, nullptr, &length, nullptr, 1) == -1 ? errno : 0, EPERM);
   EXPECT_EQ(contents_of(kernel.table_path(node)), "x");
+}
+
+TEST_F(sysctl_test, WithoutALengthTellsWhetherThereIsSuchAVariable) {
+  kernel.table(node, "x");
+  EXPECT_EQ(sysctlbyname(node, nullptr, nullptr, nullptr, 0), 0);
+  EXPECT_EQ(sysctlbyname("kern.none", nullptr, nullptr, nullptr, 0) == -1 ? errno : 0, ENOENT);
+}
+
+// What cannot be read at its front: no process has memory there.
+TEST_F(sysctl_test, ErrorsOfReadsArePassedOn) {
+  kernel.table("kern.other", "x");
+  std::filesystem::create_symlink("/proc/self/mem", kernel.table_path("kern.broken"));
+  EXPECT_EQ(measure("kern.broken").first, EIO);
+  for (const std::size_t size : {0U, 1U, 100U}) EXPECT_EQ(read("kern.broken", size).first, EIO) << size;
+}
+
+TEST_F(sysctl_test, LargeFilesNeedNotStateTheirSize) {
+  char *const pages =
+      static_cast<char *>(mmap(nullptr, 800 * 4096, PROT_READ, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
+  for (int i = 0; i < 800; i += 2) mprotect(pages + 4096 * i, 4096, PROT_NONE);
+  kernel.table("kern.other", "x");
+  std::filesystem::create_symlink("/proc/self/maps",
+                                  kernel.table_path("kern.maps"));  // a line for each of them
+  const std::size_t size = measure("kern.maps").second;
+  EXPECT_GT(size, 800 * 40U);
+  EXPECT_EQ(read("kern.maps", size / 2).first, ENOMEM);
+  EXPECT_EQ(read("kern.maps", 2 * size).first, 0);
+  EXPECT_GT(data.size(), 800 * 40U);
+  munmap(pages, 800 * 4096);
+}
+
+TEST_F(sysctl_test, RootThatNoPathHasIsRefused) {
+  setenv("TARVEL_ROOT", std::string(PATH_MAX, '/').c_str(), 1);
+  EXPECT_EQ(measure(node).first, ENAMETOOLONG);
+}
+
+TEST(descriptor_test, ClosedOneStaysAsItIs) {
+  const int fd = memfd_create("closed", 0);
+  close(fd);
+  EXPECT_FALSE(platform::make_writes_nonblocking(fd));
+  EXPECT_EQ(fcntl(fd, F_GETFD), -1);
+}
+
+TEST(memory_test, HintLeavesBlockAndErrnoAlone) {
+  constexpr std::size_t size = 8 << 20;
+  const std::string before(size, 'x');
+  std::string block = before;
+  for (const std::size_t hinted : {std::size_t{100}, size}) {
+    errno = 77;
+    platform::prefer_large_pages(block.data(), hinted);
+    EXPECT_EQ(errno, 77);
+    EXPECT_TRUE(block == before);
+  }
 }
 
 TEST_F(platform_test, LiveMachineIsSeenOnlyWithoutAnotherRoot) {

@@ -154,6 +154,7 @@ TEST_F(tree, ChannelsHangUnderTheirNexusByPort) {
       {group(nowhere, 2) + port(8) + port(9) + a1 + port(4), "4 "},
       {a1 + port(2) + group(channel_c, 1) + port(8, provider_p) + a1 + port(3, nowhere), "3 "},
       {group(provider_p, 1) + port(4) + a1 + port(5), "4 "},
+      {group(nexus_a, 2) + port(2) + port(3) + a1 + port(4, nowhere) + group(channel_c, 1) + port(5), "4 "},
       {group(null_uuid, 1) + port(4) + group(provider_p, 1) + port(5), "4 "},
       {a3 + port(5) + a1.substr(0, 10), "2 5 7 ", is_short},
       {a3, "7 2 ", is_short},

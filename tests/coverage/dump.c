@@ -1,23 +1,55 @@
-// Saves what a process has covered also where it ends without running its exit handlers.
+// Saves what a process has covered also where it ends without running its exit handlers, or becomes another program.
 
+#include <sys/resource.h>
 #include <unistd.h>
 
 void __gcov_dump(void);
+void __gcov_reset(void);
 _Noreturn void __real_abort(void);
 _Noreturn void __real__exit(int status);
 int __real_raise(int number);
+int __real_execv(const char *path, char *const argv[]);
+int __real_execvp(const char *file, char *const argv[]);
+
+// Defined where calls fail on demand.
+__attribute__((weak)) void disarm_faults(void);
+
+// Lets the files be written, whatever the test has done to the process. Runs also before they are written at exit().
+__attribute__((destructor(101))) static void prepare(void) {
+  struct rlimit size;
+  if (disarm_faults) disarm_faults();
+  getrlimit(RLIMIT_FSIZE, &size);
+  size.rlim_cur = size.rlim_max;
+  setrlimit(RLIMIT_FSIZE, &size);
+}
+
+static void dump(void) {
+  prepare();
+  __gcov_dump();
+  __gcov_reset();
+}
 
 _Noreturn void __wrap_abort(void) {
-  __gcov_dump();
+  dump();
   __real_abort();
 }
 
 _Noreturn void __wrap__exit(int status) {
-  __gcov_dump();
+  dump();
   __real__exit(status);
 }
 
 int __wrap_raise(int number) {
-  __gcov_dump();
+  dump();
   return __real_raise(number);
+}
+
+int __wrap_execv(const char *path, char *const argv[]) {
+  dump();
+  return __real_execv(path, argv);
+}
+
+int __wrap_execvp(const char *file, char *const argv[]) {
+  dump();
+  return __real_execvp(file, argv);
 }
