@@ -70,8 +70,8 @@ bool save_redacted(root_directory &root, const fetched_table &fetched, substitut
   if (!redact_table(node, fetched.content.bytes(), by, file)) {
     complain<"tarvellab: %s is cut: the rest of it cannot be redacted\n">(node);
   }
-  const int error = file.commit();
-  return error ? complain_about(root.table_path(node), error) : true;
+  if (const int error = file.commit()) return complain_about(root.table_path(node), error);
+  return true;
 }
 
 // Saves a moment below `path`, redacted where there are substitutes. Backwards, because the names of arenas

@@ -136,8 +136,8 @@ bool write_note(const std::string &directory, time_t taken, bool redacted) {
                            "\nredacted: " + (redacted ? "yes" : "no") + "\n";
   table_file file(note_of(directory));
   file.put(std::as_bytes(std::span(text)));
-  const int error = file.commit();
-  return error ? complain_about(note_of(directory), error) : true;
+  if (const int error = file.commit()) return complain_about(note_of(directory), error);
+  return true;
 }
 
 std::string moment_in_progress(const std::string &directory) {

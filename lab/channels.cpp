@@ -40,7 +40,7 @@ void deal_channels(std::vector<nexus> &nexuses, std::uint32_t count) {
       const std::uint32_t given = std::min({plans[static_cast<int>(owner.kind)].each_turn, room, count});
       owner.channel_count += given;
       count -= given;
-      dealt = dealt || given;
+      dealt |= given > 0;
     }
   }
 }

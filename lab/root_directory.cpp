@@ -26,8 +26,9 @@ int make_directories(const std::string &path, mode_t mode) {
   return mkdir(path.c_str(), mode) == 0 || errno == EEXIST ? 0 : errno;
 }
 
+// Of a name, which is not empty.
 bool is_number(const char *text) {
-  return *text && text[std::strspn(text, "0123456789")] == '\0';
+  return text[std::strspn(text, "0123456789")] == '\0';
 }
 
 }  // namespace
@@ -68,8 +69,8 @@ bool root_directory::remove_processes() {
 bool root_directory::put_table(std::string_view node, std::span<const std::byte> bytes) {
   table_file file(table_path(node));
   file.put(bytes);
-  const int error = file.commit();
-  return error ? complain_about(table_path(node), error) : true;
+  if (const int error = file.commit()) return complain_about(table_path(node), error);
+  return true;
 }
 
 bool root_directory::put_process(std::int32_t pid, std::string_view name) {
@@ -78,8 +79,8 @@ bool root_directory::put_process(std::int32_t pid, std::string_view name) {
   table_file file(folder + "/comm");
   file.put(std::as_bytes(std::span(name)));
   file.put('\n');
-  const int error = file.commit();
-  return error ? complain_about(folder + "/comm", error) : true;
+  if (const int error = file.commit()) return complain_about(folder + "/comm", error);
+  return true;
 }
 
 void root_directory::remove_process(std::int32_t pid) {

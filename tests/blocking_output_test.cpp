@@ -5,11 +5,14 @@
 #include <poll.h>
 #include <pty.h>
 #include <signal.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <termios.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
+#include <deque>
 #include <string>
 
 #include "common/output.h"
@@ -22,6 +25,19 @@ bool make_writes_nonblocking(int /*fd*/) {
 }
 
 }  // namespace platform
+
+namespace {
+
+std::deque<int> write_errors;  // of the writes that come next, 0 where one writes nothing
+
+}  // namespace
+
+extern "C" ssize_t write(int fd, const void *data, std::size_t size) {
+  if (write_errors.empty()) return syscall(SYS_write, fd, data, size);
+  errno = write_errors.front();
+  write_errors.pop_front();
+  return errno ? -1 : 0;
+}
 
 namespace {
 
@@ -113,6 +129,29 @@ TEST(blocking_output, InterruptNeedNotWaitForAReaderThatHasStopped) {
     EXPECT_LT(rows.size(), all_rows.size());
     EXPECT_TRUE(all_rows.starts_with(rows)) << rows;
     EXPECT_TRUE(is_terminal || rows.back() == '\n') << rows;
+  }
+}
+
+TEST(blocking_output, AbandonedOutputGoesOnUntilAnErrorThatStays) {
+  const struct {
+    std::deque<int> errors;
+    int result;
+    bool arrives;
+  } cases[] = {{{}, 0, true},
+               {{EINTR, EAGAIN, EINTR}, 0, true},
+               {{0}, EIO, false},
+               {{EPIPE}, 0, false},
+               {{EINTR, ENOSPC}, ENOSPC, false}};
+  for (const auto &[errors, result, arrives] : cases) {
+    const device to(false);
+    char own_storage[output::buffer_size];
+    output own{own_storage, output::failure::ignored};
+    own.attach(to.program);
+    format::print_to<"row\n">(own);
+    write_errors = errors;
+    EXPECT_EQ(own.abandon(), result);
+    EXPECT_EQ(to.received(4, 0), arrives ? "row\n" : "");
+    EXPECT_TRUE(write_errors.empty());
   }
 }
 

@@ -3,6 +3,7 @@
 
 usage: lab_capture_test.py TARVELLAB [unittest options]
 """
+import functools
 import ipaddress
 import os
 import pathlib
@@ -16,7 +17,7 @@ import time
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import Kernel, LabTest, files, lab, node_dir, run, text, u32  # noqa: E402
+from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run, text, u32  # noqa: E402
 
 commands = ("channel", "flow -n", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a",
             "provider -D", "show -n", "tree", "channel-stats -n", "list-providers", "netstat -a -n")
@@ -24,8 +25,8 @@ tarvelctl = pathlib.Path(lab).with_name("tarvelctl")
 
 
 class CaptureTest(LabTest):
-    def capture(self, root, *options, name="saved", status=0):
-        saved = run("capture", *options, self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)})
+    def capture(self, root, *words, name="saved", status=0, **options):
+        saved = run("capture", *words, self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)}, **options)
         self.assertEqual(saved.returncode, status, saved.stderr)
         return saved.stderr
 
@@ -98,6 +99,27 @@ class Capture(CaptureTest):
             self.recapture(kernel.root)
             self.assertEqual(self.saved().table(name), table)
 
+    def test_WhatDoesNotFitIsNamedAndEndsIt(self):
+        kernel = self.generate()
+        self.write(f"small/{node_dir}ring_stat_enable", b"\1")
+        for root, size, options, named in ((kernel.root, 0, (), "proc/\\d+/comm"), (kernel.root, 100, (), node_dir + ".*"),
+                                           (kernel.root, 100, ("--redact",), node_dir + ".*"),
+                                           (self.directory / "small", 20, (), "capture.txt")):
+            shutil.rmtree(self.directory / "saved", ignore_errors=True)
+            errors = self.capture(root, *options, status=1, preexec_fn=functools.partial(limit_files, size))
+            self.assertRegex(errors, f"tarvellab: {self.directory}/saved/{named}: File too large\n$")
+
+    def test_AMomentThatDoesNotFitEndsItAndLeavesTheOthers(self):
+        small, saved = self.directory / "small", self.directory / "saved"
+        self.write(f"small/{node_dir}ring_stat_enable", b"\1")
+        capture = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", saved], stderr=subprocess.PIPE, text=True,
+                                   env={**os.environ, "TARVEL_ROOT": str(small)}, preexec_fn=lambda: limit_files(1000))
+        self.wait_for(lambda: len(list(saved.glob("moments/[0-9]*"))) > 1)
+        self.write(f"small/{node_dir}stats/flow", bytes(3200))
+        self.assertIn("File too large", capture.communicate(timeout=10)[1])
+        self.assertEqual(capture.returncode, 1)
+        self.assertEqual([name for name in files(saved) if "/." in name], [])
+
     def test_WrongArgumentsShowTheUsage(self):
         for words in ("", "a b", "--redact", "--every 1 a", "--count 2 a", "--seed 1 a", "--every 1 --count 0 a", "--every 1 --count a",
                       *(f"--every {every} --count 2 a" for every in ("0", "0.009", "3601", "-1", "nan", "inf", "1e1", "1s", ""))):
@@ -167,6 +189,17 @@ class Moments(CaptureTest):
         watch = self.replay("timeout", "--preserve-status", "-s", "INT", "4.4", tarvelctl, "-w", "1", "channel")
         self.assertEqual([line.split()[3] for line in watch.stdout.splitlines() if line.startswith("TX[0]")][:3], ["1.00K", "4.00K", "9.00K"])
 
+    def test_AReplayDoesNotOutliveAKilledRun(self):
+        self.make()
+        self.moment("0.100", b"later\n")
+        script = "until grep -q later $TARVEL_ROOT/proc/94/comm; do sleep 0.01; done; echo $$; exec sleep 60"
+        process, child = self.start("run", self.directory / "made", "--", "sh", "-c", script,
+                                    env={**os.environ, "TMPDIR": str(self.directory)})
+        process.kill()
+        process.wait()
+        os.kill(int(child), signal.SIGKILL)
+        self.wait_for(lambda: not list(self.directory.glob("tarvellab-*")))
+
     def test_OtherFormatsAreRefused(self):
         kernel = self.make()
         note = kernel.root / "capture.txt"
@@ -188,7 +221,7 @@ class Moments(CaptureTest):
     def test_WhatIsNoMomentDoesNotCount(self):
         kernel = self.make()
         moments = kernel.root / "moments"
-        for name in "1e1.000", "-1.000", "0.000", ".000", "99999999999999999999.000", "9" * 30, "x", ".new", "0.1", "nan.000", "0.1000":
+        for name in "1e1.000", "-1.000", "0.000", ".000", "99999999999999999999.000", "9" * 30, "x", ".new", "0.1", "nan.000", "0.1000", "0.x00":
             shutil.copytree(kernel.root / "proc", moments / name / "proc")
         (moments / "0.100").touch()
         self.assertEqual(self.replay("sh", "-c", "echo $TARVEL_ROOT").stdout, f"{kernel.root.resolve()}\n")
@@ -244,7 +277,13 @@ class Redact(CaptureTest):
               (192, b"\1\2\3\4\5\6", b"\3\0\0\0\0\1")]),
             (256, [(0, 32), (76, 4), (104, 4), (132, 4), (156, 36), (198, 58)],
              [(101, b"\x1e"), (80, v6("::1"), v6("::1")), (108, v6("ff02:5::fb"), v6("ff02:5::3fff:0:0:1")), (136, v6("::ffff:10.0.0.1"), v6("::ffff:240.0.0.1")),
-              (192, b"\0" * 6, b"\0" * 6)])),
+              (192, b"\0" * 6, b"\0" * 6)]),
+            (256, [(0, 32), (80, 16), (108, 16), (136, 16), (156, 36), (198, 58)],
+             [(101, b"\2"), (76, v4("255.255.255.255"), v4("255.255.255.255")), (104, v4("224.0.0.251"), v4("239.0.0.1")),
+              (132, bytes(4), bytes(4)), (192, b"\xff" * 6, b"\xff" * 6)]),
+            (256, [(0, 32), (76, 4), (104, 4), (132, 4), (156, 36), (198, 58)],
+             [(101, b"\x1e"), (80, v6("fec0::7"), v6("3fff::2")), (108, v6("ff01:5::fb"), v6("ff01:5::3fff:0:0:3")),
+              (136, v6("ff05:5::fb"), v6("ff05::3fff:0:0:4")), (192, b"\0" * 6, b"\0" * 6)])),
         "stats/flow_owner": ((128, [(84, 44)], [(36, b"x" * 32, b"process1")]),),
         "stats/netns": (
             (32, [(4, 12), (19, 13)], [(0, v4("10.0.0.7"), v4("240.0.0.1")), (16, b"\4"), (18, b"\0")]),
@@ -281,11 +320,14 @@ class Redact(CaptureTest):
     def test_NamesOfProcessesStandInOtherNamesToo(self):
         owner = bytes(36) + b"browser".ljust(32, b"\0") + struct.pack("<i", 7) + bytes(56)
         long = bytes(36) + b"a.long.name.of.all".ljust(32, b"\0") + bytes(60)
-        names = b"browser", b"com.browser.3", b"browsers", b"x-browser94/browser", b"a.long.name.of.all.port", b"a.long.name"
-        shown = b"process1", b"com.process1.3", b"browsers", b"x-process194/process1", b"process2.port", b"a.long.name"
+        word = bytes(36) + b"averylongprocessor".ljust(32, b"\0") + bytes(60)
+        names = (b"browser", b"com.browser.3", b"browsers", b"x-browser94/browser", b"a.long.name.of.all.port", b"a.long.name",
+                 "browserX[browser]{browser}browser\u00e9".encode(), b"averylongprocesses.1")
+        shown = (b"process1", b"com.process1.3", b"browsers", b"x-process194/process1", b"process2.port", b"a.long.name",
+                 "browserX[process1]{process1}browser\u00e9".encode(), b"process3.1")
         arena, provider = bytes(2608), bytes(264)
         for name, expected in zip(names, shown):
-            seen = self.redacted({"stats/flow_owner": owner + long,
+            seen = self.redacted({"stats/flow_owner": owner + long + word,
                                   "stats/arena": name.ljust(80, b"\0") + name.ljust(208, b"\0") + arena[288:],
                                   "nexus_provider_list": bytes(64) + name.ljust(64, b"\0") + struct.pack("<I", len(name)) + provider[132:]})
             self.assertEqual([text(seen["stats/arena"], at, 64) for at in (0, 80)], [expected.decode()] * 2)

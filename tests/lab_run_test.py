@@ -7,17 +7,18 @@ import os
 import pathlib
 import pty
 import signal
+import subprocess
 import sys
 import time
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import Kernel, LabTest, files, lab, node_dir, run, u32, u64  # noqa: E402
+from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run, u32, u64  # noqa: E402
 
 
 class Simulate(LabTest):
-    def simulate(self, *options):
-        process, line = self.start("simulate", self.directory, *options)
+    def simulate(self, *words, **options):
+        process, line = self.start("simulate", self.directory, *words, **options)
         self.assertEqual(line, f"simulating in {self.directory}")
         return process, Kernel(self.directory)
 
@@ -59,6 +60,23 @@ class Simulate(LabTest):
         self.assertGreater(compared, 200)
 
 
+    def test_NothingMovesOnNothing(self):
+        for size, path in ("flows", "stats/flow"), ("channels", "stats/flow"), ("providers", "nexus_provider_list"):
+            process, kernel = self.simulate("--interval", "10", "--" + size, "0")
+            first = (kernel.root / node_dir / path).stat().st_ino
+            self.wait_for(lambda: (kernel.root / node_dir / path).stat().st_ino != first)
+            self.assertEqual(kernel.table(path), b"")
+            process.terminate()
+            self.assertEqual(process.wait(5), 0)
+
+    def test_EndsWhereItsDirectoryIsTakenAway(self):
+        process, kernel = self.simulate("--interval", "10", stderr=subprocess.PIPE)
+        (self.directory / "proc").rename(self.directory / "gone")
+        self.assertEqual(process.wait(5), 1)
+        self.assertIn("No such file or directory", process.stderr.read())
+        process.stderr.close()
+
+
 class Run(LabTest):
     def setUp(self):
         super().setUp()
@@ -81,6 +99,27 @@ class Run(LabTest):
                                  (-15, "sh", "-c", "kill -TERM $$"), (127, "no-such-command"), (126, "/dev/null")):
             self.assertEqual(run("run", "--", *command, env=self.env).returncode, status)
         self.assertEqual(run("run", self.directory / "none", "--", "true", env=self.env).returncode, 1)
+        self.assertTrue(self.nothing_left())
+
+    def test_TemporaryDirectoryIsTheCallersOrTheSystems(self):
+        for name, parent in (self.directory, self.directory), ("", "/tmp"), (None, "/tmp"):
+            env = {**os.environ, "TMPDIR": str(name)} if name is not None else {k: v for k, v in os.environ.items() if k != "TMPDIR"}
+            seen = run("run", "--", "sh", "-c", "echo $TARVEL_ROOT", env=env)
+            self.assertRegex(seen.stdout, f"^{parent}/tarvellab-......\n$")
+            self.assertFalse(pathlib.Path(seen.stdout.strip()).exists())
+        seen = run("run", "--", "true", env={**os.environ, "TMPDIR": "/none"})
+        self.assertEqual(seen.returncode, 1)
+        self.assertRegex(seen.stderr, "^tarvellab: /none/tarvellab-......: No such file or directory\n$")
+        seen = run("run", "--", "true", env=self.env, preexec_fn=lambda: limit_files(1000))
+        self.assertEqual((seen.returncode, seen.stderr.count("File too large")), (1, 1))
+        self.assertTrue(self.nothing_left())
+
+    def test_ASignalThatCameBeforeTheCommandIsItsEnd(self):
+        def signalled():
+            signal.pthread_sigmask(signal.SIG_BLOCK, {signal.SIGTERM})
+            os.kill(os.getpid(), signal.SIGTERM)
+        seen = run("run", "--", "echo", "seen", env=self.env, preexec_fn=signalled)
+        self.assertEqual((seen.returncode, seen.stdout), (-signal.SIGTERM, ""))
         self.assertTrue(self.nothing_left())
 
     def test_CommandSeesACompleteKernel(self):

@@ -4,12 +4,15 @@
 usage: lab_table_test.py TARVELLAB [unittest options]
 """
 import collections
+import functools
+import os
 import pathlib
+import shutil
 import sys
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import LabTest, files, none, run, text, u32, u64  # noqa: E402
+from lab_kernel import LabTest, files, limit_files, node_dir, none, run, text, u32, u64  # noqa: E402
 
 
 class Generate(LabTest):
@@ -101,15 +104,39 @@ class Generate(LabTest):
         self.assertEqual(len(kernel.flows()), 4000)
         self.assertEqual([len(kernel.records("stats/" + n, size)) for n, size in (("userstack", 2496), ("arena", 2608))], [90, 41])
         self.assertEqual(len(list(kernel.chains("stats/netns", 32, 18, 32))), 25)
+        for size, table in ("arenas", "arena"), ("stacks", "userstack"), ("namespaces", "netns"):
+            self.assertEqual(self.generate("--" + size, 0).table("stats/" + table), b"")
 
     def test_WrongWordsAreUsageErrors(self):
         for words in ("", "nothing", "generate", "generate a b", "generate a --flows", "generate a --flows -1",
                       "generate a --flows 1x", "generate a --flows 99999999999", "generate a --interval 50", "run",
-                      "run --", "capture a --seed 1", "run a --flows 1 -- true", "simulate a --interval 0"):
+                      "run --", "capture a --seed 1", "run a --flows 1 -- true", "simulate a --interval 0", "generate a --seed x",
+                      "generate a --flows 10000001", "generate a --every 1", "generate a --count 1", "generate a --",
+                      "capture a --count 2 --every", "generate a --redact", "generate --seed 1"):
             failed = run(*words.split(), cwd=self.directory)
             self.assertEqual((failed.returncode, failed.stdout), (64, ""), words)
         self.assertEqual(list(self.directory.iterdir()), [])
-        self.assertEqual(run("generate", "/dev/null/a").returncode, 1)
+
+    def test_WhatCannotBeWrittenIsNamed(self):
+        flow, comm, made = node_dir + "stats/flow", "proc/94/comm", self.directory / "made"
+        link = functools.partial(os.symlink, "nowhere")
+        for path, make, named, reason in (
+                (flow, os.mkdir, flow, "Is a directory"), (comm, os.mkdir, comm, "Is a directory"),
+                ("proc/94", link, comm, "No such file or directory"), ("proc", pathlib.Path.touch, node_dir[:-1], "Not a directory"),
+                ("proc", link, node_dir[:-1], "No such file or directory"), ("", pathlib.Path.touch, node_dir[:-1], "Not a directory")):
+            for command in "generate", "simulate":
+                (made / path).parent.mkdir(parents=True, exist_ok=True)
+                make(made / path)
+                failed = run(command, made)
+                self.assertEqual((failed.returncode, failed.stdout, failed.stderr), (1, "", f"tarvellab: {made}/{named}: {reason}\n"))
+                made.unlink() if made.is_file() else shutil.rmtree(made)
+        for size, named in (0, "proc/\\d+/comm"), (1000, node_dir + ".*"):
+            failed = run("generate", made, preexec_fn=functools.partial(limit_files, size))
+            self.assertEqual(failed.returncode, 1)
+            self.assertRegex(failed.stderr, f"^tarvellab: {made}/{named}: File too large\n$")
+            self.assertEqual([name for name in files(made) if "/." in name], [])
+        for name in "/dev/null/a", "/proc/none/a":
+            self.assertEqual(run("generate", name).returncode, 1)
 
 
 if __name__ == "__main__":

@@ -49,8 +49,6 @@ def write_cases(torture, line, to):
         if to in ("pipe", "socket"):
             faults = [("w", turn, 1, SIGINT), ("w", turn, FOREVER, errno.EAGAIN)]
             yield line, faults, prefix_then(clean, "", 0, turn, torn), options
-            faults = [("w", turn, 1, SIGINT), ("w", turn, 1, errno.EAGAIN), ("w", turn + 1, 3, errno.EINTR)]
-            yield line, faults, prefix_then(clean, "", 0, torn=torn), options
     for error in (errno.EIO, errno.ENOSPC, errno.EDQUOT):
         if "c" in clean.calls:
             yield line, [("c", 1, 1, error)], exactly(clean.out, *error_end(error)), options

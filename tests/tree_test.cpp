@@ -231,9 +231,9 @@ TEST_F(show, ShowsPortsAndFlowsOfMultistackFlowSwitches) {
   name_on_terminal[1] = '?';
   kernel.table(provider_list, listed("bridge", 3, 0, {nowhere}) + listed("other", 3, 2, {channel_c}) +
                                   listed("none", 3, 1, {}) + listed(name, 0, 1, {nexus_b, nexus_a}));
-  kernel.table(channel_list, group(nexus_a, 6) + port(12, channel_c, 0x80000000) + port(2) +
+  kernel.table(channel_list, group(nexus_a, 6) + port(12, channel_c, 0x80000000) + port(2, mixed_uuid) +
                                  port(3).u32(20, 77) + port(1) + port(~0U) + port(0) + group(nowhere, 1) +
-                                 port(2));
+                                 port(2) + group(mixed_uuid, 1) + port(9));
   kernel.table(flow_list,
                flow_of(nexus_a, 2, 30, 53) + flow_of(nexus_a, 1, 9) + flow_of(nexus_a, 2, 2, 65535));
   const auto report = [](const std::string &shown, const std::string &defunct) {

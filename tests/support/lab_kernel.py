@@ -1,7 +1,9 @@
 """Reads the tables of a kernel directory by the offsets of their formats, and runs the lab."""
 import os
 import pathlib
+import resource
 import shutil
+import signal
 import struct
 import subprocess
 import sys
@@ -17,6 +19,12 @@ none = 0xFFFFFFFF  # in place of an index
 def run(*words, **options):
     options.setdefault("env", {k: v for k, v in os.environ.items() if k != "TARVEL_ROOT"})
     return subprocess.run([lab, *map(str, words)], capture_output=True, text=True, timeout=100, **options)
+
+
+def limit_files(size):
+    """For a process that is about to start: no file grows beyond a size."""
+    signal.signal(signal.SIGXFSZ, signal.SIG_IGN)
+    resource.setrlimit(resource.RLIMIT_FSIZE, (size, resource.RLIM_INFINITY))
 
 
 def u32(record, at):
