@@ -14,10 +14,15 @@ import random
 import re
 import resource
 import shutil
+import signal
 import subprocess
 import sys
+import time
 
-SOURCES = ["common/*.cpp", "common/*.h", "tarvelctl/*.cpp", "tarvelctl/*.h", "platform/linux/*.cpp"]
+# Decoders and bounds. What prints and writes has checks of its own: fuzzing against snprintf, writes that fail.
+SOURCES = ["common/[!op]*.cpp", "common/process_names.cpp", "common/provider.*", "common/record_walk.h",
+           "common/channel*.h", "common/flow.h", "common/netns.h", "tarvelctl/[!t]*.cpp", "tarvelctl/tree.cpp",
+           "platform/linux/[!dm]*.cpp"]
 OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
     (r" < ", " <= "), (r" <= ", " < "), (r" > ", " >= "), (r" >= ", " > "), (r" == ", " != "), (r" != ", " == "),
     (r" \+ ", " - "), (r" - ", " + "), (r" \* ", " / "), (r" % ", " / "), (r" && ", " || "), (r" \|\| ", " && "),
@@ -26,9 +31,9 @@ OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
     (r"(?<![\w.\"'\\])(\d+)(?![\w.\"'])", lambda found: str(int(found[1]) + 1)),
     (r"^(\s+)[\w.:>-]+\(.*\);$", r"\1;"), (r"^(\s+)\+\+[\w.]+;$", r"\1;"), (r"^(\s+)if \(.*\) (return|continue)\b.*;$", r"\1;"),
 ]]
-# Where a fault says nothing of a decoder or a bound.
-LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|template|using|inline constexpr std::size_t slack)|prefetch|reserve\(|"
-                      r"static_assert|print<|complain<|\"")
+# Where a fault says nothing of a decoder or a bound, or cannot be seen.
+LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|template|using)|prefetch|reserve\(|static_assert|print<|complain<|\"|"
+                      r"netstat_options\.\S+ = 1|report\.flush|read_ahead|forget_scopes")
 TESTS = ["unit_tests", "blocking_output_tests", "kernel_table_tests", "flow_naming_tests", "program_tests"]
 SHARDS = 4
 # What is asked where those notice nothing, because it takes longer.
@@ -63,10 +68,22 @@ def is_noticed(build):
     for name in TESTS:
         for shard in range(SHARDS if name == "program_tests" else 1):
             sharding = {"GTEST_TOTAL_SHARDS": str(SHARDS), "GTEST_SHARD_INDEX": str(shard)} if name == "program_tests" else {}
-            running.append(subprocess.Popen(["timeout", "40", build / "tests" / name, "--gtest_fail_fast", "--gtest_brief=1"],
+            running.append(subprocess.Popen([build / "tests" / name, "--gtest_fail_fast", "--gtest_brief=1"],
                                             env={**os.environ, **sharding}, stdout=subprocess.DEVNULL,
-                                            stderr=subprocess.DEVNULL))
-    return any([each.wait() for each in running])
+                                            stderr=subprocess.DEVNULL, start_new_session=True))
+    end = time.monotonic() + 40
+    while any(each.poll() is None for each in running) and not any(each.poll() for each in running):
+        if time.monotonic() > end:
+            break
+        time.sleep(0.02)
+    noticed = any(each.poll() != 0 for each in running)
+    for each in running:
+        try:
+            os.killpg(each.pid, signal.SIGKILL)
+        except ProcessLookupError:
+            pass
+        each.wait()
+    return noticed
 
 
 def is_noticed_by_drivers(build, make):
@@ -95,8 +112,8 @@ def main():
     build = options.copy / "build"
     subprocess.run(["cmake", "-S", options.copy, "-B", build, "-G", "Ninja", "-DCMAKE_BUILD_TYPE=Debug",
                     "-DTARVELCTL_BENCH=OFF", "-DCMAKE_CXX_FLAGS=-O0 -g0"], check=True, stdout=subprocess.DEVNULL)
-    make = ["cmake", "--build", build, "--target", "tarvelctl", "tarvellab", *TESTS]
-    subprocess.run(make, check=True, stdout=subprocess.DEVNULL)
+    make = ["cmake", "--build", build, "--target", "tarvelctl", *TESTS]
+    subprocess.run([*make, "tarvellab"], check=True, stdout=subprocess.DEVNULL)
     if is_noticed(build) or is_noticed_by_drivers(build, make):
         sys.exit("the tests fail without any fault")
 
@@ -118,6 +135,8 @@ def main():
             else:
                 print(f"survivor: {name}:{number + 1}: {before}  ->  {changed.strip()}", flush=True)
         path.write_text(original)
+        if made % 20 == 0:
+            print(f"{noticed} of {made} so far", flush=True)
     print(f"{noticed} of {made} faults are noticed, drawn from {len(drawn)} places")
     missed = noticed < options.wanted * made
     print(f"mutation: {made} runs, {made} faults injected, {int(missed)} findings")

@@ -143,7 +143,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   fuzz::surroundings around;
   around.is_terminal = data[1] & 1;
   const fuzz::bytes name = rest.last(std::min<std::size_t>(rest.size(), 20));
-  if (data[1] & 2) around.name = std::string(name.begin(), name.end()).c_str();
+  if (data[1] & 2) around.name.assign(name.begin(), std::find(name.begin(), name.end(), 0));
   around.sleeps = 2;
   std::uint16_t sizes[2];
   std::memcpy(sizes, data + 4, sizeof sizes);
