@@ -202,6 +202,22 @@ TEST_F(platform_test, LiveMachineIsSeenOnlyWithoutAnotherRoot) {
   EXPECT_EQ(data, expected);
 }
 
+TEST_F(platform_test, DescriptorsAreGivenBack) {
+  kernel.table(node, "ten bytes.").table("kern.switch", "1").process(25, "init\n");
+  const auto count = [] {
+    return std::distance(std::filesystem::directory_iterator("/proc/self/fd"),
+                         std::filesystem::directory_iterator());
+  };
+  const auto before = count();
+  for (int round = 0; round < 3; ++round) {
+    EXPECT_EQ(read("kern.switch", 1), (answer{0, 1}));
+    EXPECT_EQ(read(node, 10), (answer{0, 10}));
+    EXPECT_EQ(measure("kern.tarvel.stats").first, EISDIR);
+    EXPECT_EQ(process_name(25), "init");
+  }
+  EXPECT_EQ(count(), before);
+}
+
 TEST_F(process_test, NameIsTheTextUpToItsLineEndCutAt15Bytes) {
   const std::pair<std::string, const char *> cases[] = {
       {"init\n", "init"},
