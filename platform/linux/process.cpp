@@ -14,7 +14,6 @@ bool query_process_name(int pid, char (&name)[process_name_size]) {
   char path[32];
   std::snprintf(path, sizeof path, "%d/comm", pid);
   kernel_file file(path);
-  if (!file.is_open()) return false;
   char text[process_name_size];
   long length = file.read(text, sizeof text);
   if (length <= 0) return false;
