@@ -26,8 +26,7 @@ def lines(torture):
             *(f"netns -i {address} -p {protocol}" for protocol, address in namespaces[:2]),
             f"netstat {ALL}", f"netstat {ALL} -n --global --show-zeros", f"netstat --netif -s -p tcp --pid {pid}",
             f"netstat --uuid {nexus} {ALL}", *(f"-w 1 {line}" for line in (
-                "channel", "provider", "flow", "memory", "netns -a", "netns -i global -p tcp", "netstat -s -a", "show",
-                "tree"))]
+                *TABLE, "channel", "netns -a", "netns -i global -p tcp", "netstat -s -a", "show", "tree"))]
 
 
 class Ended(Exception):
