@@ -190,7 +190,8 @@ TEST(flow_naming, ScopesAreShownAsTheSystemHasThem) {
                          {0x103, "fe80::7%interface-of-16c"},
                          {0x104, "fe80:104::7"},
                          {0x105, whole.c_str()},
-                         {0x106, "fe80::7%en0"}}};
+                         {0x106, "fe80::7%en0"},
+                         {0x107, "fe80:0:1111:2222:3333:4444:5555:6666%interface-of-16c"}}};
   const std::pair<const char *, std::string> texts[] = {
       {"fe80:101::7", "?"},
       {"fe80:102::7", "fe80::7%interface-of-15"},
@@ -198,7 +199,9 @@ TEST(flow_naming, ScopesAreShownAsTheSystemHasThem) {
       {"fe80:103::7", "fe80::7%interface-of-16c"},
       {"fe80:105::7", cut},
       {"fe80:106::7", "fe80::7%en0"},
-      {"fe80:102:1111:2222:3333:4444:5555:6666", "fe80:0:1111:2222:3333:4444:5555:6666%interface-of"}};
+      {"fe80:102:1111:2222:3333:4444:5555:6666", "fe80:0:1111:2222:3333:4444:5555:6666%interface-of"},
+      {"fe80:107:1111:2222:3333:4444:5555:6666", "fe80:0:1111:2222:3333:4444:5555:6666%interface-of"},
+      {"fe80:107::7", "fe80:0:1111:2222:3333:4444:5555:6666%interface-of"}};
   for (const auto &[address, text] : texts) {
     for (int times = 0; times < 2; ++times) EXPECT_EQ(host6(address, true), text);
   }
