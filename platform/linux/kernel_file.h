@@ -31,8 +31,8 @@ class kernel_file {
   // delivers.
   std::size_t stated_size() const { return stated_size_; }
 
-  // Reads on until `size` bytes are there or the file ends. Returns the number read, or -1 with errno set, also
-  // where no file is open.
+  // Reads on until `size` bytes are there or the file ends. Returns the number read, or -1 with errno set,
+  // also where no file is open.
   long read(void *to, std::size_t size);
 
   // Lets the next read begin at the front again, where the kernel then says what holds now.
