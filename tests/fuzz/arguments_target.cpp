@@ -2,9 +2,8 @@
 
 #include <algorithm>
 #include <array>
-#include <cstring>
+#include <utility>
 
-#include "tarvelctl/command.h"
 #include "tests/fuzz/harness.h"
 
 namespace {
@@ -33,22 +32,13 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   for (const auto &each : tables)
     around.tables.push_back({each.node, fuzz::bytes(no_bytes).first(each.size)});
 
-  std::string text(reinterpret_cast<const char *>(data + 1), size - 1);
-  std::vector<char *> argv;
-  for (char *word = text.data(); word < text.data() + text.size(); word += std::strlen(word) + 1)
-    argv.push_back(word);
-  const int argc = static_cast<int>(argv.size());
-  argv.push_back(nullptr);
-  struct call {
-    int argc;
-    char **argv;
-  } call{argc, argv.data()};
-  const fuzz::outcome &seen = fuzz::observe(
-      around,
-      [](void *of) {
-        run_command_line(static_cast<struct call *>(of)->argc, static_cast<struct call *>(of)->argv);
-      },
-      &call);
+  std::vector<std::string> words;
+  for (fuzz::bytes rest(data + 1, size - 1); !rest.empty();) {
+    const auto end = std::find(rest.begin(), rest.end(), 0);
+    words.emplace_back(rest.begin(), end);
+    rest = rest.subspan(std::min(rest.size(), words.back().size() + 1));
+  }
+  const fuzz::outcome &seen = fuzz::observe(around, std::move(words));
   fuzz::expect_readable(seen.report, false);
   fuzz::expect(!seen.assertion, "whole tables fail an assertion", seen.assertion ? seen.assertion : "");
   fuzz::expect(!seen.has_exited || seen.status == 0 || seen.status == 64, "an exit status of no meaning",

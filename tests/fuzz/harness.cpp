@@ -73,7 +73,10 @@ const surroundings::table *find_table(std::string_view node) {
 
 }  // namespace
 
-const outcome &observe(const surroundings &given, void (*body)(void *), void *context) {
+const outcome &observe(const surroundings &given, std::vector<std::string> words) {
+  std::vector<char *> argv;
+  for (std::string &word : words) argv.push_back(word.data());
+  argv.push_back(nullptr);
   around = &given;
   sleeps_left = given.sleeps;
   reads.clear();
@@ -83,7 +86,7 @@ const outcome &observe(const surroundings &given, void (*body)(void *), void *co
   attach_outputs();
   if (setjmp(exit_point) == 0) {
     try {
-      body(context);
+      run_command_line(static_cast<int>(words.size()), argv.data());
     } catch (const assertion_failed &failure) {
       result.assertion = failure.expression;
     } catch (const watch_ended &) {

@@ -39,9 +39,9 @@ struct outcome {
   int status = 0;  // of the exit
 };
 
-// Calls `body`, which may run anything of the program's, in these surroundings. The outcome is overwritten by
-// the next call.
-const outcome &observe(const surroundings &around, void (*body)(void *), void *context);
+// Runs a command line, the program's name included, in these surroundings. The outcome is overwritten by the
+// next call.
+const outcome &observe(const surroundings &around, std::vector<std::string> words);
 
 // Ends the fuzzer with a message where it does not hold.
 void expect(bool holds, const char *what, std::string_view seen = {});

@@ -16,7 +16,6 @@
 #include "common/flow.h"
 #include "common/netns.h"
 #include "common/provider.h"
-#include "tarvelctl/command.h"
 #include "tests/fuzz/harness.h"
 
 namespace {
@@ -95,38 +94,30 @@ const target &the_target() {
   return found;
 }
 
+std::string uuid_at(fuzz::bytes at) {
+  unsigned char uuid[16] = {};
+  std::copy_n(at.begin(), std::min(at.size(), sizeof uuid), uuid);
+  char text[UUID_STR_LEN];
+  uuid_unparse_upper(uuid, text);
+  return text;
+}
+
+std::string number_at(fuzz::bytes at) {
+  std::int32_t number = 0;
+  if (at.size() >= sizeof number) std::memcpy(&number, at.data(), sizeof number);
+  return std::to_string(number);
+}
+
 // A command line as entries, with what "@" and "#" stand for.
-class command_line {
- public:
-  command_line(std::string_view text, fuzz::bytes at) : words_{"tarvelctl"} {
-    while (!text.empty()) {
-      const std::string_view word = text.substr(0, text.find(' '));
-      words_.push_back(word == "@" ? uuid_at(at) : word == "#" ? number_at(at) : std::string(word));
-      text.remove_prefix(std::min(text.size(), word.size() + 1));
-    }
-    for (std::string &word : words_) argv_.push_back(word.data());
-    argv_.push_back(nullptr);
+std::vector<std::string> entries(std::string_view text, fuzz::bytes at) {
+  std::vector<std::string> words{"tarvelctl"};
+  while (!text.empty()) {
+    const std::string_view word = text.substr(0, text.find(' '));
+    words.push_back(word == "@" ? uuid_at(at) : word == "#" ? number_at(at) : std::string(word));
+    text.remove_prefix(std::min(text.size(), word.size() + 1));
   }
-
-  [[noreturn]] void run() { run_command_line(static_cast<int>(words_.size()), argv_.data()); }
-
- private:
-  static std::string uuid_at(fuzz::bytes at) {
-    unsigned char uuid[16] = {};
-    std::copy_n(at.begin(), std::min(at.size(), sizeof uuid), uuid);
-    char text[UUID_STR_LEN];
-    uuid_unparse_upper(uuid, text);
-    return text;
-  }
-  static std::string number_at(fuzz::bytes at) {
-    std::int32_t number = 0;
-    if (at.size() >= sizeof number) std::memcpy(&number, at.data(), sizeof number);
-    return std::to_string(number);
-  }
-
-  std::vector<std::string> words_;
-  std::vector<char *> argv_;
-};
+  return words;
+}
 
 fuzz::bytes take(fuzz::bytes &input, std::size_t size) {
   const fuzz::bytes taken = input.first(std::min(size, input.size()));
@@ -155,9 +146,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   for (const char *node : object_nodes) around.tables.push_back({node, {}});
 
   const std::string_view words = target.commands[data[0] % target.commands.size()];
-  command_line line(words, rest.subspan(rest.empty() ? 0 : data[3] * 4 % rest.size()));
-  const fuzz::outcome &seen = fuzz::observe(
-      around, [](void *of) { static_cast<command_line *>(of)->run(); }, &line);
+  const fuzz::bytes place = rest.subspan(rest.empty() ? 0 : data[3] * 4 % rest.size());
+  const fuzz::outcome &seen = fuzz::observe(around, entries(words, place));
   fuzz::expect_readable(seen.report, around.is_terminal);
   if (seen.assertion) {
     fuzz::expect(std::count(target.assertions.begin(), target.assertions.end(), seen.assertion) > 0,
