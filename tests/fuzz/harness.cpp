@@ -75,6 +75,7 @@ const surroundings::table *find_table(std::string_view node) {
 
 const outcome &observe(const surroundings &given, std::vector<std::string> words) {
   std::vector<char *> argv;
+  argv.reserve(words.size() + 1);
   for (std::string &word : words) argv.push_back(word.data());
   argv.push_back(nullptr);
   around = &given;
