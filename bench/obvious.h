@@ -76,9 +76,14 @@ static inline size_t channel_size(const struct channel *channel) {
   return sizeof *channel + ((size_t)channel->tx_rings + channel->rx_rings) * sizeof(struct ring);
 }
 
-// Names of the counters of a protocol stack, each list closed by an empty name.
-extern const char *const ip_counter_names[], *const ip6_counter_names[];
-extern const char *const tcp_counter_names[], *const udp_counter_names[];
+// Names of the counters of a protocol stack: the tables of tarvelctl.
+struct counter_name {
+  char text[24];
+  size_t unread_1;
+  uint8_t unread_2;
+};
+extern const struct counter_name ip_counter_names[], ip6_counter_names[];
+extern const struct counter_name tcp_counter_names[], udp_counter_names[];
 
 // Reads a variable such as "stats/flow" whole. The program ends where that fails.
 void *read_table(const char *root, const char *name, size_t *size);

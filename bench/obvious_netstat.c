@@ -10,11 +10,11 @@ struct stack {
   uint64_t ip[43], unread_2, ip6[36], tcp[203], unread_3, udp[22];
 };
 
-static void print_section(const char *title, const char *const *names, const uint64_t *counters,
+static void print_section(const char *title, const struct counter_name *names, const uint64_t *counters,
                           size_t count) {
   printf("\t%s:\n", title);
   for (size_t i = 0; i < count; i++) {
-    if (counters[i]) printf("\t\t%-16s: %llu\n", names[i], (unsigned long long)counters[i]);
+    if (counters[i]) printf("\t\t%-16s: %llu\n", names[i].text, (unsigned long long)counters[i]);
   }
 }
 

@@ -3,7 +3,7 @@
 #include <iterator>
 
 // IP, of a user-space stack.
-const char *const ip_counter_names[] = {
+constinit const counter_name ip_counter_names[] = {
     "TotalRcvd",  "BadCsum",   "PktTooShort", "DataTooSmall", "BadHdrLen",  "BadLen",      "FragRcvd",
     "FragDrop",   "FragTimeO", "Fwd",         "FastFwd",      "CantFwd",    "FwdSameNet",  "UnkwnProto",
     "Delivered",  "LocalOut",  "DropNoBuf",   "Reassembled",  "Fragmented", "OutFraged",   "CantFrag",
@@ -14,7 +14,7 @@ const char *const ip_counter_names[] = {
 };
 
 // IPv6, of a user-space stack.
-const char *const ip6_counter_names[] = {
+constinit const counter_name ip6_counter_names[] = {
     "TotalRcvd",
     "PktTooShort",
     "DataTooSmall",
@@ -55,7 +55,7 @@ const char *const ip6_counter_names[] = {
 };
 
 // TCP, of a user-space stack.
-const char *const tcp_counter_names[] = {
+constinit const counter_name tcp_counter_names[] = {
     "ConnInit",
     "ConnAcpt",
     "ConnEst",
@@ -263,7 +263,7 @@ const char *const tcp_counter_names[] = {
 };
 
 // UDP, of a user-space stack.
-const char *const udp_counter_names[] = {
+constinit const counter_name udp_counter_names[] = {
     "InPkt",       "HdrDrop",          "BadCsum",    "BadLen",
     "NoPort",      "NoPortBCast",      "FullSock",   "PCBCacheMiss",
     "PCBHashMiss", "OutPkt",           "FastOut",    "NoCsum",
@@ -273,7 +273,7 @@ const char *const udp_counter_names[] = {
 };
 
 // A network interface nexus.
-const char *const net_if_counter_names[] = {
+constinit const counter_name net_if_counter_names[] = {
     "TxIRQ",        "TxSYNC",       "TxRepl",     "TxPkt",        "RxIRQ",         "RxSYNC",
     "RxPkt",        "MitTxIRQ",     "MitRxIRQ",   "Dropped",      "NoMemPkt",      "NoMemMbuf",
     "BadLen",       "TxCopySum",    "TxCopyMbuf", "TxCopyDirect", "RxCopySum",     "RxCopyMbuf",
@@ -282,7 +282,7 @@ const char *const net_if_counter_names[] = {
 };
 
 // A flow-switch nexus.
-const char *const flow_switch_counter_names[] = {
+constinit const counter_name flow_switch_counter_names[] = {
     "Dropped",
     "BadLenPkt",
     "NoMemPkt",

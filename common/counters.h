@@ -21,13 +21,15 @@ inline constexpr std::size_t ip6_counter_count = 36;
 inline constexpr std::size_t tcp_counter_count = 203;
 inline constexpr std::size_t udp_counter_count = 22;
 
+using counter_name = format::small_text<24>;
+
 // The names of the counters of a block, by position. Each list is closed by an empty name.
-extern const char *const net_if_counter_names[];
-extern const char *const flow_switch_counter_names[];
-extern const char *const ip_counter_names[];
-extern const char *const ip6_counter_names[];
-extern const char *const tcp_counter_names[];
-extern const char *const udp_counter_names[];
+extern const counter_name net_if_counter_names[];
+extern const counter_name flow_switch_counter_names[];
+extern const counter_name ip_counter_names[];
+extern const counter_name ip6_counter_names[];
+extern const counter_name tcp_counter_names[];
+extern const counter_name udp_counter_names[];
 
 // What the records of both nexus tables begin with.
 struct tv_stats_nexus_head {

@@ -1,41 +1,39 @@
 #include "common/flow_naming.h"
 
+#include <netinet/in.h>
+
 #include <array>
 #include <iterator>
 
-const char *proto_name(std::uint8_t protocol) {
-  constexpr std::uint8_t tcp = 6;
-  constexpr std::uint8_t udp = 17;
-  return protocol == tcp ? "tcp" : protocol == udp ? "udp" : "unk.";
+const format::name_text &proto_name(std::uint8_t protocol) {
+  static constexpr format::name_text tcp = "tcp";
+  static constexpr format::name_text udp = "udp";
+  static constexpr format::name_text unknown = "unk.";
+  return protocol == IPPROTO_TCP ? tcp : protocol == IPPROTO_UDP ? udp : unknown;
 }
 
 const format::name_text &flow_state_name(std::uint32_t state) {
-  using format::name;
-  static constexpr format::name_text unknown = name("UNKNOWN");
+  static constexpr format::name_text unknown = "UNKNOWN";
   static constexpr format::name_text names[] = {
-      name("CLOSED"),      name("LISTEN"),     name("SYN_SENT"),   name("SYN_RCVD"),
-      name("ESTABLISHED"), name("CLOSE_WAIT"), name("FIN_WAIT_1"), name("CLOSING"),
-      name("LAST_ACK"),    name("FIN_WAIT_2"), name("TIME_WAIT"),
+      "CLOSED",     "LISTEN",  "SYN_SENT", "SYN_RCVD",   "ESTABLISHED", "CLOSE_WAIT",
+      "FIN_WAIT_1", "CLOSING", "LAST_ACK", "FIN_WAIT_2", "TIME_WAIT",
   };
   // States of flows without connection state.
   static constexpr std::uint32_t first_connectionless = 20;
-  static constexpr format::name_text connectionless[] = {name("NO_TRAFFIC"), name("SINGLE"),
-                                                         name("MULTIPLE")};
+  static constexpr format::name_text connectionless[] = {"NO_TRAFFIC", "SINGLE", "MULTIPLE"};
   if (state < std::size(names)) return names[state];
   const std::uint32_t rest = state - first_connectionless;  // far above where the state is below
   return rest < std::size(connectionless) ? connectionless[rest] : unknown;
 }
 
 const format::name_text &svc_class_name(std::int32_t service_class) {
-  using format::name;
-  static constexpr format::name_text unknown = name("UNK");
+  static constexpr format::name_text unknown = "UNK";
   static constexpr struct {
     std::int32_t value;
     format::name_text label;
   } classes[] = {
-      {0x000000, name("BE")},  {0x080090, name("BKS")}, {0x100080, name("BK")}, {0x180010, name("RD")},
-      {0x200020, name("OAM")}, {0x280120, name("AV")},  {0x300110, name("RV")}, {0x380100, name("VI")},
-      {0x400180, name("VO")},  {0x480190, name("CTL")},
+      {0x000000, "BE"}, {0x080090, "BKS"}, {0x100080, "BK"}, {0x180010, "RD"}, {0x200020, "OAM"},
+      {0x280120, "AV"}, {0x300110, "RV"},  {0x380100, "VI"}, {0x400180, "VO"}, {0x480190, "CTL"},
   };
   for (const auto &entry : classes) {
     if (entry.value == service_class) return entry.label;

@@ -10,7 +10,7 @@
 #include "common/socket_address.h"
 
 // "tcp", "udp" or "unk." for an IP protocol number.
-const char *proto_name(std::uint8_t protocol);
+const format::name_text &proto_name(std::uint8_t protocol);
 
 // The name of an endpoint's state, or "UNKNOWN".
 const format::name_text &flow_state_name(std::uint32_t state);

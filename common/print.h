@@ -47,6 +47,14 @@ struct small_text {
   std::size_t size = 0;
   bool foreign = false;
 
+  small_text() = default;
+
+  // A constant, terminated.
+  template <std::size_t N>
+  requires(N <= Capacity) consteval small_text(const char (&text)[N]) : chars{}, size(N - 1) {
+    std::copy_n(text, N, chars);
+  }
+
   std::string_view view() const { return {chars, size}; }
 
   // Sets the size to where appending to `chars` ended.
@@ -56,22 +64,15 @@ struct small_text {
 // A name in a constant table: what is known to be short is copied without asking how long it is.
 using name_text = small_text<16>;
 
-template <std::size_t N>
-consteval name_text name(const char (&text)[N]) {
-  static_assert(N <= sizeof(name_text::chars));
-  name_text result{};
-  std::copy_n(text, N, result.chars);
-  result.size = N - 1;
-  return result;
-}
-
 // Bytes that any step may write past what it appends; every sink's room() leaves as many.
 inline constexpr std::size_t slack = 64;
 
-// Appends blanks. What fits in the slack is written whole, whatever the count: a constant size needs no call.
-inline char *put_blanks(char *to, std::size_t count) {
-  std::memset(to, ' ', slack);
-  if (count > slack) std::memset(to + slack, ' ', count - slack);
+// Appends at most `Most` blanks. What fits in the slack is written whole, whatever the count: a constant size
+// needs no call.
+template <std::size_t Most>
+char *put_blanks(char *to, std::size_t count) {
+  std::memset(to, ' ', std::min(Most, slack));
+  if (Most > slack && count > slack) std::memset(to + slack, ' ', count - slack);
   return to + count;
 }
 
@@ -157,8 +158,10 @@ std::size_t shown_size(std::size_t size) {
 // The bytes that `piece` may need for an argument, beside its literal text.
 template <piece P, class T>
 std::size_t bound(const T &argument) {
-  if constexpr (P.kind == 's') {
+  if constexpr (P.kind == 's' && std::same_as<T, text_view>) {
     return std::max(P.width, shown_size<P>(argument.size));
+  } else if constexpr (P.kind == 's') {
+    return std::max(P.width, shown_size<P>(sizeof argument.chars));
   } else {
     return std::max(P.width, std::floating_point<T> ? double_size : 24);
   }
@@ -179,8 +182,8 @@ template <piece P, std::size_t Readable = 0>
 char *put_padded(char *to, const char *text, std::size_t size) {
   if constexpr (P.width == 0) return put_bytes<Readable>(to, text, size);
   const std::size_t padding = P.width > size ? P.width - size : 0;
-  if constexpr (P.left) return put_blanks(put_bytes<Readable>(to, text, size), padding);
-  return put_bytes<Readable>(put_blanks(to, padding), text, size);
+  if constexpr (P.left) return put_blanks<P.width>(put_bytes<Readable>(to, text, size), padding);
+  return put_bytes<Readable>(put_blanks<P.width>(to, padding), text, size);
 }
 
 template <piece P, std::size_t Readable = 0>
@@ -203,10 +206,10 @@ char *put_decimal(char *to, std::uint64_t magnitude, bool negative) {
     return put_digits(to, magnitude, digits);
   }
   const std::size_t padding = P.width > size ? P.width - size : 0;
-  if (!P.left) to = put_blanks(to, padding);
+  if (!P.left) to = put_blanks<P.width>(to, padding);
   if (negative) *to++ = '-';
   to = put_digits(to, magnitude, digits);
-  return P.left ? put_blanks(to, padding) : to;
+  return P.left ? put_blanks<P.width>(to, padding) : to;
 }
 
 template <piece P, std::unsigned_integral T>

@@ -4,11 +4,11 @@
 
 namespace lab {
 
-counter_recipe::counter_recipe(const char *const *names, std::span<const ingredient> ingredients)
+counter_recipe::counter_recipe(const counter_name *names, std::span<const ingredient> ingredients)
     : ingredients_(ingredients) {
   for (const ingredient &row : ingredients) {
     std::size_t position = 0;
-    while (*names[position] && row.counter != names[position]) ++position;
+    while (names[position].size && row.counter != names[position].view()) ++position;
     positions_.push_back(position);
   }
 }

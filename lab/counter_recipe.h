@@ -10,6 +10,8 @@
 #include <string_view>
 #include <vector>
 
+#include "common/counters.h"
+
 namespace lab {
 
 // Adds `times` for each `per` of a source to the counter of this name. A counter may have several. Where they
@@ -24,7 +26,7 @@ struct ingredient {
 class counter_recipe {
  public:
   // `names` ends with an empty one; every ingredient's counter is among them.
-  counter_recipe(const char *const *names, std::span<const ingredient> ingredients);
+  counter_recipe(const counter_name *names, std::span<const ingredient> ingredients);
 
   // Sets the counters that have ingredients, by the values of the sources.
   void fill(std::span<std::uint64_t> counters, std::span<const std::uint64_t> sources) const;

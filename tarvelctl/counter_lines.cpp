@@ -3,9 +3,9 @@
 #include "common/output.h"
 #include "tarvelctl/netstat_options.h"
 
-void print_counters(const char *const *names, std::span<const std::uint64_t> counters) {
+void print_counters(const counter_name *names, std::span<const std::uint64_t> counters) {
   for (const std::uint64_t value : counters) {
-    const char *name = *names++;
+    const counter_name &name = *names++;
     if (value || netstat_options.show_zeros) print<"\t\t%-16s: %llu\n">(name, value);
   }
 }

@@ -32,7 +32,7 @@ format::name_text index_text(std::uint32_t index) {
 
 // A round-trip time in milliseconds, or as many blanks where none was measured.
 format::small_text<32> rtt_text(std::uint32_t microseconds) {
-  if (microseconds == 0) return {.chars = "          ", .size = 10};
+  if (microseconds == 0) return "          ";
   return format::text_of<"%7.2f ms", 32>(static_cast<float>(microseconds) / 1000);
 }
 
@@ -52,9 +52,9 @@ void print_endpoints(const tv_stats_flow &flow, const char *protocol) {
 }
 
 void print_flow(const tv_stats_flow &flow) {
-  const char *protocol = proto_name(flow.sf_protocol);
+  const format::name_text &protocol = proto_name(flow.sf_protocol);
   print<"%4s">(protocol);
-  print_endpoints(flow, protocol);
+  print_endpoints(flow, protocol.chars);
   const tv_flow_endpoint_stats &local = flow.sf_lstats;
   const tv_flow_endpoint_stats &remote = flow.sf_rstats;
   print<" %-12llu %-12llu %-10llu %-10llu %-3s %-8s %-4s %-3s %s %-12s %-12s%s  %s %-3s %s.%d\n">(

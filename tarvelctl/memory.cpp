@@ -14,10 +14,10 @@
 
 namespace {
 
-constexpr const char *arena_types[] = {"NEXUS", "PLCY", "SYSTEM"};
+constexpr format::name_text arena_types[] = {"NEXUS", "PLCY", "SYSTEM"};
 
-constexpr const char *region_types[] = {"SCHEMA",  "RING",     "BUF",     "MDU", "USD", "USTATS",
-                                        "FLOWADV", "NEXUSADV", "SYSCTLS", "MDK", "KSD", "KSTATS"};
+constexpr format::name_text region_types[] = {"SCHEMA",  "RING",     "BUF",     "MDU", "USD", "USTATS",
+                                              "FLOWADV", "NEXUSADV", "SYSCTLS", "MDK", "KSD", "KSTATS"};
 
 constexpr char region_mode_names[] =
     "\20"
@@ -32,9 +32,10 @@ constexpr char region_mode_names[] =
 // Outlives a run of the watch loop: a region counts with what it had when it was first seen.
 region_set tv_region_set;
 
-const char *type_name(std::span<const char *const> names, std::int32_t type) {
-  return type >= 0 && static_cast<std::size_t>(type) < names.size() ? names[static_cast<std::size_t>(type)]
-                                                                    : "UNKNOWN";
+const format::name_text &type_name(std::span<const format::name_text> names, std::int32_t type) {
+  static constexpr format::name_text unknown = "UNKNOWN";
+  const auto index = static_cast<std::size_t>(type);
+  return index < names.size() ? names[index] : unknown;
 }
 
 void print_separator(char character) {

@@ -20,7 +20,7 @@ template <class Record>
 struct counter_report {
   const char *node;
   const char *title;
-  const char *const *counter_names;
+  const counter_name *counter_names;
   invariant whole_records;
 
   int run() const;

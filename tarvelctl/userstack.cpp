@@ -16,7 +16,7 @@ namespace {
 struct protocol {
   const char *name;
   int netstat_settings::*selected;
-  const char *const *counter_names;
+  const counter_name *counter_names;
   std::span<std::uint64_t> (*counters)(tv_stats_userstack &stack);
 };
 
