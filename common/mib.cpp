@@ -120,13 +120,11 @@ int object_tree::scrape_flows() {
   if (const int error = flows_.fetch(flow_node)) return error;
   require(flows_.size() % sizeof(tv_stats_flow) == 0,
           {"scrape_flows", "common/mib", 223, "(length % sizeof (*sf)) == 0"});
-  // The flows of a channel get numbers in a row, in the order in which the tree is walked.
-  std::vector<sort_key> by_channel = find_channels();
-  sort_keys(by_channel);
-  nodes_.reserve(nodes_.size() + by_channel.size());
-  for (const sort_key key : by_channel) {
-    const std::byte *const at = flows_.bytes().data() + position_of(key) * sizeof(tv_stats_flow);
-    append_child(number_of(key), {.uuid = {}, .type = object_type::flow, .payload = at});
+  flow_keys_ = find_channels();
+  sort_keys(flow_keys_);
+  for (std::uint32_t i = 0; i < flow_keys_.size(); ++i) {
+    object_node &channel = nodes_[number_of(flow_keys_[i])].node;
+    if (channel.flow_count++ == 0) channel.first_flow = i;
   }
   return 0;
 }
@@ -161,7 +159,7 @@ object_id object_tree::append_child(object_id parent, const object_node &child) 
   nodes_.push_back({.node = child, .depth = over.depth + 1, .jump = jump});
   nodes_[id].node.parent = parent;
   object_node &above = nodes_[parent].node;
-  if (above.has_children()) {
+  if (above.first_child != no_object) {
     nodes_[above.last_child].node.next_sibling = id;
   } else {
     above.first_child = id;
@@ -176,7 +174,7 @@ void object_tree::release_children(object_id top) {
   while (id != no_object) {
     nodes_[id].released = true;
     const object_node *node = &nodes_[id].node;
-    if (node->has_children()) {
+    if (node->first_child != no_object) {
       id = node->first_child;
       continue;
     }

@@ -16,17 +16,17 @@
 #include "common/sort_key.h"
 #include "common/uuid_index.h"
 
-// What a node stands for, and what its payload is.
+// What an object is, and what the payload of its node is.
 enum class object_type : std::uint32_t {
   root,            // the single root, with the null UUID; no payload
   nexus_provider,  // nexus_provider_parameters
   nexus,           // no payload
   channel,         // channel_entry, its ring blocks behind it
-  flow,            // tv_stats_flow; has the null UUID
+  flow,            // has no node of its own; shown with the null UUID
 };
 
 // "root", "nexus_provider", ..., or "???" for a value that is none.
-const char *object_type_name(object_type type);
+const format::name_text &object_type_name(object_type type);
 
 // A node, known by its number. Numbers are good as long as the tree.
 using object_id = std::uint32_t;
@@ -39,9 +39,11 @@ struct object_node {
   object_id first_child = no_object;
   object_id last_child = no_object;
   object_id next_sibling = no_object;
+  std::uint32_t first_flow = 0;  // for object_tree::for_each_flow()
+  std::uint32_t flow_count = 0;
   const std::byte *payload = nullptr;  // in the table that it came from
 
-  bool has_children() const { return first_child != no_object; }
+  bool has_children() const { return first_child != no_object || flow_count != 0; }
 
   // The payload's record, or its fixed part.
   template <class Record>
@@ -54,6 +56,9 @@ struct object_node {
 
 // The tree, as three snapshots taken one after the other give it. It owns the three tables, whose records are
 // its nodes' payloads. However deep a table makes the tree, walking and releasing it takes no more stack.
+//
+// Flows are by far the most objects, and have neither a UUID of their own nor children: they are no nodes,
+// but the last children of the node that they belong to.
 class object_tree {
  public:
   static constexpr object_id root = 0;
@@ -65,18 +70,21 @@ class object_tree {
 
   const object_node &operator[](object_id id) const { return nodes_[id].node; }
 
-  // Told that a flow is about to be read, asks for those that follow to be in the cache by then: the flows of
-  // a channel lie all over their table.
-  void read_ahead(object_id id) const {
-    constexpr object_id ahead = 16;
-    if (nodes_.size() - id > ahead && nodes_[id + ahead].node.type == object_type::flow) {
-      prefetch_record<tv_stats_flow>({nodes_[id + ahead].node.payload, sizeof(tv_stats_flow)}, 0);
+  // Calls `visit` with each flow of a node, in the order of the table.
+  template <class Visit>
+  void for_each_flow(const object_node &node, Visit visit) const {
+    constexpr std::size_t ahead = 16;  // the flows of a channel lie all over their table
+    const std::size_t end = std::size_t{node.first_flow} + node.flow_count;
+    for (std::size_t i = node.first_flow; i < end; ++i) {
+      if (i + ahead < flow_keys_.size()) {
+        prefetch_record<tv_stats_flow>(flows_.bytes(), position_of(flow_keys_[i + ahead]));
+      }
+      visit(record_at<tv_stats_flow>(flows_.bytes(), position_of(flow_keys_[i])));
     }
   }
 
-  // The first node with this UUID in depth-first pre-order, or no_object. Flows are not searched. The cost
-  // does not depend on the size of the tree; where many nodes have one UUID it grows with the logarithm of
-  // their number.
+  // The first node with this UUID in depth-first pre-order, or no_object. The cost does not depend on the
+  // size of the tree; where many nodes have one UUID it grows with the logarithm of their number.
   object_id find_object(const uuid &key);
 
   // Prints a node and all below it as nested JSON objects, without a line end behind the last brace.
@@ -107,6 +115,7 @@ class object_tree {
   void index_ports();
   int scrape_flows();
   std::vector<sort_key> find_channels();
+  void dump_end(const object_node &node, unsigned level) const;
 
   object_id append_child(object_id parent, const object_node &child);
   void release_children(object_id top);
@@ -116,9 +125,10 @@ class object_tree {
 
   kernel_table providers_, channels_, flows_;
   std::vector<entry> nodes_;
-  uuid_index by_uuid_;             // the node that came first with a UUID
-  std::vector<rival_set> rivals_;  // all nodes with one UUID, where there are several
-  uuid_index by_port_;             // channels, by the number of their parent and their port
+  std::vector<sort_key> flow_keys_;  // the records in flows_ that have a node, by that
+  uuid_index by_uuid_;               // the node that came first with a UUID
+  std::vector<rival_set> rivals_;    // all nodes with one UUID, where there are several
+  uuid_index by_port_;               // channels, by the number of their parent and their port
 };
 
 #endif

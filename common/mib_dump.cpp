@@ -56,28 +56,24 @@ void print_channel_payload(const object_node &node, const indent_text &indent, p
 }
 
 template <class Address>
-void print_endpoint(const indent_text &indent, const char *side, const Address &address, std::uint16_t port) {
-  print<"%s\"%s_addr\":\"%s\",\n">(indent, side, address_text(address));
-  print<"%s\"%s_port\":%d,\n">(indent, side, static_cast<int>(ntohs(port)));
+void print_endpoints(const tv_stats_flow &flow, const indent_text &indent, Address socket_address::*address) {
+  print<"%s\"local_addr\":\"%s\",\n">(indent, address_text(flow.sf_local.*address));
+  print<"%s\"local_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_local.port)));
+  print<"%s\"remote_addr\":\"%s\",\n">(indent, address_text(flow.sf_remote.*address));
+  print<"%s\"remote_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_remote.port)));
 }
 
-void print_endpoints(const tv_stats_flow &flow, const indent_text &indent) {
-  const socket_address &local = flow.sf_local;
-  const socket_address &remote = flow.sf_remote;
-  if (local.family == address_family::ipv6) {
-    print_endpoint(indent, "local", local.ipv6, local.port);
-    print_endpoint(indent, "remote", remote.ipv6, remote.port);
-  } else if (local.family == address_family::ipv4) {
-    print_endpoint(indent, "local", local.ipv4, local.port);
-    print_endpoint(indent, "remote", remote.ipv4, remote.port);
-  }
-}
-
-void print_flow_payload(const object_node &node, const indent_text &indent, process_names & /*owners*/) {
-  const auto flow = node.record<tv_stats_flow>();
+void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
   const tv_flow_endpoint_stats &in = flow.sf_rstats;
   const tv_flow_endpoint_stats &out = flow.sf_lstats;
-  print_endpoints(flow, indent);
+  print<"%s{\n">(indent);
+  print<"%s\"uuid\":\"00000000-0000-0000-0000-000000000000\",\n">(indent);
+  print<"%s\"type\":\"flow\",\n">(indent);
+  if (flow.sf_local.family == address_family::ipv6) {
+    print_endpoints(flow, indent, &socket_address::ipv6);
+  } else if (flow.sf_local.family == address_family::ipv4) {
+    print_endpoints(flow, indent, &socket_address::ipv4);
+  }
   print<"%s\"protocol\":\"%s\",\n">(indent, proto_name(flow.sf_protocol));
   print<"%s\"in_bytes\":%llu,\n">(indent, in.bytes);
   print<"%s\"out_bytes\":%llu,\n">(indent, out.bytes);
@@ -89,18 +85,18 @@ void print_flow_payload(const object_node &node, const indent_text &indent, proc
   print<"%s\"remote_state\":\"%s\",\n">(indent, flow_state_name(in.state));
   print<"%s\"process\":\"%s\",\n">(indent, flow.sf_proc_name);
   print<"%s\"pid\":%d,\n">(indent, flow.sf_pid);
+  print<"%s\"children\": []\n">(indent);
+  print<"%s}">(indent);
 }
 
 // What the types differ in, by object_type.
 constexpr struct {
-  const char *name;
+  format::name_text name;
   void (*print_payload)(const object_node &node, const indent_text &indent, process_names &owners);
 } node_ops[] = {
-    {"root", nullptr},
-    {"nexus_provider", print_provider_payload},
-    {"nexus", nullptr},
-    {"channel", print_channel_payload},
-    {"flow", print_flow_payload},
+    {"root", nullptr},  {"nexus_provider", print_provider_payload},
+    {"nexus", nullptr}, {"channel", print_channel_payload},
+    {"flow", nullptr},
 };
 
 // Everything of a node before its children.
@@ -119,9 +115,27 @@ void open_node(const object_node &node, const indent_text &indent, process_names
 
 }  // namespace
 
-const char *object_type_name(object_type type) {
+const format::name_text &object_type_name(object_type type) {
+  static constexpr format::name_text unknown = "???";
   const auto index = static_cast<std::size_t>(type);
-  return index < std::size(node_ops) ? node_ops[index].name : "???";
+  return index < std::size(node_ops) ? node_ops[index].name : unknown;
+}
+
+// Everything of a node behind the children that are nodes: its flows, and what closes it.
+void object_tree::dump_end(const object_node &node, unsigned level) const {
+  const indent_text indent = indent_of(level);
+  if (node.has_children()) {
+    const indent_text inner = indent_of(level + 1);
+    bool is_first = node.first_child == no_object;
+    for_each_flow(node, [&](const tv_stats_flow &flow) {
+      if (!is_first) print<",\n">();
+      is_first = false;
+      print_flow(flow, inner);
+    });
+    print<" \n">();
+    print<"%s]\n">(indent);
+  }
+  print<"%s}">(indent);
 }
 
 void object_tree::dump_object(object_id top) const {
@@ -129,20 +143,16 @@ void object_tree::dump_object(object_id top) const {
   object_id id = top;
   unsigned level = 0;
   for (;;) {
-    read_ahead(id);
     open_node((*this)[id], indent_of(level), owners);
-    if ((*this)[id].has_children()) {
+    if ((*this)[id].first_child != no_object) {
       id = (*this)[id].first_child;
       ++level;
       continue;
     }
-    print<"%s}">(indent_of(level));
+    dump_end((*this)[id], level);
     while (id != top && (*this)[id].next_sibling == no_object) {
-      print<" \n">();
       id = (*this)[id].parent;
-      --level;
-      print<"%s]\n">(indent_of(level));
-      print<"%s}">(indent_of(level));
+      dump_end((*this)[id], --level);
     }
     if (id == top) return;
     print<",\n">();

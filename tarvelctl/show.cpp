@@ -22,7 +22,6 @@ constexpr std::uint32_t first_client_port = 2;
 template <class Visit>
 void for_each_child(const object_tree &tree, const object_node &node, object_type type, Visit visit) {
   for (object_id id = node.first_child; id != no_object; id = tree[id].next_sibling) {
-    if (type == object_type::flow) tree.read_ahead(id);
     if (tree[id].type == type) visit(tree[id]);
   }
 }
@@ -34,8 +33,7 @@ void print_endpoints(const tv_stats_flow &flow, Address socket_address::*address
       address_text(flow.sf_remote.*address), static_cast<int>(ntohs(flow.sf_remote.port)));
 }
 
-void print_flow(const object_node &node) {
-  const auto flow = node.record<tv_stats_flow>();
+void print_flow(const tv_stats_flow &flow) {
   const std::uint8_t family = flow.sf_local.family;
   require(family == address_family::ipv6 || family == address_family::ipv4,
           {"cmd_show", "tarvelctl/tarvelctl", 2030, "0"});
@@ -51,7 +49,7 @@ void print_port(const object_tree &tree, const object_node &node, process_names 
   if (channel.port < first_client_port) return;
   const char *status = channel.flags & channel.defunct ? highlight("defunct", colour::red) : "";
   print<"\tPort[%2u] %-22s%s\n">(channel.port, owners.of(channel.pid), status);
-  for_each_child(tree, node, object_type::flow, print_flow);
+  tree.for_each_flow(node, print_flow);
 }
 
 void print_flow_switches(const object_tree &tree, const object_node &provider, process_names &owners) {

@@ -171,8 +171,8 @@ TEST(attach_standard_outputs_test, DiagnosticsDoWithoutADescriptorOfTheirOwn) {
 }
 
 TEST(object_type_name_test, NamesTypesOnly) {
-  EXPECT_STREQ(object_type_name(object_type::flow), "flow");
-  EXPECT_STREQ(object_type_name(object_type{5}), "???");
+  EXPECT_EQ(object_type_name(object_type::flow).view(), "flow");
+  EXPECT_EQ(object_type_name(object_type{5}).view(), "???");
 }
 
 TEST(print_options_usage, BracketsWhatMayBeLeftOut) {
