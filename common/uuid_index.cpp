@@ -30,6 +30,10 @@ std::uint64_t hash(const uuid &key) {
 
 }  // namespace
 
+void uuid_index::prefetch(const uuid &key) const {
+  if (!slots_.empty()) __builtin_prefetch(&slots_[hash(key) & (slots_.size() - 1)]);
+}
+
 // The slot that holds `key`, or the free one where it belongs. There is a free one.
 std::size_t uuid_index::slot_of(const uuid &key) const {
   const std::size_t mask = slots_.size() - 1;

@@ -18,6 +18,9 @@ class uuid_index {
   // The position added first for `key`, or none.
   std::uint32_t find(const uuid &key) const;
 
+  // Asks for what find() and add() will look at to be in the cache soon.
+  void prefetch(const uuid &key) const;
+
   // Adds `position`, which is not none, unless `key` has one. Returns whether it was added.
   bool add(const uuid &key, std::uint32_t position);
 

@@ -115,6 +115,7 @@ void print_arena_total(const memory_size &memory) {
 }
 
 void print_arena(const tv_stats_arena &arena, process_names &processes) {
+  for (const tv_stats_region &region : arena.regions) tv_region_set.prefetch(region);
   print_separator('=');
   print<"%15s  %s\n">(format::text_of<"%.12s arena:", 64>(type_name(arena_types, arena.type)), arena.name);
   for (const std::int32_t pid : arena.pids) {

@@ -21,6 +21,9 @@ class region_set {
     std::uint64_t mem_wired;  // bytes
   };
 
+  // Told of a region that is about to be added, asks for its place to be in the cache by then.
+  void prefetch(const tv_stats_region &region) const { by_uuid_.prefetch(region.region_uuid); }
+
   // Adds the region unless its UUID is there. Where there is no memory the process ends with a message and
   // status 255.
   void add(const tv_stats_region &region);
