@@ -1,5 +1,6 @@
 #include "common/kernel_table.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -11,6 +12,11 @@ namespace {
 
 // The ENOMEM failure that ends a fetch, counted over size queries and reads together.
 constexpr int last_retry = 11;
+
+// Bytes of a table that are read into large pages, for a third less. More of them would disturb: the host may
+// have to move other memory together to find them, or, where idle memory goes back to what runs the host, to
+// fetch each anew, at three times the cost of small pages.
+constexpr std::size_t large_pages_limit = 32 * 1024 * 1024;
 
 }  // namespace
 
@@ -31,7 +37,7 @@ int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const voi
       complain<"sysctl malloc failed\n">();
       return ENOMEM;
     }
-    platform::prefer_large_pages(block, *length);  // a large table costs a third less to read, and to walk
+    platform::prefer_large_pages(block, std::min(*length, large_pages_limit));
     if (sysctlbyname(name, block, length, new_value, new_length) == 0) {
       *buffer = block;
       return 0;
