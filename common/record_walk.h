@@ -81,6 +81,7 @@ void prefetch_record(std::span<const std::byte> records, std::size_t index) {
   constexpr std::size_t cache_line = 64;
   const std::byte *at = records.data() + index * sizeof(Record);
   for (std::size_t i = 0; i < sizeof(Record); i += cache_line) __builtin_prefetch(at + i);
+  __builtin_prefetch(at + sizeof(Record) - 1);  // records do not begin where cache lines do
 }
 
 #endif
