@@ -24,25 +24,25 @@ struct flag_letter {
   char letter;
 };
 
-using flags_text = format::small_text<32>;
-
 // A letter for each flag that is set, "-" for each that is clear, in the order of `letters`.
-flags_text letters_of_flags(std::uint32_t flags, std::span<const flag_letter> letters);
+struct flags_text {
+  std::uint32_t flags;
+  std::span<const flag_letter> letters;  // at most 32
+
+  static constexpr std::size_t text_size = 32;
+  char *append_to(char *to) const;
+};
 
 // The thirteen letters of a flow's flags and a blank.
-flags_text flow_flags_text(std::uint32_t flags);
+struct flow_flags_text {
+  std::uint32_t flags;
+
+  static constexpr std::size_t text_size = 14;
+  char *append_to(char *to) const;
+};
 
 // Six bytes as "02:00:5e:10:00:01".
 format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6]);
-
-// Addresses without any look-up: a dotted quad, and the form of inet_ntop. Both return the end of the text,
-// which is not terminated; an IPv6 address needs up to 45 bytes.
-char *put_ipv4_address(char *to, const ipv4_address &address);
-char *put_ipv6_address(char *to, const ipv6_address &address);
-
-// The same as texts.
-format::small_text<16> address_text(const ipv4_address &address);
-format::small_text<46> address_text(const ipv6_address &address);
 
 using ipv4_host_text = format::small_text<256>;
 using ipv6_host_text = format::small_text<50>;

@@ -110,7 +110,7 @@ ipv6_host_text numeric(const ipv6_address &address) {
     plain.bytes[2] = plain.bytes[3] = 0;
   }
   ipv6_host_text text;
-  text.end_at(put_ipv6_address(text.chars, plain));
+  text.end_at(plain.append_to(text.chars));
   if (scope == 0) return text;
 
   const std::uint32_t key = scope_key(address, scope);
@@ -180,7 +180,7 @@ ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {
   const char *name = numerical ? nullptr : look_up_ipv4(address);
   if (name) return named<size>(name);
   ipv4_host_text text;
-  text.end_at(put_ipv4_address(text.chars, address));
+  text.end_at(address.append_to(text.chars));
   return text;
 }
 
@@ -198,7 +198,7 @@ endpoint_text ipv4_endpoint_name(const ipv4_address &address, std::uint16_t port
                                  bool numerical) {
   endpoint_text text;
   char *const end = numerical && !is_unspecified(address)
-                        ? put_ipv4_address(text.chars, address)
+                        ? address.append_to(text.chars)
                         : put_host(text, ipv4_host_name(address, numerical), numerical);
   put_service(text, end, port, protocol, numerical);
   text.chars[text.size++] = ' ';
@@ -212,7 +212,7 @@ endpoint_text ipv6_endpoint_name(const ipv6_address &address, std::uint16_t port
   if (name == "udp6") protocol = "udp";
   endpoint_text text;
   char *const end = numerical && !is_unspecified(address) && !may_embed_scope(address)
-                        ? std::min(put_ipv6_address(text.chars, address), text.chars + numerical_host_limit)
+                        ? std::min(address.append_to(text.chars), text.chars + numerical_host_limit)
                         : put_host(text, ipv6_host_name(address, numerical), numerical);
   put_service(text, end, port, protocol, numerical);
   return text;

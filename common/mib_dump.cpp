@@ -57,9 +57,9 @@ void print_channel_payload(const object_node &node, const indent_text &indent, p
 
 template <class Address>
 void print_endpoints(const tv_stats_flow &flow, const indent_text &indent, Address socket_address::*address) {
-  print<"%s\"local_addr\":\"%s\",\n">(indent, address_text(flow.sf_local.*address));
+  print<"%s\"local_addr\":\"%s\",\n">(indent, flow.sf_local.*address);
   print<"%s\"local_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_local.port)));
-  print<"%s\"remote_addr\":\"%s\",\n">(indent, address_text(flow.sf_remote.*address));
+  print<"%s\"remote_addr\":\"%s\",\n">(indent, flow.sf_remote.*address);
   print<"%s\"remote_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_remote.port)));
 }
 
@@ -80,7 +80,7 @@ void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
   print<"%s\"in_packets\":%llu,\n">(indent, in.packets);
   print<"%s\"out_packets\":%llu,\n">(indent, out.packets);
   print<"%s\"interface\":\"%s\",\n">(indent, flow.sf_if_name);
-  print<"%s\"flags\":\"%s\",\n">(indent, flow_flags_text(flow.sf_flags));
+  print<"%s\"flags\":\"%s\",\n">(indent, flow_flags_text{flow.sf_flags});
   print<"%s\"local_state\":\"%s\",\n">(indent, flow_state_name(out.state));
   print<"%s\"remote_state\":\"%s\",\n">(indent, flow_state_name(in.state));
   print<"%s\"process\":\"%s\",\n">(indent, flow.sf_proc_name);

@@ -10,8 +10,9 @@
 // "0", width and precision as numbers. 64-bit integers need "ll" or "q", all others must not have it, as in
 // C.
 //
-// Texts are whatever converts to std::string_view, and any type with a member `printable()` that returns
-// format::text_view or format::small_text. Texts marked foreign come from outside the program (the kernel, a
+// Texts are whatever converts to std::string_view, any type with a member `printable()` that returns
+// format::text_view or format::small_text, and any that appends itself (format::appendable). Texts marked
+// foreign come from outside the program (the kernel, a
 // process, a name service): where the reader is a terminal, each of their control characters (C0, DEL, C1)
 // shows as "?", one for one, so that a process name cannot drive the terminal.
 
@@ -63,6 +64,13 @@ struct small_text {
 
 // A name in a constant table: what is known to be short is copied without asking how long it is.
 using name_text = small_text<16>;
+
+// What writes its text where it belongs: appends at most `text_size` bytes and returns the end.
+template <class T>
+concept appendable = requires(const T &value, char *to) {
+  { value.append_to(to) } -> std::same_as<char *>;
+  T::text_size;
+};
 
 // Bytes that any step may write past what it appends; every sink's room() leaves as many.
 inline constexpr std::size_t slack = 64;
@@ -160,6 +168,8 @@ template <piece P, class T>
 std::size_t bound(const T &argument) {
   if constexpr (P.kind == 's' && std::same_as<T, text_view>) {
     return std::max(P.width, shown_size<P>(argument.size));
+  } else if constexpr (appendable<T>) {
+    return std::max(P.width, T::text_size);
   } else if constexpr (P.kind == 's') {
     return std::max(P.width, shown_size<P>(sizeof argument.chars));
   } else {
@@ -195,6 +205,14 @@ char *put_text(char *to, text_view text, bool guarded) {
     hide_controls(P.left ? to : to + padding, size);
   }
   return end;
+}
+
+template <piece P, appendable T>
+char *put_appendable(char *to, const T &value) {
+  static_assert((P.width == 0 || P.left) && P.precision == no_precision, "it can only be padded behind");
+  char *const end = value.append_to(to);
+  const auto size = static_cast<std::size_t>(end - to);
+  return P.width > size ? put_blanks<P.width>(end, P.width - size) : end;
 }
 
 template <piece P>
@@ -246,6 +264,8 @@ char *put(char *to, const T &argument, bool guarded) {
   if constexpr (P.kind == 's') {
     if constexpr (std::same_as<T, text_view>) {
       return put_text<P>(to, argument, guarded);
+    } else if constexpr (appendable<T>) {
+      return put_appendable<P>(to, argument);
     } else {
       return put_text<P, sizeof argument.chars>(to, {argument.chars, argument.size, argument.foreign},
                                                 guarded);
@@ -265,10 +285,11 @@ char *put(char *to, const T &argument, bool guarded) {
   }
 }
 
-// The form in which an argument is handed to put(): numbers as they are, texts as views or small texts.
+// The form in which an argument is handed to put(): numbers and what appends itself as they are, other texts
+// as views or small texts.
 template <class T>
 auto prepare(const T &argument) {
-  if constexpr (std::is_arithmetic_v<T>) {
+  if constexpr (std::is_arithmetic_v<T> || appendable<T>) {
     return argument;
   } else if constexpr (requires { argument.printable(); }) {
     return argument.printable();

@@ -12,12 +12,19 @@ inline constexpr std::uint8_t ipv4 = 2;
 inline constexpr std::uint8_t ipv6 = 30;
 }  // namespace address_family
 
-// Addresses in network byte order.
+// Addresses in network byte order. Their texts are made without any look-up: a dotted quad, and the form of
+// inet_ntop.
 struct ipv4_address {
   std::uint8_t bytes[4];
+
+  static constexpr std::size_t text_size = 15;
+  char *append_to(char *to) const;
 };
 struct ipv6_address {
   std::uint8_t bytes[16];
+
+  static constexpr std::size_t text_size = 45;
+  char *append_to(char *to) const;
 };
 
 // The family says which of the two addresses is meant.

@@ -18,11 +18,10 @@ struct uuid {
     return std::memcmp(a.bytes, b.bytes, sizeof a.bytes) == 0;
   }
 
-  format::small_text<UUID_STR_LEN> printable() const {
-    format::small_text<UUID_STR_LEN> text;
-    uuid_unparse_upper(bytes, text.chars);
-    text.size = UUID_STR_LEN - 1;
-    return text;
+  static constexpr std::size_t text_size = UUID_STR_LEN - 1;
+  char *append_to(char *to) const {
+    uuid_unparse_upper(bytes, to);
+    return to + text_size;
   }
 };
 

@@ -43,8 +43,7 @@ void print_route(const tv_stats_flow_route &route) {
     print<" %-17s">("-");
   }
   print<" %8s %6u %6lld %5u %5u  %s\n">(route.sfr_if_name, route.sfr_refs, route.sfr_expire, route.sfr_bidx,
-                                        route.sfr_ibidx,
-                                        letters_of_flags(route.sfr_flags, route_flag_letters));
+                                        route.sfr_ibidx, flags_text{route.sfr_flags, route_flag_letters});
 }
 
 }  // namespace

@@ -28,9 +28,8 @@ void for_each_child(const object_tree &tree, const object_node &node, object_typ
 
 template <class Address>
 void print_endpoints(const tv_stats_flow &flow, Address socket_address::*address) {
-  print<"\t\t %s.%d <-> %s.%d\n">(
-      address_text(flow.sf_local.*address), static_cast<int>(ntohs(flow.sf_local.port)),
-      address_text(flow.sf_remote.*address), static_cast<int>(ntohs(flow.sf_remote.port)));
+  print<"\t\t %s.%d <-> %s.%d\n">(flow.sf_local.*address, static_cast<int>(ntohs(flow.sf_local.port)),
+                                  flow.sf_remote.*address, static_cast<int>(ntohs(flow.sf_remote.port)));
 }
 
 void print_flow(const tv_stats_flow &flow) {
