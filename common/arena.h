@@ -15,7 +15,7 @@ inline constexpr char arena_node[] = "kern.tarvel.stats.arena";
 struct tv_stats_region {
   text_field<64> name;
   uuid region_uuid;
-  std::int32_t type;           // region_type_name
+  std::int32_t type;           // SCHEMA, RING, ... in the report
   std::uint32_t mode;          // bits that print_flags names
   std::uint64_t seg_size_req;  // bytes, requested
   std::uint64_t seg_size;      // bytes, effective
@@ -40,7 +40,7 @@ struct tv_stats_arena {
   static constexpr std::size_t pid_slots = 8;
 
   text_field<64> name;
-  std::int32_t type;  // arena_type_name
+  std::int32_t type;  // NEXUS, PLCY, SYSTEM
   std::uint8_t reserved_68[12];
   tv_stats_region regions[region_slots];
   std::int32_t pids[pid_slots];  // processes that use the arena, up to the first 0

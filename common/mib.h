@@ -54,8 +54,8 @@ struct object_node {
   }
 };
 
-// The tree, as three snapshots taken one after the other give it. It owns the three tables, whose records are
-// its nodes' payloads. However deep a table makes the tree, walking and releasing it takes no more stack.
+// The tree, as three snapshots taken one after the other give it. It owns the three tables, whose records it
+// points at. However deep a table makes the tree, walking and releasing it takes no more stack.
 //
 // Flows are by far the most objects, and have neither a UUID of their own nor children: they are no nodes,
 // but the last children of the node that they belong to.
@@ -125,7 +125,7 @@ class object_tree {
 
   kernel_table providers_, channels_, flows_;
   std::vector<entry> nodes_;
-  std::vector<sort_key> flow_keys_;  // the records in flows_ that have a node, by that
+  std::vector<sort_key> flow_keys_;  // what hangs in the tree: positions in flows_, by node
   uuid_index by_uuid_;               // the node that came first with a UUID
   std::vector<rival_set> rivals_;    // all nodes with one UUID, where there are several
   uuid_index by_port_;               // channels, by the number of their parent and their port

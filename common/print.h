@@ -10,11 +10,11 @@
 // "0", width and precision as numbers. 64-bit integers need "ll" or "q", all others must not have it, as in
 // C.
 //
-// Texts are whatever converts to std::string_view, any type with a member `printable()` that returns
-// format::text_view or format::small_text, and any that appends itself (format::appendable). Texts marked
-// foreign come from outside the program (the kernel, a
-// process, a name service): where the reader is a terminal, each of their control characters (C0, DEL, C1)
-// shows as "?", one for one, so that a process name cannot drive the terminal.
+// Texts are whatever converts to std::string_view, format::small_text, any type with a member `printable()`
+// that returns one or a format::text_view, and any that appends itself (format::appendable). Texts marked
+// foreign come from outside the program (the kernel, a process, a name service): where the reader is a
+// terminal, each of their control characters (C0, DEL, C1) shows as "?", one for one, so that a process name
+// cannot drive the terminal.
 
 #ifndef TARVELCTL_COMMON_PRINT_H
 #define TARVELCTL_COMMON_PRINT_H
@@ -65,7 +65,8 @@ struct small_text {
 // A name in a constant table: what is known to be short is copied without asking how long it is.
 using name_text = small_text<16>;
 
-// What writes its text where it belongs: appends at most `text_size` bytes and returns the end.
+// What writes its text where it belongs: appends at most `text_size` bytes and returns the end. Its
+// conversion has neither width nor precision.
 template <class T>
 concept appendable = requires(const T &value, char *to) {
   { value.append_to(to) } -> std::same_as<char *>;
@@ -169,7 +170,7 @@ std::size_t bound(const T &argument) {
   if constexpr (P.kind == 's' && std::same_as<T, text_view>) {
     return std::max(P.width, shown_size<P>(argument.size));
   } else if constexpr (appendable<T>) {
-    return std::max(P.width, T::text_size);
+    return T::text_size;
   } else if constexpr (P.kind == 's') {
     return std::max(P.width, shown_size<P>(sizeof argument.chars));
   } else {
@@ -205,14 +206,6 @@ char *put_text(char *to, text_view text, bool guarded) {
     hide_controls(P.left ? to : to + padding, size);
   }
   return end;
-}
-
-template <piece P, appendable T>
-char *put_appendable(char *to, const T &value) {
-  static_assert((P.width == 0 || P.left) && P.precision == no_precision, "it can only be padded behind");
-  char *const end = value.append_to(to);
-  const auto size = static_cast<std::size_t>(end - to);
-  return P.width > size ? put_blanks<P.width>(end, P.width - size) : end;
 }
 
 template <piece P>
@@ -265,7 +258,7 @@ char *put(char *to, const T &argument, bool guarded) {
     if constexpr (std::same_as<T, text_view>) {
       return put_text<P>(to, argument, guarded);
     } else if constexpr (appendable<T>) {
-      return put_appendable<P>(to, argument);
+      return argument.append_to(to);
     } else {
       return put_text<P, sizeof argument.chars>(to, {argument.chars, argument.size, argument.foreign},
                                                 guarded);
@@ -318,6 +311,7 @@ consteval bool accepts() {
     case 'g':
       return std::floating_point<T> && !P.zero && (P.precision == no_precision || P.precision <= 6);
     default:
+      if (appendable<T> && (P.width || P.precision != no_precision)) return false;
       return !std::is_arithmetic_v<T> && !P.zero;
   }
 }
