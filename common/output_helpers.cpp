@@ -1,6 +1,7 @@
 #include "common/output_helpers.h"
 
 #include <cstdio>
+#include <span>
 
 #include "common/output.h"
 #include "platform/process.h"
@@ -24,22 +25,16 @@ const char *highlight(const char *text, const char *colour) {
   return result;
 }
 
-void print_flags(const char *label, std::uint32_t value, const char *bit_names) {
-  constexpr char octal = 8;
-  constexpr char last_bit_number = 32;
-  if (label && *bit_names == octal) print<"%s=%o">(label, value);
-  if (label && *bit_names != octal) print<"%s=%x">(label, value);
-  print<"<">();
-  const char *separator = "";
-  for (const char *at = bit_names + 1; *at;) {
-    const unsigned bit = static_cast<unsigned char>(*at++);
-    const char *name = at;
-    while (*at > last_bit_number) ++at;
-    if (value >> (bit - 1) & 1) {
-      print<"%s%s">(separator, std::string_view(name, static_cast<std::size_t>(at - name)));
-      separator = ",";
-    }
+void print_flags(const char *label, std::uint32_t value, const bit_names &names) {
+  if (label && names.is_octal) print<"%s=%o">(label, value);
+  if (label && !names.is_octal) print<"%s=%x">(label, value);
+  char separator = '<';
+  for (const bit_names::entry &named : std::span(names.entries, names.count)) {
+    if (!(value & named.bit)) continue;
+    print<"%c%s">(separator, named.name);
+    separator = ',';
   }
+  if (separator == '<') print<"<">();
   print<">">();
 }
 

@@ -26,17 +26,38 @@ inline constexpr char red[] = "\033[31m";
 // until the next call; more than 1023 bytes of it are cut.
 const char *highlight(const char *text, const char *colour);
 
-// Prints "label=value<NAME,NAME>" without line end, or just "<NAME,NAME>" where `label` is null.
-//
-// `bit_names` is a string in the kernel's %b convention: a first byte for the base of the value (8 octal, any
-// other hexadecimal), then for each named bit its number from 1 (least significant) to 32 as one byte and its
-// name in characters above 32. Names appear in the order of the string.
-void print_flags(const char *label, std::uint32_t value, const char *bit_names);
+// The names of a word's bits, written as a string in the kernel's %b convention: a first byte for the base of
+// the value (8 octal, any other hexadecimal), then for each named bit its number from 1 (least significant)
+// to 32 as one byte and its name in characters above 32. The string is taken apart when the program is
+// compiled.
+struct bit_names {
+  template <std::size_t N>
+  consteval bit_names(const char (&packed)[N]) : is_octal(packed[0] == 8) {
+    constexpr char last_bit_number = 32;
+    for (std::size_t at = 1; at + 1 < N; ++count) {
+      entry &named = entries[count];
+      named.bit = 1U << (packed[at++] - 1);
+      while (packed[at] > last_bit_number) named.name.chars[named.name.size++] = packed[at++];
+    }
+  }
+
+  struct entry {
+    std::uint32_t bit = 0;
+    format::small_text<24> name = "";
+  };
+
+  bool is_octal;
+  std::size_t count = 0;
+  entry entries[32];
+};
+
+// Prints "label=value<NAME,NAME>" without line end, or just "<NAME,NAME>" where `label` is null. Names appear
+// in the order of the string that they were written in.
+void print_flags(const char *label, std::uint32_t value, const bit_names &names);
 
 // Stores the short name of process `pid` in `buffer`, cut to `size` - 1 bytes and terminated, and returns it.
 // `with_pid` appends "." and the id where there is room behind the full name. A process that cannot be
-// queried is
-// "<unknown>." and the id, whatever `with_pid` says.
+// queried is "<unknown>." and the id, whatever `with_pid` says.
 foreign_text pid_to_name(int pid, char *buffer, std::size_t size, bool with_pid);
 
 #endif

@@ -20,7 +20,7 @@ const std::uint32_t channel_option_flags[] = {option_is_optional};
 
 namespace {
 
-constexpr char channel_flag_names[] =
+constexpr bit_names channel_flag_names =
     "\20"
     "\1MON_TX"
     "\2MON_RX"

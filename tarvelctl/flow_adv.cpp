@@ -13,7 +13,7 @@
 
 namespace {
 
-constexpr char advisory_flag_names[] =
+constexpr bit_names advisory_flag_names =
     "\20"
     "\1VALID"
     "\2CONTROLLED";

@@ -19,7 +19,7 @@ constexpr format::name_text arena_types[] = {"NEXUS", "PLCY", "SYSTEM"};
 constexpr format::name_text region_types[] = {"SCHEMA",  "RING",     "BUF",     "MDU", "USD", "USTATS",
                                               "FLOWADV", "NEXUSADV", "SYSCTLS", "MDK", "KSD", "KSTATS"};
 
-constexpr char region_mode_names[] =
+constexpr bit_names region_mode_names =
     "\20"
     "\1NOREDIRECT"
     "\2MMAPOK"

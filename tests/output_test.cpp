@@ -197,7 +197,8 @@ TEST(print_flags, NamesTheSetBits) {
   const struct {
     const char *label;
     std::uint32_t value;
-    const char *bit_names, *shown;
+    bit_names names;
+    const char *shown;
   } cases[] = {
       {"flags", 0x2BCDEF04, region, "flags=2bcdef04<>"},
       {nullptr, 0x80000022, region, "<MMAPOK,NOCACHE,MIRRORED>"},
@@ -205,9 +206,9 @@ TEST(print_flags, NamesTheSetBits) {
       {"mode", 10, "\12\4EIGHT", "mode=a<EIGHT>"},
       {"f", 7, "\20\3third\1first\2second", "f=7<third,first,second>"},
   };
-  for (const auto &[label, value, bit_names, shown] : cases) {
+  for (const auto &[label, value, names, shown] : cases) {
     capture captured(report);
-    print_flags(label, value, bit_names);
+    print_flags(label, value, names);
     EXPECT_EQ(captured.text(), shown);
   }
 }
