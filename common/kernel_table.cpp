@@ -13,10 +13,14 @@ namespace {
 // The ENOMEM failure that ends a fetch, counted over size queries and reads together.
 constexpr int last_retry = 11;
 
-// Bytes of a table that are read into large pages, for a third less. More of them would disturb: the host may
-// have to move other memory together to find them, or, where idle memory goes back to what runs the host, to
-// fetch each anew, at three times the cost of small pages.
-constexpr std::size_t large_pages_limit = 32 * 1024 * 1024;
+// How much of a table is read into large pages, which cost half of what small ones do. Many of them would
+// disturb: the host may have to move other memory together to find them or, where idle memory goes back to
+// what runs the host, to fetch each anew, at three times the cost of small pages. It is never all of a table,
+// so that one that outgrows the limit costs no sudden step more.
+std::size_t share_of_large_pages(std::size_t size) {
+  constexpr std::size_t limit = 32 * 1024 * 1024;
+  return std::min(size / 2, limit);
+}
 
 }  // namespace
 
@@ -37,7 +41,7 @@ int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const voi
       complain<"sysctl malloc failed\n">();
       return ENOMEM;
     }
-    platform::prefer_large_pages(block, std::min(*length, large_pages_limit));
+    platform::prefer_large_pages(block, share_of_large_pages(*length));
     if (sysctlbyname(name, block, length, new_value, new_length) == 0) {
       *buffer = block;
       return 0;
