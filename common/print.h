@@ -100,24 +100,30 @@ inline unsigned decimal_digits(std::uint64_t value) {
   return guess + (value >= powers[guess]);
 }
 
-// Writes exactly `digits` decimal digits of `value`.
+// The eight decimal digits of a number below 10^8, zeros in front included, one a byte, the first one lowest.
+// The number is split in halves, in quarters, in digits, each time in all parts of the word at once: how many
+// digits there are decides no branch.
+inline std::uint64_t eight_digits(std::uint32_t value) {
+  const std::uint64_t halves = value / 10000 | std::uint64_t{value % 10000} << 32;
+  const std::uint64_t upper_quarters = (halves * 10486 >> 20) & 0x7f'0000'007f;  // by 100
+  const std::uint64_t quarters = upper_quarters | (halves - 100 * upper_quarters) << 16;
+  const std::uint64_t upper_digits = (quarters * 103 >> 10) & 0xf'000f'000f'000f;  // by 10
+  return upper_digits | (quarters - 10 * upper_digits) << 8;
+}
+
+// Writes exactly `digits` decimal digits of `value`, and up to 7 bytes behind them.
 inline char *put_digits(char *to, std::uint64_t value, unsigned digits) {
-  static constexpr auto pairs = [] {
-    std::array<char, 200> table{};
-    for (std::size_t i = 0; i < 100; ++i) {
-      table[2 * i] = static_cast<char>('0' + i / 10);
-      table[2 * i + 1] = static_cast<char>('0' + i % 10);
-    }
-    return table;
-  }();
-  char *const end = to + digits;
-  char *at = end;
-  for (; at - to >= 2; value /= 100) {
-    at -= 2;
-    std::memcpy(at, &pairs[value % 100 * 2], 2);
+  static_assert(std::endian::native == std::endian::little);
+  constexpr std::uint64_t zeros = 0x3030'3030'3030'3030;
+  constexpr std::uint64_t limit = 100'000'000;
+  if (digits > 8) {
+    to = put_digits(to, value / limit, digits - 8);
+    value %= limit;
+    digits = 8;
   }
-  if (at > to) *to = static_cast<char>('0' + value % 10);
-  return end;
+  const std::uint64_t text = (eight_digits(static_cast<std::uint32_t>(value)) | zeros) >> (8 * (8 - digits));
+  std::memcpy(to, &text, sizeof text);
+  return to + digits;
 }
 
 // Longest text of a double in the conversions above: "%f" of the largest one, with six decimals.
