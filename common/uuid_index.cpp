@@ -30,14 +30,19 @@ std::uint64_t hash(const uuid &key) {
 
 }  // namespace
 
+// Where the search for `key` begins. There are slots.
+std::size_t uuid_index::first_slot_of(const uuid &key) const {
+  return hash(key) & (slots_.size() - 1);
+}
+
 void uuid_index::prefetch(const uuid &key) const {
-  if (!slots_.empty()) __builtin_prefetch(&slots_[hash(key) & (slots_.size() - 1)]);
+  if (!slots_.empty()) __builtin_prefetch(&slots_[first_slot_of(key)]);
 }
 
 // The slot that holds `key`, or the free one where it belongs. There is a free one.
 std::size_t uuid_index::slot_of(const uuid &key) const {
   const std::size_t mask = slots_.size() - 1;
-  std::size_t at = hash(key) & mask;
+  std::size_t at = first_slot_of(key);
   while (slots_[at].position != none && !(slots_[at].key == key)) at = (at + 1) & mask;
   return at;
 }

@@ -30,6 +30,7 @@ class uuid_index {
     std::uint32_t position = none;
   };
 
+  std::size_t first_slot_of(const uuid &key) const;
   std::size_t slot_of(const uuid &key) const;
   void grow();
 
