@@ -76,12 +76,11 @@ concept appendable = requires(const T &value, char *to) {
 // Bytes that any step may write past what it appends; every sink's room() leaves as many.
 inline constexpr std::size_t slack = 64;
 
-// Appends at most `Most` blanks. What fits in the slack is written whole, whatever the count: a constant size
-// needs no call.
+// Appends at most `Most` blanks. All of them are written, whatever the count: a constant size needs no call.
 template <std::size_t Most>
 char *put_blanks(char *to, std::size_t count) {
-  std::memset(to, ' ', std::min(Most, slack));
-  if (Most > slack && count > slack) std::memset(to + slack, ' ', count - slack);
+  static_assert(Most <= slack);
+  std::memset(to, ' ', Most);
   return to + count;
 }
 
@@ -112,7 +111,7 @@ inline std::uint64_t eight_digits(std::uint32_t value) {
 }
 
 // Writes exactly `digits` decimal digits of `value`, and up to 7 bytes behind them.
-inline char *put_digits(char *to, std::uint64_t value, unsigned digits) {
+inline char *put_digits(char *to, std::uint64_t value, unsigned digits) noexcept {
   static_assert(std::endian::native == std::endian::little);
   constexpr std::uint64_t zeros = 0x3030'3030'3030'3030;
   constexpr std::uint64_t limit = 100'000'000;

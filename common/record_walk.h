@@ -56,13 +56,12 @@ class record_walk {
 template <class Record>
 Record record_at(std::span<const std::byte> records, std::size_t index) {
   static_assert(std::is_trivially_copyable_v<Record>);
-  constexpr std::size_t block = 64;
+  constexpr std::size_t block = 64, in_blocks = sizeof(Record) / block * block;
   Record record;
   auto *const to = reinterpret_cast<std::byte *>(&record);
   const std::byte *const from = records.data() + index * sizeof record;
-  std::size_t done = 0;
-  for (; done + block <= sizeof record; done += block) std::memcpy(to + done, from + done, block);
-  std::memcpy(to + done, from + done, sizeof record % block);
+  for (std::size_t done = 0; done < in_blocks; done += block) std::memcpy(to + done, from + done, block);
+  std::memcpy(to + in_blocks, from + in_blocks, sizeof record - in_blocks);
   return record;
 }
 
