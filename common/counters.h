@@ -21,7 +21,7 @@ inline constexpr std::size_t ip6_counter_count = 36;
 inline constexpr std::size_t tcp_counter_count = 203;
 inline constexpr std::size_t udp_counter_count = 22;
 
-using counter_name = format::small_text<24>;
+using counter_name = format::column_text<16, 24>;
 
 // The names of the counters of a block, by position. Each list is closed by an empty name.
 extern const counter_name net_if_counter_names[];

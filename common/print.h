@@ -65,6 +65,28 @@ struct small_text {
 // A name in a constant table: what is known to be short is copied without asking how long it is.
 using name_text = small_text<16>;
 
+// A constant name at the left of a column that is `Width` wide, padded when the program is compiled.
+template <std::size_t Width, std::size_t Capacity>
+struct column_text {
+  static constexpr std::size_t text_size = Capacity;
+  char chars[Capacity];
+  std::size_t size;
+  std::size_t name_size;
+
+  template <std::size_t N>
+  requires(N <= Capacity) consteval column_text(const char (&name)[N])
+      : chars{}, size(std::max(N - 1, Width)), name_size(N - 1) {
+    std::fill_n(std::copy_n(name, name_size, chars), size - name_size, ' ');
+  }
+
+  std::string_view name() const { return {chars, name_size}; }
+
+  char *append_to(char *to) const {
+    std::memcpy(to, chars, Capacity);  // a constant size needs no call
+    return to + size;
+  }
+};
+
 // What writes its text where it belongs: appends at most `text_size` bytes and returns the end. Its
 // conversion has neither width nor precision.
 template <class T>
@@ -283,11 +305,13 @@ char *put(char *to, const T &argument, bool guarded) {
   }
 }
 
-// The form in which an argument is handed to put(): numbers and what appends itself as they are, other texts
-// as views or small texts.
+// The form in which an argument is handed to put(): what appends itself as it is, numbers copied, so that no
+// text can be taken to overwrite them, other texts as views or small texts.
 template <class T>
-auto prepare(const T &argument) {
-  if constexpr (std::is_arithmetic_v<T> || appendable<T>) {
+decltype(auto) prepare(const T &argument) {
+  if constexpr (std::is_arithmetic_v<T>) {
+    return T{argument};
+  } else if constexpr (appendable<T>) {
     return argument;
   } else if constexpr (requires { argument.printable(); }) {
     return argument.printable();

@@ -8,7 +8,7 @@ counter_recipe::counter_recipe(const counter_name *names, std::span<const ingred
     : ingredients_(ingredients) {
   for (const ingredient &row : ingredients) {
     std::size_t position = 0;
-    while (names[position].size && row.counter != names[position].view()) ++position;
+    while (names[position].name_size && row.counter != names[position].name()) ++position;
     positions_.push_back(position);
   }
 }

@@ -1,12 +1,17 @@
 #include "tarvelctl/counter_lines.h"
 
+#include <algorithm>
+
 #include "common/output.h"
 #include "tarvelctl/netstat_options.h"
 
 void print_counters(const counter_name *names, std::span<const std::uint64_t> counters) {
-  for (const std::uint64_t value : counters) {
-    const counter_name &name = *names++;
-    if (value || netstat_options.show_zeros) print<"\t\t%-16s: %llu\n">(name, value);
+  const auto begin = counters.begin(), end = counters.end();
+  for (auto at = begin;; ++at) {
+    if (!netstat_options.show_zeros)
+      at = std::find_if(at, end, [](std::uint64_t value) { return value != 0; });
+    if (at == end) return;
+    print<"\t\t%s: %llu\n">(names[at - begin], *at);
   }
 }
 
