@@ -13,13 +13,18 @@ namespace {
 // The ENOMEM failure that ends a fetch, counted over size queries and reads together.
 constexpr int last_retry = 11;
 
-// How much of a table is read into large pages, which cost half of what small ones do. Many of them would
-// disturb: the host may have to move other memory together to find them or, where idle memory goes back to
-// what runs the host, to fetch each anew, at three times the cost of small pages. It is never all of a table,
-// so that one that outgrows the limit costs no sudden step more.
-std::size_t share_of_large_pages(std::size_t size) {
-  constexpr std::size_t limit = 32 * 1024 * 1024;
-  return std::min(size / 2, limit);
+// Gets memory ready for a table, because a page fault for each page is most of what reading costs.
+//
+// Half of it is asked for as large pages, which cost half of what small ones do. Many of them would disturb:
+// the host may have to move other memory together to find them or, where idle memory goes back to what runs
+// the host, to fetch each anew, at three times the cost of small pages. It is never all of a table, so that
+// one that outgrows the limit costs no sudden step more. How much is provided is limited too: a size is only
+// what the kernel says.
+void prepare(void *block, std::size_t size) {
+  constexpr std::size_t mebibyte = 1024 * 1024;
+  if (size < mebibyte) return;
+  platform::prefer_large_pages(block, std::min(size / 2, 32 * mebibyte));
+  platform::provide_pages(block, std::min(size, 64 * mebibyte));
 }
 
 }  // namespace
@@ -41,7 +46,7 @@ int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const voi
       complain<"sysctl malloc failed\n">();
       return ENOMEM;
     }
-    platform::prefer_large_pages(block, share_of_large_pages(*length));
+    prepare(block, *length);
     if (sysctlbyname(name, block, length, new_value, new_length) == 0) {
       *buffer = block;
       return 0;

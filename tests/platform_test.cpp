@@ -1,6 +1,7 @@
 // Kernel variables and process names as files.
 
 #include <fcntl.h>
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <limits.h>
 #include <sys/mman.h>
@@ -176,16 +177,32 @@ TEST(descriptor_test, ClosedOneStaysAsItIs) {
   EXPECT_EQ(fcntl(fd, F_GETFD), -1);
 }
 
-TEST(memory_test, HintLeavesBlockAndErrnoAlone) {
+TEST(memory_test, HintsLeaveBlockAndErrnoAlone) {
   constexpr std::size_t size = 8 << 20;
   const std::string before(size, 'x');
   std::string block = before;
-  for (const std::size_t hinted : {std::size_t{100}, size}) {
-    errno = 77;
-    platform::prefer_large_pages(block.data(), hinted);
-    EXPECT_EQ(errno, 77);
-    EXPECT_TRUE(block == before);
+  for (const auto hint : {platform::prefer_large_pages, platform::provide_pages}) {
+    for (const std::size_t hinted : {std::size_t{100}, size}) {
+      errno = 77;
+      hint(block.data(), hinted);
+      EXPECT_EQ(errno, 77);
+      EXPECT_TRUE(block == before);
+    }
   }
+}
+
+TEST(memory_test, ProvidedPagesAreThoseOfTheBlock) {
+  const auto page = static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
+  auto *const pages = static_cast<char *>(
+      mmap(nullptr, 4 * page, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
+  ASSERT_NE(pages, MAP_FAILED);
+  if (madvise(pages, page, MADV_POPULATE_WRITE) != 0) GTEST_SKIP() << "the system cannot";
+  ASSERT_EQ(madvise(pages, page, MADV_DONTNEED), 0);
+  platform::provide_pages(pages + 1, 3 * page);  // the first and the last one hold other things too
+  unsigned char resident[4] = {};
+  ASSERT_EQ(mincore(pages, 4 * page, resident), 0);
+  EXPECT_THAT(resident, testing::ElementsAre(0, 1, 1, 0));
+  munmap(pages, 4 * page);
 }
 
 TEST_F(platform_test, LiveMachineIsSeenOnlyWithoutAnotherRoot) {
