@@ -15,16 +15,15 @@ constexpr int last_retry = 11;
 
 // Gets memory ready for a table, because a page fault for each page is most of what reading costs.
 //
-// Half of it is asked for as large pages, which cost half of what small ones do. Many of them would disturb:
-// the host may have to move other memory together to find them or, where idle memory goes back to what runs
-// the host, to fetch each anew, at three times the cost of small pages. It is never all of a table, so that
-// one that outgrows the limit costs no sudden step more. How much is provided is limited too: a size is only
-// what the kernel says.
-void prepare(void *block, std::size_t size) {
+// One half is asked for as large pages, which cost half of what small ones do, but for systems whose idle
+// memory goes back to what runs them: there they may cost more. The pages of the other half are provided in
+// one call. How much of it is limited, because a size is only what the kernel says.
+void prepare(std::byte *block, std::size_t size) {
   constexpr std::size_t mebibyte = 1024 * 1024;
   if (size < mebibyte) return;
-  platform::prefer_large_pages(block, std::min(size / 2, 32 * mebibyte));
-  platform::provide_pages(block, std::min(size, 64 * mebibyte));
+  const std::size_t half = size / 2;
+  platform::prefer_large_pages(block, half);
+  platform::provide_pages(block + half, std::min(half, 64 * mebibyte));
 }
 
 }  // namespace
@@ -41,7 +40,7 @@ int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const voi
       return error;
     }
     if (*length == 0) return 0;
-    void *block = std::malloc(*length);
+    auto *block = static_cast<std::byte *>(std::malloc(*length));
     if (!block) {
       complain<"sysctl malloc failed\n">();
       return ENOMEM;
