@@ -76,13 +76,21 @@ bool may_embed_scope(const ipv6_address &address) {
 }
 
 // How getnameinfo renders an address with a scope: "%" and an interface or a number behind it. Asking for an
-// interface's name takes longer than all else in a row of a listing, so that the last answers are kept, for
-// one listing.
+// interface's name takes longer than all else in a row of a listing, so that answers are kept, for one
+// listing.
 struct scope_text {
-  std::uint32_t key = 0;  // of no scope
-  format::name_text text{};
+  std::uint32_t key;
+  std::uint32_t listing;  // that asked, from 1
+  format::name_text text;
 };
-scope_text scopes[64];
+constexpr unsigned scope_bits = 10;
+scope_text scopes[1 << scope_bits];
+std::uint32_t current_listing = 1;
+
+// The only place where the answer for a key can be. The golden ratio spreads keys that have a stride.
+scope_text &place_of(std::uint32_t key) {
+  return scopes[key * 0x9e3779b1U >> (32 - scope_bits)];
+}
 
 // What the rendering depends on: the scope, and which kind of address carries it.
 std::uint32_t scope_key(const ipv6_address &address, unsigned scope) {
@@ -114,14 +122,15 @@ ipv6_host_text numeric(const ipv6_address &address) {
   if (scope == 0) return text;
 
   const std::uint32_t key = scope_key(address, scope);
-  scope_text &known = scopes[key % std::size(scopes)];
-  if (known.key != key) {
+  scope_text &known = place_of(key);
+  if (known.key != key || known.listing != current_listing) {
     const ipv6_host_text whole = ask_for_number(plain, scope);
     const std::string_view rendered = whole.view();
     const std::size_t length = rendered.size() - text.size;
     const bool may_be_cut = rendered.size() == sizeof whole.chars - 1;
     if (may_be_cut || !rendered.starts_with(text.view()) || length > sizeof known.text.chars) return whole;
     known.key = key;
+    known.listing = current_listing;
     known.text.size = length;
     std::memcpy(known.text.chars, rendered.data() + text.size, length);
   }
@@ -171,7 +180,7 @@ bool is_unspecified(const Address &address) {
 }  // namespace
 
 void forget_scopes() {
-  std::fill(std::begin(scopes), std::end(scopes), scope_text{});
+  ++current_listing;
 }
 
 ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {
