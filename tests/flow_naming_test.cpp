@@ -22,6 +22,7 @@ struct name_services {
   const char *host_name = nullptr;                 // nullptr: cannot be read
   std::map<std::uint32_t, const char *> scoped;    // whole texts by scope; nullptr: cannot be rendered
   std::string asked;
+  int scopes_asked = 0;
 } services;
 
 template <class Entry>
@@ -65,6 +66,7 @@ int gethostname(char *name, std::size_t size) noexcept {
 // The system's own, but for scopes that the test knows.
 int getnameinfo(const sockaddr *address, socklen_t length, char *host, socklen_t host_size, char *service,
                 socklen_t service_size, int flags) {
+  ++services.scopes_asked;
   const auto found = services.scoped.find(reinterpret_cast<const sockaddr_in6 *>(address)->sin6_scope_id);
   if (found == services.scoped.end()) {
     static const auto system = reinterpret_cast<decltype(&getnameinfo)>(dlsym(RTLD_NEXT, "getnameinfo"));
@@ -209,6 +211,19 @@ TEST(flow_naming, ScopesAreShownAsTheSystemHasThem) {
   EXPECT_EQ(host6("fe80:106::7", true), "fe80::7%en0");
   forget_scopes();
   EXPECT_EQ(host6("fe80:106::7", true), "fe80::7%262");
+}
+
+TEST(flow_naming, ScopesOfManyInterfacesAreAskedForOnce) {
+  services = {};
+  forget_scopes();
+  for (int times = 0; times < 3; ++times) {
+    for (std::uint32_t scope = 20'000; scope < 21'280; scope += 2) {  // of no interface here
+      char address[32];
+      snprintf(address, sizeof address, "fe80:%x::7", scope);
+      EXPECT_EQ(host6(address, true), "fe80::7%" + std::to_string(scope));
+    }
+  }
+  EXPECT_LT(services.scopes_asked, 700);  // 640, and a few that share a place
 }
 
 // The numeric form by the system's own means.
