@@ -54,7 +54,7 @@ using endpoint_text = format::small_text<64>;  // longest: a host of 37 bytes, "
 // looked up with `numerical`; without it every call asks the system's name services again and may wait for
 // them.
 //
-// The last names of interfaces in scopes are kept, until forget_scopes() at the start of a listing.
+// Names of interfaces in scopes are kept, until forget_scopes() at the start of a listing.
 void forget_scopes();
 ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical);
 ipv6_host_text ipv6_host_name(const ipv6_address &address, bool numerical);

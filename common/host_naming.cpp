@@ -10,6 +10,7 @@
 #include <cstring>
 #include <iterator>
 #include <string_view>
+#include <unordered_map>
 
 #include "common/flow_naming.h"
 
@@ -75,21 +76,12 @@ bool may_embed_scope(const ipv6_address &address) {
   return bytes[0] == 0xff && (scope == 1 || scope == 2);
 }
 
-// How getnameinfo renders an address with a scope: "%" and an interface or a number behind it. Asking for an
+// How getnameinfo renders the scopes of addresses: "%" and an interface or a number behind it. Asking for an
 // interface's name takes longer than all else in a row of a listing, so that answers are kept, for one
 // listing.
-struct scope_text {
-  std::uint32_t key;
-  std::uint32_t listing;  // that asked, from 1
-  format::name_text text;
-};
-constexpr unsigned scope_bits = 10;
-scope_text scopes[1 << scope_bits];
-std::uint32_t current_listing = 1;
-
-// The only place where the answer for a key can be. The golden ratio spreads keys that have a stride.
-scope_text &place_of(std::uint32_t key) {
-  return scopes[key * 0x9e3779b1U >> (32 - scope_bits)];
+std::unordered_map<std::uint32_t, format::name_text> &known_scopes() {
+  static std::unordered_map<std::uint32_t, format::name_text> scopes;
+  return scopes;
 }
 
 // What the rendering depends on: the scope, and which kind of address carries it.
@@ -122,21 +114,22 @@ ipv6_host_text numeric(const ipv6_address &address) {
   if (scope == 0) return text;
 
   const std::uint32_t key = scope_key(address, scope);
-  scope_text &known = place_of(key);
-  if (known.key != key || known.listing != current_listing) {
+  auto known = known_scopes().find(key);
+  if (known == known_scopes().end()) {
     const ipv6_host_text whole = ask_for_number(plain, scope);
     const std::string_view rendered = whole.view();
-    const std::size_t length = rendered.size() - text.size;
     const bool may_be_cut = rendered.size() == sizeof whole.chars - 1;
-    if (may_be_cut || !rendered.starts_with(text.view()) || length > sizeof known.text.chars) return whole;
-    known.key = key;
-    known.listing = current_listing;
-    known.text.size = length;
-    std::memcpy(known.text.chars, rendered.data() + text.size, length);
+    format::name_text answer;
+    if (may_be_cut || !rendered.starts_with(text.view()) ||
+        rendered.size() - text.size > sizeof answer.chars) {
+      return whole;
+    }
+    answer.end_at(std::copy(rendered.begin() + text.size, rendered.end(), answer.chars));
+    known = known_scopes().emplace(key, answer).first;
   }
   text.foreign = true;
   const std::size_t room = sizeof text.chars - 1 - text.size;
-  text.end_at(std::copy_n(known.text.chars, std::min(room, known.text.size), text.chars + text.size));
+  text.end_at(std::copy_n(known->second.chars, std::min(room, known->second.size), text.chars + text.size));
   return text;
 }
 
@@ -180,7 +173,7 @@ bool is_unspecified(const Address &address) {
 }  // namespace
 
 void forget_scopes() {
-  ++current_listing;
+  known_scopes().clear();
 }
 
 ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {

@@ -223,7 +223,7 @@ TEST(flow_naming, ScopesOfManyInterfacesAreAskedForOnce) {
       EXPECT_EQ(host6(address, true), "fe80::7%" + std::to_string(scope));
     }
   }
-  EXPECT_LT(services.scopes_asked, 700);  // 640, and a few that share a place
+  EXPECT_EQ(services.scopes_asked, 640);
 }
 
 // The numeric form by the system's own means.
