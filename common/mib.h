@@ -63,6 +63,10 @@ class object_tree {
  public:
   static constexpr object_id root = 0;
 
+  object_tree() = default;
+  object_tree(const object_tree &) = delete;  // its sets refer to it
+  object_tree &operator=(const object_tree &) = delete;
+
   // Builds the tree. Returns 0, or the error of the fetch when the provider table cannot be read; there is no
   // tree then. What is wrong with the other tables is reported on standard error, and the tree has what could
   // be read.
