@@ -7,7 +7,8 @@
 
 namespace platform {
 
-// Hints about a block that is about to be filled. Where the system cannot follow one, the block stays as it is.
+// Hints about a block that is about to be filled. Where the system cannot follow one, the block stays as it
+// is.
 
 // Asks for large pages behind the block.
 void prefer_large_pages(void *block, std::size_t size);
