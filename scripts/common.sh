@@ -6,6 +6,7 @@ cd "$(dirname "${BASH_SOURCE[0]}")/.." || exit
 build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase python3)
 package_packages=(dpkg-dev file)
 test_packages=(clang-14 libclang-rt-14-dev zsh fish "${package_packages[@]}")
+cross_packages=(g++-aarch64-linux-gnu qemu-user)
 lint_packages=(clang-format clang-tidy shellcheck mandoc)
 
 # Installs those of the named Debian packages that are missing. Silent when none is, and on systems whose packages
@@ -22,6 +23,18 @@ require_packages() {
   echo "Installing ${missing[*]}"
   "${as_root[@]}" DEBIAN_FRONTEND=noninteractive apt-get -qq update
   "${as_root[@]}" DEBIAN_FRONTEND=noninteractive apt-get -qq install --no-install-recommends "${missing[@]}" >/dev/null
+}
+
+# Unpacks libuuid for arm64 where the preset of that name looks for it. To install it would have this system know a
+# second architecture, and bring its C library along.
+provide_arm64_libuuid() {
+  local into=$PWD/build/arm64-libuuid
+  [[ ! -e $into/usr/lib ]] || return 0
+  mkdir -p "$into"/{lists,archives}/partial
+  local apt=(apt-get -qq -o APT::Architecture=arm64 -o APT::Architectures=arm64 -o APT::Sandbox::User=root
+    -o Dir::State::Lists="$into/lists" -o Dir::Cache="$into" -o Dir::Cache::Archives="$into/archives")
+  "${apt[@]}" update
+  (cd "$into" && "${apt[@]}" download libuuid1 && dpkg-deb -x libuuid1_*_arm64.deb .)
 }
 
 # Configures a preset and builds it, or those of its targets that are named.

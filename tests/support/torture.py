@@ -94,10 +94,11 @@ class Torture:
         sanitizer = os.environ.get("ASAN_OPTIONS", "") + ":verify_asan_link_order=0"
         return {"LD_PRELOAD": self.options.name_services, "ASAN_OPTIONS": sanitizer, **answers}
 
-    def run(self, kernel, line):
+    def run(self, kernel, line, program=None):
+        """Runs tarvelctl, or another program in its place, given as words."""
         self.runs += 1
         try:
-            done = subprocess.run([self.options.tarvelctl, *line.split()], env=kernel.environment, stdin=subprocess.DEVNULL,
+            done = subprocess.run([*(program or [self.options.tarvelctl]), *line.split()], env=kernel.environment, stdin=subprocess.DEVNULL,
                                   capture_output=True, timeout=60)
         except subprocess.TimeoutExpired:
             return Result(b"", b"", "does not end")
