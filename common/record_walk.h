@@ -1,13 +1,20 @@
-// Walking a table record by record: every bounds check of the decoders is here.
+// Walking a table record by record, with each step checked against the table's end, and reading the records
+// of an array out of order, for callers that have counted them.
 
 #ifndef TARVELCTL_COMMON_RECORD_WALK_H
 #define TARVELCTL_COMMON_RECORD_WALK_H
 
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
 #include <span>
 #include <type_traits>
+
+// Records are copied as they lie, so the machine must order bytes as the tables do; and sizes made of 32-bit
+// counts must fit in a size_t.
+static_assert(std::endian::native == std::endian::little);
+static_assert(sizeof(std::size_t) == 8);
 
 // A position in a table, which never leaves it. A step that does not fit leaves the position where it is.
 class record_walk {
@@ -51,8 +58,8 @@ class record_walk {
   std::span<const std::byte> rest_;
 };
 
-// The record at `index` of an array of records, by value. It is copied in blocks, because the compilers' one
-// instruction for copies of this size takes longer to start than to copy.
+// The record at `index` of an array of records, which has one there, by value. It is copied in blocks,
+// because the compilers' one instruction for copies of this size takes longer to start than to copy.
 template <class Record>
 Record record_at(std::span<const std::byte> records, std::size_t index) {
   static_assert(std::is_trivially_copyable_v<Record>);
@@ -65,7 +72,7 @@ Record record_at(std::span<const std::byte> records, std::size_t index) {
   return record;
 }
 
-// A member of the record at `index`: `offset` and type as in the record.
+// A member of the record at `index`, which the array has: `offset` and type as in the record.
 template <class Record, class Member>
 Member member_at(std::span<const std::byte> records, std::size_t index, std::size_t offset) {
   Member value;

@@ -5,6 +5,7 @@ usage: package_test.py CPACK CONFIGURATION SOURCES
 """
 import os
 import pathlib
+import re
 import subprocess
 import sys
 import tempfile
@@ -30,7 +31,7 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     run(cpack, "--config", configuration, "-G", "DEB", "-B", scratch / "made")
     package, = scratch.glob("made/*.deb")
     depends = run("dpkg-deb", "--field", package, "Depends")
-    assert "libc6" in depends and "libuuid1" in depends, depends
+    assert all(name in depends for name in ("libc6", "libuuid1", "libstdc++6")), depends
 
     # What it depends on is installed elsewhere.
     root = scratch / "root"
@@ -48,6 +49,8 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
         assert sign in shown, f"no {sign} in {shown}"
     page = run("gzip", "-cd", root / "usr/share/man/man1/tarvelctl.1.gz")
     assert page == pathlib.Path(sources, "docs/tarvelctl.1").read_text()
+    guide = (root / "usr/share/doc/tarvelctl/from-symptom-to-command.md").read_text()
+    assert not re.search(r"\]\((?!#)", guide), "a link to a page that is not installed"
 
     run(*dpkg, "--purge", "tarvelctl")
     left = [path for path in root.iterdir() if path.name != "var"]
