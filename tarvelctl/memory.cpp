@@ -1,6 +1,7 @@
 // memory: the arenas with their processes and regions, and what the regions take by type.
 
 #include <iterator>
+#include <limits>
 
 #include "common/arena.h"
 #include "common/invariant.h"
@@ -70,6 +71,8 @@ double object_inflation(const tv_stats_region &region) {
   if (region.obj_count_req == 0 || region.obj_size_req == 0) return 0;
   const auto effective = static_cast<double>(region.obj_size * region.obj_count);
   const auto requested = static_cast<double>(region.obj_size_req * region.obj_count_req);
+  // Machines differ in the sign of 0 / 0, which is printed.
+  if (effective == 0 && requested == 0) return -std::numeric_limits<double>::quiet_NaN();
   return (effective / requested - 1) * 100;
 }
 

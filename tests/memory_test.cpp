@@ -132,7 +132,7 @@ TEST(memory, ProductsWrapBeforeTheyAreCompared) {
     const char *inflation, *occupancy;
   } const cases[] = {
       {1, 4, 1, 1, 5, "(-75.00% ", "(500.00% "},     {1, top, 3, top, top, "(0.00% ", "(0.00% "},
-      {half, half, 1, 1, 0, "(inf% ", "(0.00% "},    {half, half, half, half, 0, "nan% ", "(0.00% "},
+      {half, half, 1, 1, 0, "(inf% ", "(0.00% "},    {half, half, half, half, 0, "(-nan% ", "(0.00% "},
       {0, 9, 9, 9, top + 1, "(0.00% ", "(100.00% "}, {top, 0, 9, 9, 1, "(0.00% ", "(100.00% "},
   };
   for (const auto &[count, size, effective_count, effective_size, in_use, inflation, occupancy] : cases) {
