@@ -85,7 +85,7 @@ constinit output diagnostics{diagnostics_storage, output::failure::ignored};
 
 void output::redirect(int fd) {
   flush();
-  dup2(fd, fd_);
+  dup3(fd, fd_, fcntl(fd_, F_GETFD) == FD_CLOEXEC ? O_CLOEXEC : 0);
   ::close(fd);
   attach(fd_);
 }
@@ -215,12 +215,16 @@ int output::abandon() noexcept {
   return 0;
 }
 
-void attach_standard_outputs() {
+void attach_diagnostics() {
   for (int fd = STDIN_FILENO; fd <= STDERR_FILENO; ++fd) {
-    if (fcntl(fd, F_GETFD) < 0) open("/dev/null", O_RDONLY);
+    if (fcntl(fd, F_GETFD) < 0) open("/dev/null", O_RDONLY | O_CLOEXEC);
   }
-  report.attach(STDOUT_FILENO);
   // The C library writes to standard error too, and would lose what a full pipe does not take at once.
   const int own = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
   diagnostics.attach(own < 0 ? STDERR_FILENO : own);
+}
+
+void attach_standard_outputs() {
+  attach_diagnostics();
+  report.attach(STDOUT_FILENO);
 }

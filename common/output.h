@@ -131,4 +131,8 @@ void complain(const Args &...args) {
 // makes their use fail, so that no file opened later can take their place.
 void attach_standard_outputs();
 
+// The same for standard error alone, in a program that leaves standard output as it is. A program that it
+// starts gets its standard descriptors as they were.
+void attach_diagnostics();
+
 #endif

@@ -6,6 +6,7 @@ usage: lab_run_test.py TARVELLAB [unittest options]
 import os
 import pathlib
 import pty
+import resource
 import signal
 import subprocess
 import sys
@@ -113,6 +114,12 @@ class Run(LabTest):
         seen = run("run", "--", "true", env=self.env, preexec_fn=lambda: limit_files(1000))
         self.assertEqual((seen.returncode, seen.stderr.count("File too large")), (1, 1))
         self.assertTrue(self.nothing_left())
+
+    def test_DiagnosticsDoWithoutADescriptorOfTheirOwn(self):
+        def leave_no_descriptor():
+            os.close(0)  # the loader needs one
+            resource.setrlimit(resource.RLIMIT_NOFILE, (3, 3))
+        self.assertRegex(run("nope", preexec_fn=leave_no_descriptor).stderr, "^usage:\n")
 
     def test_ASignalThatCameBeforeTheCommandIsItsEnd(self):
         def signalled():
