@@ -6,7 +6,7 @@
 
 void require(bool holds, const invariant &broken) {
   if (holds) return;
-  complain<"Assertion failed: (%s), function %s, file %s, line %d.\n">(broken.expression, broken.function,
-                                                                       broken.file, broken.line);
+  say_last_words<"Assertion failed: (%s), function %s, file %s, line %d.\n">(
+      broken.expression, broken.function, broken.file, broken.line);
   std::abort();
 }

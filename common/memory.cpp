@@ -7,7 +7,7 @@
 namespace {
 
 [[noreturn]] void end_without_memory() {
-  complain<"malloc failed">();
+  say_last_words<"malloc failed">();
   std::exit(exit_status::out_of_memory);
 }
 
@@ -22,7 +22,7 @@ void *xmalloc(std::size_t size) {
 void *xrealloc(void *block, std::size_t size) {
   void *resized = std::realloc(block, size ? size : 1);
   if (resized) return resized;
-  complain<"realloc failed">();
+  say_last_words<"realloc failed">();
   std::exit(exit_status::out_of_memory);
 }
 

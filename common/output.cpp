@@ -78,6 +78,12 @@ void end_by_broken_pipe() {
   raise(SIGPIPE);
 }
 
+// Where the reader has gone, this ends the process.
+void say_failure(int error) {
+  if (error == EPIPE) end_by_broken_pipe();
+  complain<"write error: %s\n">(strerror(error));
+}
+
 }  // namespace
 
 constinit output report{report_storage, output::failure::fatal};
@@ -108,29 +114,29 @@ void output::close() {
   if (::close(fd) < 0 && errno != EINTR) fail(errno);
 }
 
-// How much the next write may carry of the bytes up to `upto`.
-std::size_t output::next_piece(const char *upto) const {
-  const auto all = static_cast<std::size_t>(upto - begin_);
-  if (!is_pipe_ || all <= PIPE_BUF) return all;
-  const auto *last = static_cast<const char *>(memrchr(begin_, '\n', PIPE_BUF));
-  return last ? static_cast<std::size_t>(last + 1 - begin_) : PIPE_BUF;
+// What the next write of `bytes` may carry of them.
+std::string_view output::next_piece(std::string_view bytes) const {
+  if (!is_pipe_ || bytes.size() <= PIPE_BUF) return bytes;
+  const std::size_t last = bytes.rfind('\n', PIPE_BUF - 1);
+  return bytes.substr(0, last == bytes.npos ? PIPE_BUF : last + 1);
 }
 
-// One write of at most `size` bytes. A socket cannot be opened anew, but told not to wait each time.
-ssize_t output::write_once(std::size_t size) const {
-  return is_socket_ ? send(fd_, begin_, size, MSG_DONTWAIT) : write(fd_, begin_, size);
+// One write. A socket cannot be opened anew, but told not to wait each time.
+ssize_t output::write_once(std::string_view bytes) const {
+  return is_socket_ ? send(fd_, bytes.data(), bytes.size(), MSG_DONTWAIT)
+                    : write(fd_, bytes.data(), bytes.size());
 }
 
-// Writes at most `size` bytes, waiting for room where writing cannot be told not to wait. A terminal may wait
+// Writes as write_once(), waiting for room where writing cannot be told not to wait. A terminal may wait
 // also when it has some room. Then SIGINT has to come through, and what it cuts off is dropped: how much was
 // written is not known.
-ssize_t output::write_piece(std::size_t size, const sigset_t &unheld) {
+ssize_t output::write_piece(std::string_view bytes, const sigset_t &unheld) {
   if (may_block_) wait_for_room(fd_, nullptr, &unheld);
-  if (!may_block_ || !is_terminal_) return write_once(size);
+  if (!may_block_ || !is_terminal_) return write_once(bytes);
   write_is_open_ = true;
   sigset_t held;
   sigprocmask(SIG_SETMASK, &unheld, &held);
-  const ssize_t written = write_once(size);
+  const ssize_t written = write_once(bytes);
   const int error = errno;
   sigprocmask(SIG_SETMASK, &held, nullptr);
   errno = error;
@@ -139,30 +145,38 @@ ssize_t output::write_piece(std::size_t size, const sigset_t &unheld) {
 }
 
 // Writes the bytes up to `upto`, lines_end_ or end_, and moves what follows to the buffer's front.
-void output::drain(const char *upto) {
-  {
-    const interrupt_hold hold;
-    while (begin_ < upto && !error_) {
-      const ssize_t written = write_piece(next_piece(upto), hold.before());
-      if (written > 0) {
-        begin_ += written;
-      } else if (written == 0) {
-        error_ = EIO;
-      } else if (errno == EAGAIN) {
-        wait_for_room(fd_, nullptr, &hold.before());
-        hold.pause();  // where there is room at once, waiting lets no signal in
-      } else if (errno != EINTR) {
-        error_ = errno;
-      }
+// After an error_ the buffer is empty.
+void output::write_out(const char *upto) {
+  const interrupt_hold hold;
+  while (begin_ < upto && !error_) {
+    const ssize_t written = write_piece(next_piece({begin_, upto}), hold.before());
+    if (written > 0) {
+      begin_ += written;
+    } else if (written == 0) {
+      error_ = EIO;
+    } else if (errno == EAGAIN) {
+      wait_for_room(fd_, nullptr, &hold.before());
+      hold.pause();  // where there is room at once, waiting lets no signal in
+    } else if (errno != EINTR) {
+      error_ = errno;
     }
-    if (error_) begin_ = end_;
-    const auto rest = static_cast<std::size_t>(end_ - begin_);
-    std::memmove(storage_, begin_, rest);
-    begin_ = storage_;
-    end_ = storage_ + rest;
-    lines_end_.store(storage_, std::memory_order_release);
   }
+  if (error_) begin_ = end_;
+  const auto rest = static_cast<std::size_t>(end_ - begin_);
+  std::memmove(storage_, begin_, rest);
+  begin_ = storage_;
+  end_ = storage_ + rest;
+  lines_end_.store(storage_, std::memory_order_release);
+}
+
+void output::drain(const char *upto) {
+  write_out(upto);
   if (error_) fail(error_);
+}
+
+void output::flush_at_last() {
+  write_out(end_);
+  if (error_) say_failure(error_);
 }
 
 // Makes room for a row that goes on after the whole lines are out, if need be in a larger buffer.
@@ -186,33 +200,37 @@ void output::fail(int error) {
     error_ = 0;
     return;
   }
-  if (error == EPIPE) end_by_broken_pipe();
-  complain<"write error: %s\n">(strerror(error));
+  say_failure(error);
   std::exit(exit_status::output_failed);
 }
 
-int output::abandon() noexcept {
-  signal(SIGPIPE, SIG_IGN);  // who interrupts is told nothing of a reader that has gone
-  if (write_is_open_) return 0;
-  if (error_) return error_ == EPIPE ? 0 : error_;
+// Writes all that a tenth of a second allows. Returns 0 or the error number of a write.
+int output::write_within_limit(std::string_view bytes) const noexcept {
   const std::int64_t deadline = monotonic_time() + nanoseconds / 10;
-  const char *const upto = lines_end_.load(std::memory_order_acquire);
   bool wait = may_block_;
-  while (begin_ < upto) {
+  while (!bytes.empty()) {
     const timespec left = time_until(deadline);
     if (wait && !wait_for_room(fd_, &left, nullptr)) return 0;
-    const ssize_t written = write_once(next_piece(upto));
+    const ssize_t written = write_once(next_piece(bytes));
     if (written > 0) {
-      begin_ += written;
+      bytes.remove_prefix(static_cast<std::size_t>(written));
     } else if (written < 0 && errno == EAGAIN) {
       if (monotonic_time() > deadline) return 0;  // it says that it has room, but takes nothing
       wait = true;
     } else if (written == 0 || errno != EINTR) {
-      const int error = written == 0 ? EIO : errno;
-      return error == EPIPE ? 0 : error;
+      return written == 0 ? EIO : errno;
     }
   }
   return 0;
+}
+
+int output::abandon() const noexcept {
+  signal(SIGPIPE, SIG_IGN);  // who interrupts is told nothing of a reader that has gone
+  if (write_is_open_) return 0;
+  // A flush that is interrupted may be beyond the last whole line.
+  const char *const upto = std::max(begin_, lines_end_.load(std::memory_order_acquire));
+  const int error = error_ ? error_ : write_within_limit({begin_, upto});
+  return error == EPIPE ? 0 : error;
 }
 
 void attach_diagnostics() {

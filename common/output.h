@@ -15,6 +15,7 @@
 #include <cstdint>
 #include <memory>
 #include <span>
+#include <string_view>
 
 #include "common/print.h"
 
@@ -56,12 +57,20 @@ class output {
     if (end_ != begin_) drain(end_);
   }
 
+  // As flush(), but where the write fails, that is said and the process goes on: it ends in another way. A
+  // reader that has gone ends it here too.
+  void flush_at_last();
+
   // Flushes, closes the descriptor and reports what closing it says.
   void close();
 
   // For a signal handler, at any instruction: writes the whole lines that are not written yet. A reader that
   // takes nothing for 0.1 s loses the rest. Returns 0 or the error number of a write.
-  int abandon() noexcept;
+  int abandon() const noexcept;
+
+  // For a signal handler, at any instruction: writes `text` past the buffer. What takes longer than 0.1 s, or
+  // fails, is lost.
+  void write_at_once(std::string_view text) const noexcept { write_within_limit(text); }
 
   // The sink interface of format::print_to.
   char *room(std::size_t size) {
@@ -81,11 +90,13 @@ class output {
  private:
   static constexpr std::ptrdiff_t flush_size = 32 * 1024;
 
-  std::size_t next_piece(const char *upto) const;
-  ssize_t write_once(std::size_t size) const;
-  ssize_t write_piece(std::size_t size, const sigset_t &unheld);
+  std::string_view next_piece(std::string_view bytes) const;
+  ssize_t write_once(std::string_view bytes) const;
+  int write_within_limit(std::string_view bytes) const noexcept;
+  ssize_t write_piece(std::string_view bytes, const sigset_t &unheld);
   void make_room(std::size_t size);
   void drain(const char *upto);
+  void write_out(const char *upto);
   void fail(int error);
 
   // begin_ <= lines_end_ <= end_ <= limit_. Bytes before begin_ are written, bytes up to lines_end_ are whole
@@ -123,6 +134,15 @@ void print(const Args &...args) {
 template <format::text F, class... Args>
 void complain(const Args &...args) {
   report.flush();
+  format::print_to<F>(diagnostics, args...);
+  diagnostics.flush();
+}
+
+// Prints to standard error as complain() does, for a process that ends by what it says: a report that cannot
+// be written does not end it in another way, but is complained of first.
+template <format::text F, class... Args>
+void say_last_words(const Args &...args) {
+  report.flush_at_last();
   format::print_to<F>(diagnostics, args...);
   diagnostics.flush();
 }

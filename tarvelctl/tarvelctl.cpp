@@ -34,10 +34,10 @@ namespace {
 void interrupted(int /*signal*/) {
   const int error = report.abandon();
   if (!error) _exit(EXIT_SUCCESS);
-  const std::string_view parts[] = {"write error: ", strerrordesc_np(error), "\n"};
-  for (const std::string_view part : parts) {
-    if (write(STDERR_FILENO, part.data(), part.size()) < 0) break;
-  }
+  const char *const known = strerrordesc_np(error);  // strerror() allocates where it knows none
+  const auto unknown = format::text_of<"Unknown error %d", 32>(error);
+  const std::string_view reason = known ? known : unknown.view();
+  diagnostics.write_at_once(format::text_of<"write error: %.60s\n", 80>(reason).view());
   _exit(exit_status::output_failed);
 }
 

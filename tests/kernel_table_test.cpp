@@ -2,6 +2,7 @@
 
 #include "common/kernel_table.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 
 #include <cerrno>
@@ -145,21 +146,22 @@ template <class Allocation>
 void ends_without_memory(Allocation allocate, const char *message) {
   const auto attempt = [&] {
     diagnostics.attach(STDERR_FILENO);
+    report.attach(open("/dev/full", O_WRONLY));
+    print<"lost\n">();
     volatile std::size_t size = too_much;
     allocate(size);
   };
-  EXPECT_EXIT(attempt(), testing::ExitedWithCode(255), message);
+  const std::string lost = "^write error: No space left on device\n";
+  EXPECT_EXIT(attempt(), testing::ExitedWithCode(255), lost + message);
 }
 
 TEST(allocation, OfNothingIsABlockToo) {
-  void *const block = xmalloc(0);
-  EXPECT_NE(block, nullptr);
-  void *const resized = xrealloc(block, 0);
+  void *const resized = xrealloc(xmalloc(0), 0);
   EXPECT_NE(resized, nullptr);
   std::free(resized);
 }
 
-TEST(allocation, FailureEndsTheProcessWithStatus255) {
+TEST(allocation, FailureEndsTheProcessWithStatus255WhateverBecomesOfTheReport) {
   ends_without_memory([](std::size_t size) { xmalloc(size); }, "malloc failed$");
   ends_without_memory([](std::size_t size) { xrealloc(nullptr, size); }, "realloc failed$");
 #if !defined(__SANITIZE_ADDRESS__)  // whose operator new does not ask the handler

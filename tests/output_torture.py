@@ -1,6 +1,7 @@
 #!/usr/bin/env python3
 """Lets each write of a report or of a diagnostic fail, be short or be interrupted, and real devices be closed or full."""
 import errno
+import fcntl
 import itertools
 import os
 import pathlib
@@ -13,7 +14,7 @@ import tool_model
 from fault_injection import FOREVER, SIGINT, Torture, exactly, that
 
 HARMLESS = (1, errno.EINTR), (3, errno.EINTR), (3, errno.EAGAIN), (1, -1), (1, -100), (FOREVER, -4095), (40, -1)
-FATAL = errno.ENOSPC, errno.EIO, errno.EDQUOT, errno.EBADF, errno.EFBIG, 0, errno.EPIPE
+FATAL = errno.ENOSPC, errno.EIO, errno.EDQUOT, errno.EBADF, errno.EFBIG, 524, 0, errno.EPIPE  # 524 has no description
 
 
 def error_end(error, signalled=False):
@@ -100,6 +101,9 @@ def device_cases(torture, line):
 
 
 def cases(torture):
+    reader, writer = os.pipe()  # nobody reads it, and it takes no more
+    os.write(writer, bytes(fcntl.fcntl(writer, fcntl.F_GETPIPE_SZ)))
+    yield "tree", [("w", 1, FOREVER, 5), ("w", 1, 1, SIGINT)], exactly("", "", 74), {"prepare": lambda: os.dup2(writer, 2)}
     reports = ["provider -D", f"netstat -n --show-zeros {tool_model.ALL}", "tree"]
     for line in reports:
         for to in "pipe", "file", "-f", "socket", "terminal":
@@ -112,5 +116,5 @@ def cases(torture):
         yield from diagnostic_cases(torture, line, faults)
 
 
-Torture("output_torture", __doc__, 350, "--providers 250 --nexuses 60 --channels 40 --flows 90 --arenas 2 --stacks 9"
+Torture("output_torture", __doc__, 700, "--providers 250 --nexuses 60 --channels 40 --flows 90 --arenas 2 --stacks 9"
         " --namespaces 5 --processes 9").finish(cases)

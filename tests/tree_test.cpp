@@ -257,8 +257,10 @@ TEST_F(show, FlowsOfOtherFamiliesAbort) {
   const std::string shown = shown_a +
                             "wifi\n\tPort[ 2] curl.42               defunct\n"
                             "\t\t 10.0.0.1.443 <-> 0.0.0.0.51000\n\t\t fe80::1.443 <-> ::.0\n";
-  for (const char *line : {"show", "channel-stats"})
-    EXPECT_EQ(run(line), inconsistent("cmd_show", 2030, "0", shown));
+  const run_result result = inconsistent("cmd_show", 2030, "0", shown);
+  EXPECT_EQ(run("show"), result);
+  EXPECT_EQ(run("channel-stats", {.stdout_path = "/dev/full"}),
+            complained("write error: No space left on device\n" + result.err, -SIGABRT));
 }
 
 }  // namespace
