@@ -11,6 +11,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <string_view>
+#include <vector>
 
 #include "common/memory.h"
 #include "common/output.h"
@@ -99,10 +100,17 @@ const command_entry &find_command(const char *word) {
 
 void print_timestamp() {
   const time_t now = time(nullptr);
-  tm local;
   char text[100] = "";
-  if (localtime_r(&now, &local)) strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S", &local);
+  // Other than localtime_r(), this looks each time whether the system's time zone has changed.
+  if (const tm *local = localtime(&now)) strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S", local);
   print<"\n%s\n">(highlight(text, colour::cyan));
+}
+
+// One run of a watch. The option parser permutes the vector that it scans, and each run is to see the words
+// as they were typed.
+int run_on_copy(command_handler handler, int argc, char **argv) {
+  std::vector<char *> words(argv, argv + argc);
+  return handler(argc, words.data());
 }
 
 [[noreturn]] void watch(command_handler handler, int argc, char **argv) {
@@ -110,7 +118,7 @@ void print_timestamp() {
     print_timestamp();
     report.flush();  // the option parser writes to standard error by itself
     optind = 0;      // parse the options afresh, and forget where inside a word the last scan ended
-    if (handler(argc, argv) != 0) finish();
+    if (run_on_copy(handler, argc, argv) != 0) finish();
     report.flush();
     sleep(static_cast<unsigned>(refresh_interval));
   }
@@ -124,6 +132,7 @@ void run_command_line(int argc, char **argv) {
   sigaction(SIGINT, &action, nullptr);
   attach_standard_outputs();
   make_new_fail_fast();
+  unsetenv("POSIXLY_CORRECT");  // for the option parser, options would end at the first operand
 
   if (argc > 0) {
     const char *slash = std::strrchr(argv[0], '/');

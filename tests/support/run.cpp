@@ -64,7 +64,9 @@ channel make_stdout(const run_options &options) {
   for (const int fd : options.closed) close(fd);
   for (const int number : options.ignored) signal(number, SIG_IGN);
   if (!options.directory.empty() && chdir(options.directory.c_str()) != 0) _exit(126);
+  if (options.prepare) options.prepare();
   setenv("TARVEL_ROOT", kernel.root().c_str(), 1);
+  setenv("POSIXLY_CORRECT", "", 1);  // options behind operands are options none the less
 
   const std::string name = options.program_name.empty() ? TARVELCTL_PROGRAM : options.program_name;
   std::vector<char *> argv{const_cast<char *>(name.c_str())};

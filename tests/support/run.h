@@ -55,6 +55,7 @@ struct run_options {
   std::vector<int> ignored{};         // signals that the caller has ignored
   std::string program_name{};         // in place of the program's path, as its first argument
   std::filesystem::path directory{};  // where it runs
+  std::function<void()> prepare{};    // called in the process before it starts
   std::function<void(const running &)> meanwhile{};  // called at least every few milliseconds
 };
 
