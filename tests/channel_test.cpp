@@ -129,15 +129,15 @@ std::size_t listings(const running &run) {
 }
 
 TEST_F(channel_command, WatchShowsWhatHappenedBetweenTwoSnapshots) {
-  std::string before = group(nexus_a, 2) + channel(channel_p, 2, 3, 1) + ring(3, {10, 1000, 100}, {1, 5, 2}) +
-                       ring(3, {20, 2400, 101}) + ring(5) + ring(3, {0, 70, 0}) + channel(channel_r, 3, 20) +
-                       ring(90, {0, 60, 0}) + ring(90);
+  std::string before = group(nexus_a, 2) + channel(channel_p, 2, 3, 1) +
+                       ring(3, {10, 1000, 100}, {1, 5, 2}).u64(168, 5) + ring(3, {20, 2400, 101}) + ring(5) +
+                       ring(3, {0, 70, 0}) + channel(channel_r, 3, 20) + ring(90, {0, 60, 0}) + ring(90);
   for (std::uint32_t id = 18; id > 0; --id) before += ring(2 * id, {0, id, 0});
   const std::string after = group(nexus_b, 1) + channel(channel_q, 7, 1) + ring(3, {9, 9, 2}, {9, 9, 9}) +
                             group(nexus_a, 2) + channel(channel_p, 2, 2, 1) +
-                            ring(3, {400, 2500, 105}, {1, 3, 5}) + ring(4, {8, 9, 2}) + ring(3, {0, 75, 0}) +
-                            channel(channel_r, 3, 4) + ring(90, {0, 67, 0}) + ring(7, {0, 9, 0}) +
-                            ring(4, {0, 11, 0}) + ring(91, {0, 9, 0});
+                            ring(3, {400, 2500, 105}, {1, 3, 5}).u64(168, 7) + ring(4, {8, 9, 2}) +
+                            ring(3, {0, 75, 0}) + channel(channel_r, 3, 4) + ring(90, {0, 67, 0}) +
+                            ring(7, {0, 9, 0}) + ring(4, {0, 11, 0}) + ring(91, {0, 9, 0});
   const auto meanwhile = [&, interrupt = interrupt_after(2, "\n\n\n")](const running &run) {
     if (listings(run) == 1) kernel.table(channel_list, after);
     interrupt(run);
@@ -151,6 +151,7 @@ TEST_F(channel_command, WatchShowsWhatHappenedBetweenTwoSnapshots) {
                 "\n2. AAAAAAAA-0000-0000-0000-00000000000A\n" + port_line(" 2") +
                 watch_line("TX[3]         ", "    1.50K", "   390.00", "    3", "     2.00") +
                 watch_line("           0/0", " 18446744.07T", "     0.00", "    0", "     1.00") +
+                "     Errors: Length too large: 7.00\n" +
                 watch_line("TX[4]         ", "     0.00", "     0.00", "    4") + idle_sync +
                 watch_line("RX[3]         ", "     5.00") + idle_sync + "\n" + port_line(" 3") +
                 watch_line("TX[90]        ", "     7.00") + idle_sync + watch_line("TX[7]         ") +

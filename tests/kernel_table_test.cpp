@@ -10,6 +10,7 @@
 
 #include "common/output.h"
 #include "platform/sysctl.h"
+#include "tarvelctl/command.h"
 #include "tests/support/capture.h"
 #include "tests/support/fake_kernel.h"
 
@@ -140,6 +141,14 @@ TEST(kernel_table, HoldsTheLastSnapshotOnly) {
   EXPECT_TRUE(table.empty());
   EXPECT_EQ(table.fetch("a"), 0);
   EXPECT_TRUE(table.bytes().empty());
+}
+
+TEST(netns, OfAllGoesOnWatchingWhereThereWasNoMemory) {
+  the_kernel = {joined({no_size(11), {fails(EIO)}}), {}};
+  char words[][12] = {"tarvelctl", "netns", "-a", "-w", "1"};
+  char *line[] = {words[0], words[1], words[2], words[3], words[4]};
+  EXPECT_EXIT(run_command_line(5, line), testing::ExitedWithCode(0),
+              "^" + no_len.messages + "sysctl for len failed, Input/output error\n$");
 }
 
 template <class Allocation>
