@@ -160,7 +160,7 @@ void ends_without_memory(Allocation allocate, const char *message) {
     volatile std::size_t size = too_much;
     allocate(size);
   };
-  const std::string lost = "^write error: No space left on device\n";
+  const std::string lost = "write error: No space left on device\n";
   EXPECT_EXIT(attempt(), testing::ExitedWithCode(255), lost + message);
 }
 
