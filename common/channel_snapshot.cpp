@@ -41,12 +41,12 @@ void channel_snapshot::append(const channel_ref &ref) {
 }
 
 const channel_ref *channel_snapshot_find(const channel_snapshot &snapshot, const uuid &channel) {
-  uuid_index &index = snapshot.by_channel_;
+  key_index &index = snapshot.by_channel_;
   if (index.empty()) {
     for (std::uint32_t i = 0; i < snapshot.ref_count_; ++i) {
       if (snapshot.refs_[i].entry) index.add(snapshot.refs_[i].channel().channel_uuid, i);
     }
   }
   const std::uint32_t found = index.find(channel);
-  return found == uuid_index::none ? nullptr : &snapshot.refs_[found];
+  return found == key_index::none ? nullptr : &snapshot.refs_[found];
 }

@@ -11,7 +11,7 @@
 #include "common/channel.h"
 #include "common/kernel_table.h"
 #include "common/record_walk.h"
-#include "common/uuid_index.h"
+#include "common/key_index.h"
 
 // Where the bytes of a channel lie in the table that holds them.
 struct channel_ref {
@@ -50,7 +50,7 @@ class channel_snapshot {
   std::unique_ptr<channel_ref[], c_free> refs_;
   std::size_t ref_count_ = 0;
   std::size_t capacity_ = 0;
-  mutable uuid_index by_channel_;  // made when it is first asked
+  mutable key_index by_channel_;  // made when it is first asked
 };
 
 // Fills an empty snapshot from the kernel. Returns false, with the snapshot empty, when the table cannot be

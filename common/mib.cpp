@@ -29,14 +29,6 @@ void sort_by_port(std::vector<channel_position> &channels) {
   if (before_gap != channels.end()) std::rotate(channels.begin(), before_gap + 1, channels.end());
 }
 
-// A key for the index of ports.
-uuid port_key(object_id parent, std::uint32_t port) {
-  uuid key{};
-  std::memcpy(key.bytes, &parent, sizeof parent);
-  std::memcpy(key.bytes + sizeof parent, &port, sizeof port);
-  return key;
-}
-
 }  // namespace
 
 int object_tree::scrape_tree() {
@@ -112,7 +104,7 @@ void object_tree::index_ports() {
   for (object_id id = 0; id < nodes_.size(); ++id) {
     if (nodes_[id].released || nodes_[id].node.type != object_type::channel) continue;
     const object_node &channel = nodes_[id].node;
-    by_port_.add(port_key(channel.parent, channel.record<channel_entry>().port), id);
+    by_port_.add({channel.parent, channel.record<channel_entry>().port}, id);
   }
 }
 
@@ -143,8 +135,8 @@ std::vector<sort_key> object_tree::find_channels() {
       continue;
     }
     const auto port = member_at<tv_stats_flow, std::uint32_t>(flows, i, offsetof(tv_stats_flow, sf_nx_port));
-    const object_id channel = by_port_.find(port_key(nexus, port));
-    if (channel != uuid_index::none) found.push_back(make_sort_key(channel, i));
+    const object_id channel = by_port_.find({nexus, port});
+    if (channel != key_index::none) found.push_back(make_sort_key(channel, i));
   }
   return found;
 }
@@ -199,7 +191,7 @@ void object_tree::make_findable(object_id id) {
 
 object_id object_tree::find_object(const uuid &key) {
   const object_id first = by_uuid_.find(key);
-  if (first == uuid_index::none) return no_object;
+  if (first == key_index::none) return no_object;
   if (nodes_[first].rivals == no_rivals) return nodes_[first].released ? no_object : first;
   rival_set &rivals = rivals_[nodes_[first].rivals];
   while (!rivals.empty() && nodes_[*rivals.begin()].released) rivals.erase(rivals.begin());

@@ -1,18 +1,14 @@
 #include "common/process_names.h"
 
-#include <cstring>
-
 #include "common/output_helpers.h"
 
 const process_names::text &process_names::of(int pid) {
-  uuid key{};
-  std::memcpy(key.bytes, &pid, sizeof pid);
-  const std::uint32_t known = by_pid_.find(key);
-  if (known != uuid_index::none) return texts_[known];
+  const std::uint32_t known = by_pid_.find(pid);
+  if (known != key_index::none) return texts_[known];
   text name;
   name.size = pid_to_name(pid, name.chars, sizeof name.chars, with_pid_).text.size();
   name.foreign = true;
-  by_pid_.add(key, static_cast<std::uint32_t>(texts_.size()));
+  by_pid_.add(pid, static_cast<std::uint32_t>(texts_.size()));
   texts_.push_back(name);
   return texts_.back();
 }

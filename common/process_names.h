@@ -5,8 +5,8 @@
 
 #include <vector>
 
+#include "common/key_index.h"
 #include "common/print.h"
-#include "common/uuid_index.h"
 
 // Asks for the name of each process once, however many rows it owns: a question costs more than all else in a
 // row. It lives as long as one report, in which a process then has one name.
@@ -23,7 +23,7 @@ class process_names {
  private:
   bool with_pid_;
   std::vector<text> texts_;
-  uuid_index by_pid_;
+  key_index by_pid_;
 };
 
 #endif

@@ -71,9 +71,9 @@ std::string process_number(std::uint32_t number) {
 
 }  // namespace
 
-std::uint32_t substitutes::numbering::of(const uuid &key) {
+std::uint32_t substitutes::numbering::of(const index_key &key) {
   const std::uint32_t known = numbers_.find(key);
-  if (known != uuid_index::none) return known;
+  if (known != key_index::none) return known;
   numbers_.add(key, ++used_);
   return used_;
 }
@@ -84,10 +84,8 @@ void substitutes::replace(ipv4_address &address) {
   if (stays(original)) return;
   std::size_t kind = 0;
   while ((original & kinds[kind].mask) != kinds[kind].network) ++kind;
-  uuid key{};
-  std::memcpy(key.bytes, address.bytes, sizeof address.bytes);
   const ipv4_kind &row = kinds[kind];
-  const std::uint32_t host = row.pool + ipv4_[kind].of(key);
+  const std::uint32_t host = row.pool + ipv4_[kind].of(address);
   put_number((row.pool & row.pool_mask) | (host & ~row.pool_mask), address.bytes);
 }
 
@@ -101,8 +99,7 @@ void substitutes::replace(ipv6_address &address) {
     return;
   }
   ipv6_address substitute{{0x3f, 0xff}};
-  uuid key;
-  std::memcpy(key.bytes, address.bytes, sizeof key.bytes);
+  ipv6_address key = address;
   const bool is_multicast = address.bytes[0] == 0xff;
   const bool is_link_local = address.bytes[0] == 0xfe && (address.bytes[1] & 0xc0) == 0x80;
   if (is_multicast || is_link_local) {
@@ -124,8 +121,7 @@ void substitutes::replace_mac(std::uint8_t (&address)[6]) {
     return std::ranges::all_of(address, [value](std::uint8_t byte) { return byte == value; });
   };
   if (is(0) || is(0xff)) return;
-  uuid key{};
-  std::memcpy(key.bytes, address, sizeof address);
+  const index_key key(address);
   address[0] = static_cast<std::uint8_t>(0x02 | (address[0] & 0x01));  // a group stays one
   address[1] = 0;
   put_number(macs_.of(key), address);

@@ -12,8 +12,8 @@
 #include <string>
 #include <string_view>
 
+#include "common/key_index.h"
 #include "common/socket_address.h"
-#include "common/uuid_index.h"
 
 namespace lab {
 
@@ -39,10 +39,10 @@ class substitutes {
   // Numbers in the order of the questions, from 1.
   class numbering {
    public:
-    std::uint32_t of(const uuid &key);
+    std::uint32_t of(const index_key &key);
 
    private:
-    uuid_index numbers_;
+    key_index numbers_;
     std::uint32_t used_ = 0;
   };
 

@@ -5,7 +5,7 @@
 #include "common/output.h"
 
 void region_set::add(const tv_stats_region &region) {
-  if (by_uuid_.find(region.region_uuid) != uuid_index::none) return;
+  if (by_uuid_.find(region.region_uuid) != key_index::none) return;
   if (count_ == capacity_) grow();
   by_uuid_.add(region.region_uuid, static_cast<std::uint32_t>(count_));
   items_[count_++] = {region.region_uuid, static_cast<std::uint32_t>(region.type), region.mem_total,

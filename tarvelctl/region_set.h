@@ -9,7 +9,7 @@
 
 #include "common/arena.h"
 #include "common/memory.h"
-#include "common/uuid_index.h"
+#include "common/key_index.h"
 
 // Regions by UUID, with type and memory as they were when each was first seen. It only grows.
 class region_set {
@@ -36,7 +36,7 @@ class region_set {
   std::unique_ptr<item[], c_free> items_;
   std::size_t count_ = 0;
   std::size_t capacity_ = 0;
-  uuid_index by_uuid_;
+  key_index by_uuid_;
 };
 
 #endif

@@ -2,24 +2,18 @@
 
 #include <gtest/gtest.h>
 
-#include "common/uuid_index.h"
+#include "common/key_index.h"
 
 namespace {
 
-uuid numbered(unsigned number) {
-  uuid id{};
-  std::memcpy(id.bytes, &number, sizeof number);
-  return id;
-}
-
-TEST(uuid_index, FindsWhatWasAddedFirst) {
+TEST(key_index, FindsWhatWasAddedFirst) {
   constexpr unsigned count = 1000;
-  uuid_index index;
-  EXPECT_EQ(index.find(numbered(0)), uuid_index::none);
-  for (unsigned i = 0; i < count; ++i) EXPECT_TRUE(index.add(numbered(i), i));
-  for (unsigned i = 0; i < count; ++i) EXPECT_FALSE(index.add(numbered(i), i + 1));
-  for (unsigned i = 0; i < count; ++i) EXPECT_EQ(index.find(numbered(i)), i);
-  EXPECT_EQ(index.find(numbered(count)), uuid_index::none);
+  key_index index;
+  EXPECT_EQ(index.find(0U), key_index::none);
+  for (unsigned i = 0; i < count; ++i) EXPECT_TRUE(index.add(i, i));
+  for (unsigned i = 0; i < count; ++i) EXPECT_FALSE(index.add(i, i + 1));
+  for (unsigned i = 0; i < count; ++i) EXPECT_EQ(index.find(i), i);
+  EXPECT_EQ(index.find(count), key_index::none);
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-#include "common/uuid_index.h"
+#include "common/key_index.h"
 
 #include <unistd.h>
 
@@ -6,7 +6,7 @@
 
 namespace {
 
-// Drawn once for the process: whoever chooses the UUIDs of a table must not be able to choose their slots.
+// Drawn once for the process: whoever chooses the keys of a table must not be able to choose their slots.
 struct hash_key {
   std::uint64_t halves[2] = {0x9e3779b97f4a7c15, 0xc2b2ae3d27d4eb4f};
 
@@ -16,7 +16,7 @@ struct hash_key {
   }
 };
 
-std::uint64_t hash(const uuid &key) {
+std::uint64_t hash(const index_key &key) {
   static const hash_key secret;
   std::uint64_t halves[2];
   std::memcpy(halves, key.bytes, sizeof halves);
@@ -31,27 +31,27 @@ std::uint64_t hash(const uuid &key) {
 }  // namespace
 
 // Where the search for `key` begins. There are slots.
-std::size_t uuid_index::first_slot_of(const uuid &key) const {
+std::size_t key_index::first_slot_of(const index_key &key) const {
   return hash(key) & (slots_.size() - 1);
 }
 
-void uuid_index::prefetch(const uuid &key) const {
+void key_index::prefetch(const index_key &key) const {
   if (!slots_.empty()) __builtin_prefetch(&slots_[first_slot_of(key)]);
 }
 
 // The slot that holds `key`, or the free one where it belongs. There is a free one.
-std::size_t uuid_index::slot_of(const uuid &key) const {
+std::size_t key_index::slot_of(const index_key &key) const {
   const std::size_t mask = slots_.size() - 1;
   std::size_t at = first_slot_of(key);
   while (slots_[at].position != none && !(slots_[at].key == key)) at = (at + 1) & mask;
   return at;
 }
 
-std::uint32_t uuid_index::find(const uuid &key) const {
+std::uint32_t key_index::find(const index_key &key) const {
   return slots_.empty() ? none : slots_[slot_of(key)].position;
 }
 
-bool uuid_index::add(const uuid &key, std::uint32_t position) {
+bool key_index::add(const index_key &key, std::uint32_t position) {
   if (2 * used_ >= slots_.size()) grow();
   slot &place = slots_[slot_of(key)];
   if (place.position != none) return false;
@@ -60,7 +60,7 @@ bool uuid_index::add(const uuid &key, std::uint32_t position) {
   return true;
 }
 
-void uuid_index::grow() {
+void key_index::grow() {
   std::vector<slot> before(slots_.empty() ? 64 : 2 * slots_.size());
   std::swap(before, slots_);
   for (const slot &old : before) {
