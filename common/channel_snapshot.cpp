@@ -41,12 +41,13 @@ void channel_snapshot::append(const channel_ref &ref) {
 }
 
 const channel_ref *channel_snapshot_find(const channel_snapshot &snapshot, const uuid &channel) {
-  key_index &index = snapshot.by_channel_;
-  if (index.empty()) {
+  std::optional<key_index> &index = snapshot.by_channel_;
+  if (!index) {
+    index.emplace();
     for (std::uint32_t i = 0; i < snapshot.ref_count_; ++i) {
-      if (snapshot.refs_[i].entry) index.add(snapshot.refs_[i].channel().channel_uuid, i);
+      if (snapshot.refs_[i].entry) index->add(snapshot.refs_[i].channel().channel_uuid, i);
     }
   }
-  const std::uint32_t found = index.find(channel);
+  const std::uint32_t found = index->find(channel);
   return found == key_index::none ? nullptr : &snapshot.refs_[found];
 }

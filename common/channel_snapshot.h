@@ -6,12 +6,13 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 
 #include "common/channel.h"
 #include "common/kernel_table.h"
-#include "common/record_walk.h"
 #include "common/key_index.h"
+#include "common/record_walk.h"
 
 // Where the bytes of a channel lie in the table that holds them.
 struct channel_ref {
@@ -35,7 +36,8 @@ struct channel_ref {
 class channel_snapshot {
  public:
   std::uint32_t nexus_count() const { return nexus_count_; }
-  std::span<const channel_ref> refs() const { return {refs_.get(), ref_count_}; }
+  std::size_t ref_count() const { return ref_count_; }
+  std::span<const channel_ref> refs() const { return {refs_.get(), ref_count()}; }
   bool empty() const { return nexus_count_ == 0; }
 
  private:
@@ -50,7 +52,7 @@ class channel_snapshot {
   std::unique_ptr<channel_ref[], c_free> refs_;
   std::size_t ref_count_ = 0;
   std::size_t capacity_ = 0;
-  mutable key_index by_channel_;  // made when it is first asked
+  mutable std::optional<key_index> by_channel_;  // made when it is first asked
 };
 
 // Fills an empty snapshot from the kernel. Returns false, with the snapshot empty, when the table cannot be

@@ -31,8 +31,6 @@ class key_index {
  public:
   static constexpr std::uint32_t none = UINT32_MAX;
 
-  bool empty() const { return used_ == 0; }
-
   // The position added first for `key`, or none.
   std::uint32_t find(const index_key &key) const;
 
