@@ -11,9 +11,13 @@ extern "C" {
 //
 // Without a buffer (`old_value` null) stores in `*old_length` the number of bytes that the variable holds
 // now. With one, `*old_length` is its size on entry and the number of bytes delivered on success; nothing is
-// ever written past it. Each call is a snapshot of its own: the variable may grow, shrink or vanish in
-// between. Only where a variable of one byte is read several times in a row, and is a file that someone
-// replaces meanwhile, the old file may answer.
+// ever written past it. Without `old_length` nothing is stored; the result tells whether there is such a
+// variable.
+//
+// Each call is a snapshot of its own: the variable may grow, shrink or vanish in between. Only a buffer of one
+// byte, as for a switch, has another rule, so that a listing can ask at every row: where the call before
+// was the same read, this one looks no name up. It delivers what the variable holds now, but need not notice
+// that the variable has grown, vanished or been replaced by another of its name since.
 //
 // Returns 0, or -1 with the reason in errno:
 //   ENOENT   there is no such variable

@@ -59,8 +59,8 @@ int deliver(platform::kernel_file &file, void *value, std::size_t *length) {
   return 0;
 }
 
-// The switch that the last call read. A listing asks for it at every row, and opening a file takes eight
-// times as long as reading it. A call for anything else forgets it.
+// The switch that the last call read, which stays open: the header promises what follows from it. A listing
+// asks at every row, and opening a file takes eight times as long as reading it.
 struct {
   char path[256];
   std::optional<platform::kernel_file> file;
@@ -91,7 +91,7 @@ extern "C" int sysctlbyname(const char *name, void *old_value, std::size_t *old_
     errno = ENOENT;
     return -1;
   }
-  if (old_value && *old_length == 1) return deliver_switch(path, old_value, old_length);
+  if (old_value && old_length && *old_length == 1) return deliver_switch(path, old_value, old_length);
   last_switch.file.reset();
   platform::kernel_file file(path);
   if (!file.is_open()) return -1;
