@@ -2,6 +2,8 @@
 
 #include <unistd.h>
 
+#include <algorithm>
+#include <bit>
 #include <utility>
 
 namespace {
@@ -52,7 +54,7 @@ std::uint32_t key_index::find(const index_key &key) const {
 }
 
 bool key_index::add(const index_key &key, std::uint32_t position) {
-  if (2 * used_ >= slots_.size()) grow();
+  if (2 * used_ >= slots_.size()) reserve(used_ + 1);
   slot &place = slots_[slot_of(key)];
   if (place.position != none) return false;
   place = {key, position};
@@ -60,8 +62,10 @@ bool key_index::add(const index_key &key, std::uint32_t position) {
   return true;
 }
 
-void key_index::grow() {
-  std::vector<slot> before(slots_.empty() ? 64 : 2 * slots_.size());
+void key_index::reserve(std::size_t count) {
+  const std::size_t size = std::max<std::size_t>(64, std::bit_ceil(2 * count));
+  if (size <= slots_.size()) return;
+  std::vector<slot> before(size);
   std::swap(before, slots_);
   for (const slot &old : before) {
     if (old.position != none) slots_[slot_of(old.key)] = old;

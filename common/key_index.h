@@ -31,6 +31,9 @@ class key_index {
  public:
   static constexpr std::uint32_t none = UINT32_MAX;
 
+  // Makes room: no call of add() asks for memory until there are more than `count` keys.
+  void reserve(std::size_t count);
+
   // The position added first for `key`, or none.
   std::uint32_t find(const index_key &key) const;
 
@@ -48,7 +51,6 @@ class key_index {
 
   std::size_t first_slot_of(const index_key &key) const;
   std::size_t slot_of(const index_key &key) const;
-  void grow();
 
   std::vector<slot> slots_;  // a power of two of them, at most half in use
   std::size_t used_ = 0;

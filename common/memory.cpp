@@ -1,7 +1,5 @@
 #include "common/memory.h"
 
-#include <new>
-
 #include "common/output.h"
 
 namespace {
@@ -21,7 +19,11 @@ void *xmalloc(std::size_t size) {
 
 void *xrealloc(void *block, std::size_t size) {
   void *resized = std::realloc(block, size ? size : 1);
-  if (resized) return resized;
+  if (!resized) end_without_growth();
+  return resized;
+}
+
+void end_without_growth() {
   say_last_words<"realloc failed">();
   std::exit(exit_status::out_of_memory);
 }

@@ -5,6 +5,7 @@
 #include "common/channel.h"
 #include "common/flow.h"
 #include "common/invariant.h"
+#include "common/memory.h"
 #include "common/output.h"
 #include "common/provider.h"
 
@@ -112,6 +113,7 @@ int object_tree::scrape_flows() {
   if (const int error = flows_.fetch(flow_node)) return error;
   require(flows_.size() % sizeof(tv_stats_flow) == 0,
           {"scrape_flows", "common/mib", 223, "(length % sizeof (*sf)) == 0"});
+  const new_failure attaching(end_without_growth);
   flow_keys_ = find_channels();
   sort_keys(flow_keys_);
   for (std::uint32_t i = 0; i < flow_keys_.size(); ++i) {

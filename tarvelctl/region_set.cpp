@@ -4,6 +4,17 @@
 
 #include "common/output.h"
 
+namespace {
+
+std::size_t expanding_to;  // the capacity that there may be no memory for
+
+[[noreturn]] void end_without_room() {
+  complain<"Error expanding tv_region_set-> capacity %d\n">(static_cast<int>(expanding_to));
+  std::exit(exit_status::out_of_memory);
+}
+
+}  // namespace
+
 void region_set::add(const tv_stats_region &region) {
   if (by_uuid_.find(region.region_uuid) != key_index::none) return;
   if (count_ == capacity_) grow();
@@ -14,12 +25,11 @@ void region_set::add(const tv_stats_region &region) {
 
 void region_set::grow() {
   constexpr std::size_t first_capacity = 1024;
-  capacity_ = capacity_ ? 2 * capacity_ : first_capacity;
+  capacity_ = expanding_to = capacity_ ? 2 * capacity_ : first_capacity;
   void *const grown = std::realloc(items_.get(), capacity_ * sizeof(item));
-  if (!grown) {
-    complain<"Error expanding tv_region_set-> capacity %d\n">(static_cast<int>(capacity_));
-    std::exit(exit_status::out_of_memory);
-  }
+  if (!grown) end_without_room();
   static_cast<void>(items_.release());
   items_.reset(static_cast<item *>(grown));
+  const new_failure expanding(end_without_room);
+  by_uuid_.reserve(capacity_);
 }

@@ -8,8 +8,8 @@
 #include <span>
 
 #include "common/arena.h"
-#include "common/memory.h"
 #include "common/key_index.h"
+#include "common/memory.h"
 
 // Regions by UUID, with type and memory as they were when each was first seen. It only grows.
 class region_set {

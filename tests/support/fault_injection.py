@@ -62,12 +62,13 @@ def brief(run, other):
 
 
 def sample(cases, size, randomness):
-    """So many cases, as many of one kind as of any other: what goes wrong at which turn does not tell kinds apart."""
+    """So many cases, as many of one kind as of any other: what goes wrong at which turn does not tell kinds apart,
+    but the text that a judge carries does."""
     known = collections.Counter()
 
     def rank(case):
-        line, faults, _, options = case
-        kind = line, str(options), *((letter, count, value) for letter, _, count, value in faults)
+        line, faults, judge, options = case
+        kind = line, str(options), judge.__doc__, *((letter, count, value) for letter, _, count, value in faults)
         known[kind] += 1
         return known[kind]
     return sorted(randomness.sample(cases, len(cases)), key=rank)[:size]
