@@ -24,6 +24,7 @@ constexpr port_plan plans[] = {
     {1, unlimited, {network_daemon, machine_daemon}}, {1, 2, {network_daemon, packet_monitor}},
     {1, 1, {tunnel_daemon, tunnel_daemon}},           {0, 0, {0, 0}},
 };
+static_assert(std::size(plans) == nexus_kinds);
 
 std::uint32_t most_channels(const nexus &owner) {
   // Someone looks at every third interface.

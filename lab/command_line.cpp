@@ -38,21 +38,40 @@ struct command {
   const char *synopsis;
   const char *purpose;
   int (*handler)(const options &);
-  bool needs_directory;
-  bool makes_world;  // takes sizes and a seed
-  bool moves_world;  // takes an interval
-  bool runs_command;
-  bool captures;  // takes the times of moments and a wish to redact
+  bool needs_directory = false;
+  bool makes_world = false;  // takes sizes and a seed
+  bool moves_world = false;  // takes an interval
+  bool runs_command = false;
+  bool captures = false;  // takes the times of moments and a wish to redact
 };
 
 constexpr command commands[] = {
-    {"generate", "DIR [sizes] [--seed N]", "make one snapshot", generate, true, true, false, false, false},
-    {"simulate", "DIR [sizes] [--seed N] [--interval MS]", "make one and keep it moving until interrupted",
-     simulate, true, true, true, false, false},
-    {"run", "[DIR | [sizes] [--seed N] [--interval MS]] -- COMMAND...",
-     "run COMMAND on DIR, or on a simulation of its own", run, false, true, true, true, false},
-    {"capture", "DIR [--every SECONDS --count N] [--redact]",
-     "save the tables of the kernel in sight, once or N times", capture, true, false, false, false, true},
+    {.name = "generate",
+     .synopsis = "DIR [sizes] [--seed N]",
+     .purpose = "make one snapshot",
+     .handler = generate,
+     .needs_directory = true,
+     .makes_world = true},
+    {.name = "simulate",
+     .synopsis = "DIR [sizes] [--seed N] [--interval MS]",
+     .purpose = "make one and keep it moving until interrupted",
+     .handler = simulate,
+     .needs_directory = true,
+     .makes_world = true,
+     .moves_world = true},
+    {.name = "run",
+     .synopsis = "[DIR | [sizes] [--seed N] [--interval MS]] -- COMMAND...",
+     .purpose = "run COMMAND on DIR, or on a simulation of its own",
+     .handler = run,
+     .makes_world = true,
+     .moves_world = true,
+     .runs_command = true},
+    {.name = "capture",
+     .synopsis = "DIR [--every SECONDS --count N] [--redact]",
+     .purpose = "save the tables of the kernel in sight, once or N times",
+     .handler = capture,
+     .needs_directory = true,
+     .captures = true},
 };
 
 int usage() {

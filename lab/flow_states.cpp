@@ -1,6 +1,7 @@
 #include "lab/flow_states.h"
 
 #include <algorithm>
+#include <iterator>
 
 #include "lab/world_parts.h"
 
@@ -24,6 +25,7 @@ constexpr tcp_behaviour tcp_behaviours[] = {
     {tcp::close_wait, false, true, 1500, tcp::time_wait, tcp::time_wait, 0},       // fin_wait_2
     {tcp::closed, false, false, 8000, tcp::gone, tcp::gone, 0},                    // time_wait
 };
+static_assert(std::size(tcp_behaviours) == tcp::gone);
 
 }  // namespace
 

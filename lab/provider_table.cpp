@@ -1,6 +1,7 @@
 // kern.tarvel.nexus_provider_list
 
 #include <algorithm>
+#include <iterator>
 #include <string>
 
 #include "common/provider.h"
@@ -29,6 +30,7 @@ constexpr provider_shape shapes[] = {
     {nexus_type::kernel_pipe, 0, 0, 256, 512, 512, 2},
     {nexus_type::user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
 };
+static_assert(std::size(shapes) == nexus_kinds);
 
 nexus_provider_parameters parameters_of(const world &state, const provider &source) {
   const provider_shape &shape = shapes[static_cast<int>(source.kind)];

@@ -28,7 +28,8 @@ void pass_interface(world &state, nexus &place, const two_way<traffic> &moved) {
 }
 
 // The rates of what has no flows: `busy` packets each second at most, the same each time it is asked.
-two_way<traffic> background(world &state, const uuid &id, std::uint32_t busy, std::uint32_t milliseconds) {
+two_way<traffic> background_traffic(world &state, const uuid &id, std::uint32_t busy,
+                                    std::uint32_t milliseconds) {
   const std::uint32_t out = 2 + id.bytes[0] * busy / 256;
   const std::uint32_t in = 2 + id.bytes[1] * busy / 256;
   return {some(state.random, out, 180U + id.bytes[2] * 3U, milliseconds),
@@ -40,7 +41,7 @@ void move_background(world &state, std::uint32_t milliseconds) {
     const bool has_interface = place.kind <= nexus_kind::bridge;
     if (has_interface) {
       // The host's own traffic: all of it passes the host port of a switch.
-      const two_way<traffic> moved = background(state, place.id, 300, milliseconds);
+      const two_way<traffic> moved = background_traffic(state, place.id, 300, milliseconds);
       pass_interface(state, place, moved);
       if (place.kind == nexus_kind::multistack && place.channel_count > 2) {
         channel &host = state.channels[place.first_channel + 2];
@@ -51,7 +52,7 @@ void move_background(world &state, std::uint32_t milliseconds) {
     if (place.kind == nexus_kind::multistack) continue;
     for (std::uint32_t i = 0; i < place.channel_count; ++i) {
       channel &port = state.channels[place.first_channel + i];
-      const two_way<traffic> moved = background(state, port.id, 120, milliseconds);
+      const two_way<traffic> moved = background_traffic(state, port.id, 120, milliseconds);
       port.moved.out.add(moved.out);
       port.moved.in.add(moved.in);
     }

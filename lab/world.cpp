@@ -1,6 +1,7 @@
 #include "lab/world.h"
 
 #include <algorithm>
+#include <iterator>
 
 #include "lab/programs.h"
 #include "lab/world_parts.h"
@@ -48,7 +49,7 @@ void deal_instances(std::vector<provider> &providers, std::uint32_t count) {
 }
 
 void register_providers(world &state) {
-  std::uint32_t of_kind[6] = {};
+  std::uint32_t of_kind[nexus_kinds] = {};
   for (std::uint32_t i = 0; i < state.size.providers; ++i) {
     const nexus_kind kind = pattern[i % std::size(pattern)].kind;
     state.providers.push_back({state.random.identity(), kind, of_kind[static_cast<int>(kind)]++, 0, 0});
@@ -113,6 +114,7 @@ world make_world(const sizes &size, std::uint64_t seed) {
 std::string registered_name(nexus_kind kind, std::uint32_t ordinal) {
   static constexpr const char *names[] = {"multistack",     "net-if", "bridge",
                                           "content-filter", "tunnel", "scratch"};
+  static_assert(std::size(names) == nexus_kinds);
   const std::string interface = interface_name(kind, ordinal);
   std::string name = std::string("com.example.").append(names[static_cast<int>(kind)]).append(1, '.');
   return name.append(interface.empty() ? std::to_string(ordinal) : interface);

@@ -4,6 +4,7 @@
 #ifndef TARVELCTL_LAB_WORLD_H
 #define TARVELCTL_LAB_WORLD_H
 
+#include <cstddef>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -41,6 +42,9 @@ struct process {
 };
 
 enum class nexus_kind : std::uint8_t { multistack, net_if, bridge, user_pipe, kernel_pipe, scratch_pipe };
+
+// How many rows a table by kind has.
+inline constexpr std::size_t nexus_kinds = static_cast<std::size_t>(nexus_kind::scratch_pipe) + 1;
 
 struct provider {
   uuid id;
