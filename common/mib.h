@@ -12,9 +12,9 @@
 
 #include "common/flow.h"
 #include "common/kernel_table.h"
+#include "common/key_index.h"
 #include "common/record_walk.h"
 #include "common/sort_key.h"
-#include "common/key_index.h"
 
 // What an object is, and what the payload of its node is.
 enum class object_type : std::uint32_t {
@@ -130,9 +130,9 @@ class object_tree {
   kernel_table providers_, channels_, flows_;
   std::vector<entry> nodes_;
   std::vector<sort_key> flow_keys_;  // what hangs in the tree: positions in flows_, by node
-  key_index by_uuid_;               // the node that came first with a UUID
+  key_index by_uuid_;                // the node that came first with a UUID
   std::vector<rival_set> rivals_;    // all nodes with one UUID, where there are several
-  key_index by_port_;               // channels, by the number of their parent and their port
+  key_index by_port_;                // channels, by the number of their parent and their port
 };
 
 #endif

@@ -16,9 +16,11 @@ std::size_t expanding_to;  // the capacity that there may be no memory for
 }  // namespace
 
 void region_set::add(const tv_stats_region &region) {
-  if (by_uuid_.find(region.region_uuid) != key_index::none) return;
-  if (count_ == capacity_) grow();
-  by_uuid_.add(region.region_uuid, static_cast<std::uint32_t>(count_));
+  if (count_ == capacity_) {
+    if (by_uuid_.find(region.region_uuid) != key_index::none) return;
+    grow();
+  }
+  if (!by_uuid_.add(region.region_uuid, static_cast<std::uint32_t>(count_))) return;
   items_[count_++] = {region.region_uuid, static_cast<std::uint32_t>(region.type), region.mem_total,
                       region.mem_wired};
 }
