@@ -11,6 +11,9 @@
 
 inline constexpr char arena_node[] = "kern.tarvel.stats.arena";
 
+// How many types of regions there are: 0 to SREG_MAX - 1.
+inline constexpr std::size_t SREG_MAX = 12;
+
 // A region slot of an arena. A region may belong to several arenas; its UUID tells.
 struct tv_stats_region {
   text_field<64> name;

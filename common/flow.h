@@ -68,7 +68,7 @@ static_assert(offsetof(tv_stats_flow, sf_adv_idx) == 144);
 static_assert(offsetof(tv_stats_flow, sf_lstats) == 152);
 static_assert(offsetof(tv_stats_flow, sf_rstats) == 216);
 
-// The advisories of a flow switch. `sfa_entries_count` entries follow, then the next record.
+// The advisories of a flow switch. Its entries, `sfa_entries`, follow, then the next record.
 struct tv_stats_flow_adv {
   static constexpr std::uint32_t max_entries = 512;
 
@@ -77,7 +77,7 @@ struct tv_stats_flow_adv {
   std::int32_t sfa_pid;
   std::uint32_t sfa_entries_count;
 
-  // Bytes of the entries behind the header.
+  // Bytes of `sfa_entries` behind the header.
   std::uint64_t trailing_size() const;
 };
 

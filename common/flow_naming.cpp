@@ -45,15 +45,18 @@ char *flags_text::append_to(char *to) const {
   return to;
 }
 
-char *flow_flags_text::append_to(char *to) const {
+format::name_text flow_flags_text(std::uint32_t flags) {
   static constexpr flag_letter letters[] = {
       {1U << 4, 't'},  {1U << 5, 'c'},  {1U << 6, 'l'},  {1U << 8, 'q'},  {1U << 9, 'b'},
       {1U << 12, 'w'}, {1U << 13, 'e'}, {1U << 24, 'a'}, {1U << 25, 'n'}, {1U << 26, 'd'},
       {1U << 27, 'o'}, {1U << 30, 'x'}, {1U << 31, 'r'},
   };
-  to = flags_text{flags, letters}.append_to(to);
-  *to++ = ' ';
-  return to;
+  static_assert(std::size(letters) < sizeof format::name_text::chars);
+  format::name_text text;
+  char *end = flags_text{flags, letters}.append_to(text.chars);
+  *end++ = ' ';
+  text.end_at(end);
+  return text;
 }
 
 format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6]) {

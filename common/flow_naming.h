@@ -34,12 +34,7 @@ struct flags_text {
 };
 
 // The thirteen letters of a flow's flags and a blank.
-struct flow_flags_text {
-  std::uint32_t flags;
-
-  static constexpr std::size_t text_size = 14;
-  char *append_to(char *to) const;
-};
+format::name_text flow_flags_text(std::uint32_t flags);
 
 // Six bytes as "02:00:5e:10:00:01".
 format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6]);

@@ -17,13 +17,19 @@ struct channel_position {
   const std::byte *at;
 };
 
-// Ascending by port. Ports are compared by their 32-bit difference, so that they run in a circle: where they
-// all lie within one half of it, the first is the one behind the gap. Channels of one port keep the table's
-// order.
+// How the channels of a nexus are ordered: by the difference of their ports in 32 bits, below 0 where `a`
+// comes first.
+std::int32_t compare_channel_port(const channel_position &a, const channel_position &b) {
+  return static_cast<std::int32_t>(a.port - b.port);
+}
+
+// Such a comparison runs in a circle, in which each port comes before the half that follows it, and so cannot
+// sort by itself. Where all ports lie within one half of the circle, the first is the one behind the gap that
+// their numbers show. Channels of one port keep the table's order.
 void sort_by_port(std::vector<channel_position> &channels) {
   const auto by_port = [](const channel_position &a, const channel_position &b) { return a.port < b.port; };
   const auto gap = [](const channel_position &a, const channel_position &b) {
-    return b.port - a.port > 0x80000000;
+    return compare_channel_port(a, b) > 0;
   };
   std::stable_sort(channels.begin(), channels.end(), by_port);
   const auto before_gap = std::adjacent_find(channels.begin(), channels.end(), gap);

@@ -3,6 +3,7 @@
 #include <arpa/inet.h>
 
 #include <algorithm>
+#include <cstddef>
 #include <cstring>
 #include <iterator>
 
@@ -63,12 +64,9 @@ void print_endpoints(const tv_stats_flow &flow, const indent_text &indent, Addre
   print<"%s\"remote_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_remote.port)));
 }
 
-void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
+void print_flow_payload(const tv_stats_flow &flow, const indent_text &indent) {
   const tv_flow_endpoint_stats &in = flow.sf_rstats;
   const tv_flow_endpoint_stats &out = flow.sf_lstats;
-  print<"%s{\n">(indent);
-  print<"%s\"uuid\":\"00000000-0000-0000-0000-000000000000\",\n">(indent);
-  print<"%s\"type\":\"flow\",\n">(indent);
   if (flow.sf_local.family == address_family::ipv6) {
     print_endpoints(flow, indent, &socket_address::ipv6);
   } else if (flow.sf_local.family == address_family::ipv4) {
@@ -80,31 +78,48 @@ void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
   print<"%s\"in_packets\":%llu,\n">(indent, in.packets);
   print<"%s\"out_packets\":%llu,\n">(indent, out.packets);
   print<"%s\"interface\":\"%s\",\n">(indent, flow.sf_if_name);
-  print<"%s\"flags\":\"%s\",\n">(indent, flow_flags_text{flow.sf_flags});
+  print<"%s\"flags\":\"%s\",\n">(indent, flow_flags_text(flow.sf_flags));
   print<"%s\"local_state\":\"%s\",\n">(indent, flow_state_name(out.state));
   print<"%s\"remote_state\":\"%s\",\n">(indent, flow_state_name(in.state));
   print<"%s\"process\":\"%s\",\n">(indent, flow.sf_proc_name);
   print<"%s\"pid\":%d,\n">(indent, flow.sf_pid);
+}
+
+void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
+  print<"%s{\n">(indent);
+  print<"%s\"uuid\":\"00000000-0000-0000-0000-000000000000\",\n">(indent);
+  print<"%s\"type\":\"flow\",\n">(indent);
+  print_flow_payload(flow, indent);
   print<"%s\"children\": []\n">(indent);
   print<"%s}">(indent);
 }
 
-// What the types differ in, by object_type.
-constexpr struct {
+// What the nodes of a type differ in.
+struct node_ops {
+  object_type type;
   format::name_text name;
   void (*print_payload)(const object_node &node, const indent_text &indent, process_names &owners);
-} node_ops[] = {
-    {"root", nullptr},  {"nexus_provider", print_provider_payload},
-    {"nexus", nullptr}, {"channel", print_channel_payload},
-    {"flow", nullptr},
 };
+
+// By type. Flows, which are no nodes, are printed by print_flow.
+constexpr node_ops types[] = {
+    {object_type::root, "root", nullptr},
+    {object_type::nexus_provider, "nexus_provider", print_provider_payload},
+    {object_type::nexus, "nexus", nullptr},
+    {object_type::channel, "channel", print_channel_payload},
+    {object_type::flow, "flow", nullptr},
+};
+
+static_assert(std::ranges::all_of(types, [](const node_ops &row) {
+  return static_cast<std::ptrdiff_t>(row.type) == &row - types;
+}));
 
 // Everything of a node before its children.
 void open_node(const object_node &node, const indent_text &indent, process_names &owners) {
   print<"%s{\n">(indent);
   print<"%s\"uuid\":\"%s\",\n">(indent, node.uuid);
   print<"%s\"type\":\"%s\",\n">(indent, object_type_name(node.type));
-  const auto &ops = node_ops[static_cast<std::size_t>(node.type)];
+  const node_ops &ops = types[static_cast<std::size_t>(node.type)];
   if (ops.print_payload) ops.print_payload(node, indent, owners);
   if (node.has_children()) {
     print<"%s\"children\": [\n">(indent);
@@ -118,7 +133,7 @@ void open_node(const object_node &node, const indent_text &indent, process_names
 const format::name_text &object_type_name(object_type type) {
   static constexpr format::name_text unknown = "???";
   const auto index = static_cast<std::size_t>(type);
-  return index < std::size(node_ops) ? node_ops[index].name : unknown;
+  return index < std::size(types) ? types[index].name : unknown;
 }
 
 // Everything of a node behind the children that are nodes: its flows, and what closes it.

@@ -59,7 +59,7 @@ void print_flow(const tv_stats_flow &flow) {
   const tv_flow_endpoint_stats &remote = flow.sf_rstats;
   print<" %-12llu %-12llu %-10llu %-10llu %-3s %-8s %-4s %-3s %s %-12s %-12s%s  %s %-3s %s.%d\n">(
       remote.bytes, local.bytes, remote.packets, local.packets, svc_class_name(flow.sf_svc), flow.sf_if_name,
-      index_text(flow.sf_nx_port), index_text(flow.sf_adv_idx), flow_flags_text{flow.sf_flags},
+      index_text(flow.sf_nx_port), index_text(flow.sf_adv_idx), flow_flags_text(flow.sf_flags),
       flow_state_name(local.state), flow_state_name(remote.state), rtt_text(local.rtt), rtt_text(remote.rtt),
       index_text(flow.sf_bucket), flow.sf_proc_name, flow.sf_pid);
 }

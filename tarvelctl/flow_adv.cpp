@@ -18,7 +18,7 @@ constexpr bit_names advisory_flag_names =
     "\1VALID"
     "\2CONTROLLED";
 
-void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk entries,
+void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk sfa_entries,
                                process_names &processes) {
   print<" - %s\n">(processes.of(advisories.sfa_pid));
   print<"\tNexus UUID: %s\n">(advisories.sfa_nx_uuid);
@@ -27,7 +27,7 @@ void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk 
   require(advisories.sfa_entries_count <= tv_stats_flow_adv::max_entries,
           {"__tv_stats_flow_adv_print", "tarvelctl/tarvelctl", 729, "sfa->sfa_entries_count <= 512"});
   tv_stats_flow_adv_entry entry;
-  for (int i = 0; entries.take(entry); ++i) {
+  for (int i = 0; sfa_entries.take(entry); ++i) {
     print<"\t    [%3d] : %s ">(i, entry.sfae_flow_uuid);
     print_flags("flags", entry.sfae_flags, advisory_flag_names);
     print<"\n">();
@@ -42,10 +42,10 @@ int list_flow_advisories() {
   process_names processes(true);
   record_walk walk(table.bytes());
   tv_stats_flow_adv advisories;
-  std::span<const std::byte> entries;
-  while (walk.take(advisories, entries)) {
+  std::span<const std::byte> sfa_entries;
+  while (walk.take(advisories, sfa_entries)) {
     if (!netstat_options.selects(advisories.sfa_nx_uuid, advisories.sfa_pid)) continue;
-    __tv_stats_flow_adv_print(advisories, record_walk(entries), processes);
+    __tv_stats_flow_adv_print(advisories, record_walk(sfa_entries), processes);
   }
   require(walk.at_end(), {"cmd_flow_adv", "tarvelctl/tarvelctl", 766, "scan == (buffer + length)"});
   return 0;

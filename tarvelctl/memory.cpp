@@ -19,6 +19,7 @@ constexpr format::name_text arena_types[] = {"NEXUS", "PLCY", "SYSTEM"};
 
 constexpr format::name_text region_types[] = {"SCHEMA",  "RING",     "BUF",     "MDU", "USD", "USTATS",
                                               "FLOWADV", "NEXUSADV", "SYSCTLS", "MDK", "KSD", "KSTATS"};
+static_assert(std::size(region_types) == SREG_MAX);
 
 constexpr bit_names region_mode_names =
     "\20"
@@ -32,6 +33,10 @@ constexpr bit_names region_mode_names =
 
 // Outlives a run of the watch loop: a region counts with what it had when it was first seen.
 region_set tv_region_set;
+
+void tv_region_set_add(const tv_stats_region &region) {
+  tv_region_set.add(region);
+}
 
 const format::name_text &type_name(std::span<const format::name_text> names, std::int32_t type) {
   static constexpr format::name_text unknown = "UNKNOWN";
@@ -129,7 +134,7 @@ void print_arena(const tv_stats_arena &arena, process_names &processes) {
   memory_size memory;
   bool is_first = true;
   for (const tv_stats_region &region : arena.regions) {
-    tv_region_set.add(region);
+    tv_region_set_add(region);
     if (region.seg_count == 0) continue;
     if (!is_first) print<"              |\n">();
     is_first = false;
@@ -141,16 +146,16 @@ void print_arena(const tv_stats_arena &arena, process_names &processes) {
 
 // Regions of a type without a name are left out.
 void __tv_region_set_print_summary() {
-  memory_size by_type[std::size(region_types)];
+  memory_size by_type[SREG_MAX];
   for (const region_set::item &item : tv_region_set.items()) {
-    if (item.id < std::size(by_type)) by_type[item.id].add({item.mem_total, item.mem_wired});
+    if (item.id < SREG_MAX) by_type[item.id].add({item.mem_total, item.mem_wired});
   }
   print_separator('+');
   print<" Tarvel Region Memory Usage Summary (deduplicated)\n">();
   print_separator('+');
   print<"                         Total         Wired\n">();
   memory_size all;
-  for (std::size_t type = 0; type < std::size(by_type); ++type) {
+  for (std::size_t type = 0; type < SREG_MAX; ++type) {
     const memory_size &memory = by_type[type];
     print<"%14s:   %9llu KB  %9llu KB\n">(region_types[type], kilobytes(memory.total),
                                           kilobytes(memory.wired));

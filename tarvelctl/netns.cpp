@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <string_view>
 
 #include "common/kernel_table.h"
@@ -23,6 +24,7 @@ const option netns_options[] = {
     {},
 };
 const std::uint32_t netns_option_flags[] = {option_is_optional, option_is_optional, option_is_optional};
+static_assert(std::size(netns_option_flags) == std::size(netns_options) - 1);
 
 namespace {
 
@@ -34,12 +36,6 @@ struct netns_request {
   std::uint8_t ipv4[4] = {};
   std::uint8_t ipv6[16] = {};
   std::uint8_t protocol = 0;  // tcp, udp or 0 for none
-
-  // The address bytes that a record must have; none for the global namespace.
-  std::span<const std::uint8_t> key() const {
-    if (global) return {};
-    return family == 6 ? std::span<const std::uint8_t>(ipv6) : std::span<const std::uint8_t>(ipv4);
-  }
 };
 
 // Which family an address text looks like: 4, 6 or 0. The first six characters tell.
@@ -105,10 +101,51 @@ void __tv_stats_netns_print(const tv_stats_netns &netns, record_walk ranges) {
   print<"--------------------------------------------\n">();
 }
 
-// Fetches the table. Running out of memory counts as an empty table.
-int fetch(kernel_table &table) {
-  const int error = table.fetch(netns_node);
-  return error == ENOMEM ? 0 : error;
+// The whole table. Its readers take ENOMEM for an empty one.
+int netns_fetch_all(kernel_table &table) {
+  return table.fetch(netns_node);
+}
+
+// Where a namespace lies, or, where `error` is not 0, why there is none.
+struct netns_record {
+  int error = 0;
+  kernel_table table{};
+  tv_stats_netns netns{};
+  std::span<const std::byte> ranges{};
+};
+
+// The first namespace of the protocol with these address bytes; the global one has none.
+netns_record netns_lookup(std::span<const std::uint8_t> key, std::uint8_t protocol) {
+  netns_record found;
+  found.error = netns_fetch_all(found.table);
+  if (found.error && found.error != ENOMEM) return found;
+  found.error = 0;
+  record_walk walk(found.table.bytes());
+  while (walk.take(found.netns, found.ranges)) {
+    if (found.netns.protocol != protocol || found.netns.address_length != key.size()) continue;
+    if (std::equal(key.begin(), key.end(), found.netns.address)) return found;
+  }
+  if (!walk.at_end()) complain<"Buffer too short\n">();
+  found.error = ENOENT;
+  return found;
+}
+
+netns_record netns_lookup_global(std::uint8_t protocol) {
+  return netns_lookup({}, protocol);
+}
+
+netns_record netns_lookup_ipv4(const std::uint8_t (&address)[4], std::uint8_t protocol) {
+  return netns_lookup(address, protocol);
+}
+
+netns_record netns_lookup_ipv6(const std::uint8_t (&address)[16], std::uint8_t protocol) {
+  return netns_lookup(address, protocol);
+}
+
+netns_record lookup(const netns_request &request) {
+  if (request.global) return netns_lookup_global(request.protocol);
+  if (request.family == 6) return netns_lookup_ipv6(request.ipv6, request.protocol);
+  return netns_lookup_ipv4(request.ipv4, request.protocol);
 }
 
 int print_all(const netns_request &request) {
@@ -116,7 +153,8 @@ int print_all(const netns_request &request) {
     print<"WARNING: With -a, any further namespace specifiers are ignored\n">();
   }
   kernel_table table;
-  if (const int error = fetch(table)) return error;
+  const int error = netns_fetch_all(table);
+  if (error && error != ENOMEM) return error;
   record_walk walk(table.bytes());
   tv_stats_netns netns;
   std::span<const std::byte> ranges;
@@ -134,20 +172,9 @@ int print_one(const netns_request &request) {
     print<"Specify -a or a valid L4 protocol name\n">();
     return EINVAL;
   }
-  kernel_table table;
-  if (const int error = fetch(table)) return error;
-  const std::span<const std::uint8_t> key = request.key();
-  record_walk walk(table.bytes());
-  tv_stats_netns netns;
-  std::span<const std::byte> ranges;
-  while (walk.take(netns, ranges)) {
-    if (netns.protocol != request.protocol || netns.address_length != key.size()) continue;
-    if (!std::equal(key.begin(), key.end(), netns.address)) continue;
-    __tv_stats_netns_print(netns, record_walk(ranges));
-    return 0;
-  }
-  if (!walk.at_end()) complain<"Buffer too short\n">();
-  return ENOENT;
+  const netns_record found = lookup(request);
+  if (found.error == 0) __tv_stats_netns_print(found.netns, record_walk(found.ranges));
+  return found.error;
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <iterator>
 #include <string_view>
 
 #include "common/output.h"
@@ -22,7 +23,7 @@ const option netstat_long_options[] = {
     {"wait", required_argument, nullptr, 'w'}, {},
 };
 
-const std::uint32_t netstat_option_flags[13] = {};
+const std::uint32_t netstat_option_flags[std::size(netstat_long_options) - 1] = {};
 
 namespace {
 

@@ -15,12 +15,20 @@
 
 namespace {
 
+void __tv_stats_net_if_print(std::span<const std::uint64_t> counters) {
+  print_counters(net_if_counter_names, counters);
+}
+
+void __tv_stats_flow_switch_print(std::span<const std::uint64_t> counters) {
+  print_counters(flow_switch_counter_names, counters);
+}
+
 // One of the twin reports. Record has a head and counters.
 template <class Record>
 struct counter_report {
   const char *node;
   const char *title;
-  const counter_name *counter_names;
+  void (*print_block)(std::span<const std::uint64_t> counters);
   invariant whole_records;
 
   int run() const;
@@ -33,14 +41,14 @@ struct counter_report {
 constexpr counter_report<tv_stats_net_if> interface_report = {
     net_if_node,
     "netif:",
-    net_if_counter_names,
+    __tv_stats_net_if_print,
     {"cmd_interface", "tarvelctl/tarvelctl", 1073, "(length % width) == 0"},
 };
 
 constexpr counter_report<tv_stats_flow_switch> flow_switch_report = {
     flow_switch_node,
     "flowswitch:",
-    flow_switch_counter_names,
+    __tv_stats_flow_switch_print,
     {"cmd_flow_switch", "tarvelctl/tarvelctl", 1138, "(length % width) == 0"},
 };
 
@@ -65,20 +73,22 @@ struct name_key {
   std::uint32_t position;
 };
 
-bool tv_stats_name_compare(const name_key &a, const name_key &b) {
-  return a.name.view() < b.name.view();
+// Below 0 where `a` comes first, above where `b` does, else 0.
+int tv_stats_name_compare(const name_key &a, const name_key &b) {
+  return a.name.view().compare(b.name.view());
 }
 
 template <class Record>
 void counter_report<Record>::print_each(std::span<const std::byte> records) const {
   std::vector<name_key> keys(records.size() / sizeof(Record));
   for (std::uint32_t i = 0; i < keys.size(); ++i) keys[i] = {record_at<Record>(records, i).head.name, i};
-  std::stable_sort(keys.begin(), keys.end(), tv_stats_name_compare);
+  std::stable_sort(keys.begin(), keys.end(),
+                   [](const name_key &a, const name_key &b) { return tv_stats_name_compare(a, b) < 0; });
   for (const name_key &key : keys) {
     const auto record = record_at<Record>(records, key.position);
     if (!netstat_options.selects(record.head.nx_uuid)) continue;
     print<" - %-8s %s\n">(record.head.name, record.head.nx_uuid);
-    print_counters(counter_names, record.counters);
+    print_block(std::span(record.counters));
   }
 }
 
@@ -87,7 +97,7 @@ void counter_report<Record>::print_total(std::span<const std::byte> records) con
   Record total{};
   record_walk walk(records);
   for (Record record; walk.take(record);) add_counters(total.counters, record.counters);
-  print_counters(counter_names, total.counters);
+  print_block(std::span(total.counters));
 }
 
 }  // namespace

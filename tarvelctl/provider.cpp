@@ -3,6 +3,7 @@
 #include "common/provider.h"
 
 #include <cstring>
+#include <iterator>
 
 #include "common/kernel_table.h"
 #include "common/output.h"
@@ -12,6 +13,7 @@
 
 const option provider_options[] = {{"details", no_argument, nullptr, 'D'}, {}};
 const std::uint32_t provider_option_flags[] = {option_is_optional};
+static_assert(std::size(provider_option_flags) == std::size(provider_options) - 1);
 
 namespace {
 

@@ -1,9 +1,8 @@
 #include "tarvelctl/ring_stats.h"
 
-#include <algorithm>
-#include <utility>
-#include <vector>
+#include <optional>
 
+#include "common/key_index.h"
 #include "common/output.h"
 #include "common/record_walk.h"
 
@@ -35,48 +34,50 @@ std::size_t ring_count(ring_blocks rings) {
   return rings.size() / sizeof(ring_stats);
 }
 
-// The previous states of a channel's rings, by ring id. Where several have the same id the first one counts.
+std::uint32_t ring_id_at(ring_blocks rings, std::size_t index) {
+  return member_at<ring_stats, std::uint32_t>(rings, index, offsetof(ring_stats, ring_id));
+}
+
+// The position of the first ring with this id, or key_index::none.
+std::uint32_t ring_stats_find(ring_blocks rings, std::uint32_t ring_id) {
+  for (std::uint32_t i = 0; i < ring_count(rings); ++i) {
+    if (ring_id_at(rings, i) == ring_id) return i;
+  }
+  return key_index::none;
+}
+
+// The previous states of a channel's rings. Where there are many they are indexed; a channel of today has
+// few, and a search costs less.
 class previous_rings {
  public:
   explicit previous_rings(ring_blocks rings) : rings_(rings) {
-    const std::size_t count = ring_count(rings);
-    if (count <= few) return;
-    for (std::size_t i = 0; i < count; ++i) sorted_.emplace_back(record_at<ring_stats>(rings, i).ring_id, i);
-    std::sort(sorted_.begin(), sorted_.end());
+    if (!are_many()) return;
+    for (std::uint32_t i = 0; i < ring_count(rings); ++i) by_id_.add(ring_id_at(rings, i), i);
   }
 
-  // Copies the previous state of a ring. False where there is none.
-  bool find(std::uint32_t ring_id, ring_stats &found) const {
-    if (!sorted_.empty()) {
-      const auto at = std::lower_bound(sorted_.begin(), sorted_.end(), std::pair{ring_id, std::size_t{0}});
-      if (at == sorted_.end() || at->first != ring_id) return false;
-      found = record_at<ring_stats>(rings_, at->second);
-      return true;
-    }
-    for (std::size_t i = 0; i < ring_count(rings_); ++i) {
-      found = record_at<ring_stats>(rings_, i);
-      if (found.ring_id == ring_id) return true;
-    }
-    return false;
+  // The first one with this id.
+  std::optional<ring_stats> find(std::uint32_t ring_id) const {
+    const std::uint32_t at = are_many() ? by_id_.find(ring_id) : ring_stats_find(rings_, ring_id);
+    if (at == key_index::none) return {};
+    return record_at<ring_stats>(rings_, at);
   }
 
  private:
-  static constexpr std::size_t few =
-      16;  // a channel of today has no more, and a search costs less than a sort
+  bool are_many() const { return ring_count(rings_) > 16; }
 
   ring_blocks rings_;
-  std::vector<std::pair<std::uint32_t, std::size_t>> sorted_;  // id and position, where there are more
+  key_index by_id_;
 };
 
 ring_delta ring_stats_delta(const previous_rings &previous, const ring_stats &ring) {
-  ring_stats before;
-  if (!previous.find(ring.ring_id, before)) return {};
-  return {.xfer_bytes = ring.xfer.bytes - before.xfer.bytes,
-          .sync_bytes = ring.sync.bytes - before.sync.bytes,
-          .xfer_slots = ring.xfer.slots - before.xfer.slots,
-          .sync_slots = ring.sync.slots - before.sync.slots,
-          .sync_count = ring.sync.count - before.sync.count,
-          .xfer_count = ring.xfer.count - before.xfer.count};
+  const std::optional<ring_stats> before = previous.find(ring.ring_id);
+  if (!before) return {};
+  return {.xfer_bytes = ring.xfer.bytes - before->xfer.bytes,
+          .sync_bytes = ring.sync.bytes - before->sync.bytes,
+          .xfer_slots = ring.xfer.slots - before->xfer.slots,
+          .sync_slots = ring.sync.slots - before->sync.slots,
+          .sync_count = ring.sync.count - before->sync.count,
+          .xfer_count = ring.xfer.count - before->xfer.count};
 }
 
 // The columns behind the first one, of transfers or syncs.
