@@ -15,7 +15,7 @@ struct index_key {
 
   template <class... Value>
   index_key(const Value &...values) {
-    static_assert((0 + ... + sizeof values) <= sizeof bytes);
+    static_assert((std::size_t{} + ... + sizeof(Value)) <= std::size_t{16});
     static_assert((std::has_unique_object_representations_v<Value> && ...));
     unsigned char *to = bytes;
     ((std::memcpy(to, &values, sizeof values), to += sizeof values), ...);

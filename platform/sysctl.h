@@ -14,8 +14,8 @@ extern "C" {
 // ever written past it. Without `old_length` nothing is stored; the result tells whether there is such a
 // variable.
 //
-// Each call is a snapshot of its own: the variable may grow, shrink or vanish in between. Only a buffer of one
-// byte, as for a switch, has another rule, so that a listing can ask at every row: where the call before
+// Each call is a snapshot of its own: the variable may grow, shrink or vanish in between. Only a buffer of
+// one byte, as for a switch, has another rule, so that a listing can ask at every row: where the call before
 // was the same read, this one looks no name up. It delivers what the variable holds now, but need not notice
 // that the variable has grown, vanished or been replaced by another of its name since.
 //

