@@ -9,7 +9,7 @@ namespace {
 std::size_t expanding_to;  // the capacity that there may be no memory for
 
 [[noreturn]] void end_without_room() {
-  complain<"Error expanding tv_region_set-> capacity %d\n">(static_cast<int>(expanding_to));
+  say_last_words<"Error expanding tv_region_set-> capacity %d\n">(static_cast<int>(expanding_to));
   std::exit(exit_status::out_of_memory);
 }
 
