@@ -100,10 +100,11 @@ void output::attach(int fd) {
   fd_ = fd;
   struct stat status {};
   fstat(fd, &status);
-  is_terminal_ = S_ISCHR(status.st_mode) && isatty(fd);
+  const bool has_terminal = S_ISCHR(status.st_mode) && isatty(fd);
+  guard_ = has_terminal ? format::terminal_guard() : format::guard::none;
   is_pipe_ = S_ISFIFO(status.st_mode);
   is_socket_ = S_ISSOCK(status.st_mode);
-  may_block_ = (is_terminal_ || is_pipe_) && !platform::make_writes_nonblocking(fd);
+  may_block_ = (has_terminal || is_pipe_) && !platform::make_writes_nonblocking(fd);
 }
 
 void output::close() {
@@ -132,7 +133,7 @@ ssize_t output::write_once(std::string_view bytes) const {
 // written is not known.
 ssize_t output::write_piece(std::string_view bytes, const sigset_t &unheld) {
   if (may_block_) wait_for_room(fd_, nullptr, &unheld);
-  if (!may_block_ || !is_terminal_) return write_once(bytes);
+  if (!may_block_ || !is_terminal()) return write_once(bytes);
   write_is_open_ = true;
   sigset_t held;
   sigprocmask(SIG_SETMASK, &unheld, &held);

@@ -47,7 +47,7 @@ class output {
   void redirect(int fd);
 
   // Whether the reader is a terminal.
-  bool is_terminal() const { return is_terminal_; }
+  bool is_terminal() const { return guard_ != format::guard::none; }
 
   // Writes everything, also an unfinished line. Waits where the reader is slow.
   //
@@ -83,6 +83,7 @@ class output {
     lines_end_.store(end, std::memory_order_release);
     if (end - begin_ >= flush_size) drain(end);
   }
+  format::guard reader_guard() const { return guard_; }
 
   // A buffer of this size holds flush_size bytes and a long row.
   static constexpr std::size_t buffer_size = 40 * 1024;
@@ -110,7 +111,7 @@ class output {
   std::unique_ptr<char[]> grown_;  // the buffer after a row that was longer than the first one
   int fd_ = -1;
   failure on_failure_;
-  bool is_terminal_ = false;
+  format::guard guard_ = format::guard::none;  // another one where the reader is a terminal
   bool is_pipe_ = false;
   bool is_socket_ = false;
   int error_ = 0;                            // of the write that ends the process

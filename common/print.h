@@ -13,8 +13,8 @@
 // Texts are whatever converts to std::string_view, format::small_text, any type with a member `printable()`
 // that returns one or a format::text_view, and any that appends itself (format::appendable). Texts marked
 // foreign come from outside the program (the kernel, a process, a name service): where the reader is a
-// terminal, each of their control characters (C0, DEL, C1) shows as "?", one for one, so that a process name
-// cannot drive the terminal.
+// terminal, each byte that it might obey (common/guard.h) shows as "?", so that a process name cannot drive
+// the terminal. This is judged when a text has been cut to its column, and changes no width.
 
 #ifndef TARVELCTL_COMMON_PRINT_H
 #define TARVELCTL_COMMON_PRINT_H
@@ -31,6 +31,7 @@
 #include <utility>
 
 #include "common/format_text.h"
+#include "common/guard.h"
 
 namespace format {
 
@@ -176,14 +177,6 @@ inline char *put_hundredths(char *to, double value) {
   return put_digits(to, hundredths % 100, 2);
 }
 
-// Hides what a terminal would obey.
-inline void hide_controls(char *text, std::size_t size) {
-  for (char *end = text + size; text != end; ++text) {
-    const auto code = static_cast<unsigned char>(*text);
-    if (code < 0x20 || (code >= 0x7f && code < 0xa0)) *text = '?';
-  }
-}
-
 // What a conversion shows of a text.
 template <piece P>
 std::size_t shown_size(std::size_t size) {
@@ -225,12 +218,12 @@ char *put_padded(char *to, const char *text, std::size_t size) {
 }
 
 template <piece P, std::size_t Readable = 0>
-char *put_text(char *to, text_view text, bool guarded) {
+char *put_text(char *to, text_view text, guard against) {
   const std::size_t size = shown_size<P>(text.size);
   char *const end = put_padded<P, Readable>(to, text.data, size);
-  if (text.foreign && guarded) {
+  if (text.foreign && against != guard::none) {
     const std::size_t padding = P.width > size ? P.width - size : 0;
-    hide_controls(P.left ? to : to + padding, size);
+    hide_controls({P.left ? to : to + padding, size}, against);
   }
   return end;
 }
@@ -278,17 +271,17 @@ char *put_double(char *to, double value) {
   return put_padded<P>(to, digits, static_cast<std::size_t>(end - digits));
 }
 
-// Appends one argument. `guarded`: the reader is a terminal.
+// Appends one argument for a reader who is guarded against foreign texts.
 template <piece P, class T>
-char *put(char *to, const T &argument, bool guarded) {
+char *put(char *to, const T &argument, guard against) {
   if constexpr (P.kind == 's') {
     if constexpr (std::same_as<T, text_view>) {
-      return put_text<P>(to, argument, guarded);
+      return put_text<P>(to, argument, against);
     } else if constexpr (appendable<T>) {
       return argument.append_to(to);
     } else {
       return put_text<P, sizeof argument.chars>(to, {argument.chars, argument.size, argument.foreign},
-                                                guarded);
+                                                against);
     }
   } else if constexpr (P.kind == 'c') {
     return put_padded<P>(to, &argument, 1);
@@ -357,8 +350,8 @@ void emit(std::index_sequence<I...>, Sink &sink, const Args &...args) {
   };
   static_assert((accepts<format.pieces[I], Args>() && ...), "an argument does not fit its conversion");
   char *to = sink.room((format.literals_size + ... + bound<format.pieces[I]>(args)));
-  [[maybe_unused]] const bool guarded = sink.is_terminal();
-  ((to = literal(to, format.pieces[I]), to = put<format.pieces[I]>(to, args, guarded)), ...);
+  [[maybe_unused]] const guard against = sink.reader_guard();
+  ((to = literal(to, format.pieces[I]), to = put<format.pieces[I]>(to, args, against)), ...);
   to = literal(to, format.pieces[sizeof...(I)]);
   constexpr bool ends_line = sizeof(F.chars) > 1 && F.chars[sizeof(F.chars) - 2] == '\n';
   sink.commit(to, ends_line);
@@ -367,7 +360,7 @@ void emit(std::index_sequence<I...>, Sink &sink, const Args &...args) {
 // Prints to a sink, an object with
 //   char *room(std::size_t n)        returns where to append; n + slack bytes may be written there
 //   void commit(char *end, bool)     takes what was appended up to `end`; true when a line ends there
-//   bool is_terminal() const         whether foreign texts must be guarded
+//   guard reader_guard() const       what foreign texts must hide
 template <text F, class Sink, class... Args>
 void print_to(Sink &sink, const Args &...args) {
   static_assert(parsed<F>.conversions == sizeof...(Args), "as many arguments as conversions");
@@ -382,7 +375,7 @@ struct scratch {
 
   char *room(std::size_t) { return chars; }
   void commit(char *to, bool) { end = to; }
-  bool is_terminal() const { return false; }
+  guard reader_guard() const { return guard::none; }
 };
 
 template <text F>
