@@ -241,8 +241,8 @@ bytes route(int family, std::uint32_t flags) {
 }
 
 std::string route_row(const std::string &local, const std::string &gateway, const std::string &link_address,
-                      const std::string &flags) {
-  return padded(local, 40) + " " + padded("*", 40) + " " + padded(gateway, 40) + " " +
+                      const std::string &flags, const std::string &remote = "*") {
+  return padded(local, 40) + " " + padded(remote, 40) + " " + padded(gateway, 40) + " " +
          padded(link_address, 17) + "      en0      6     -1     4     5  " + flags + "\n";
 }
 
@@ -260,8 +260,26 @@ TEST(flow_route, PrintsARowForEachInTheOrderOfTheTable) {
                     " " + mac + "      en0      6     -1     4     5  og-i-\n" +
                     " -                 0123456789abcdef 2147483648 -9223372036854775808 4294967295 "
                     "4294967294  -----\n"));
-  EXPECT_EQ(list("flow_route", "flow-route", route(2, 0x20)),
-            printed(route_header + route_row("localhost", "localhost", "-", "-g---")));
+}
+
+TEST(flow_listings, OnlyIpv6NamesAreCutToTheirColumnsAndNoGateways) {
+  const std::string name(300, 'n'), host = name.substr(0, 33) + ".", address6 = name.substr(0, 40);
+  const run_options named{.environment = {{"LD_PRELOAD", NAME_SERVICES},
+                                          {"ASAN_OPTIONS", "verify_asan_link_order=0"},
+                                          {"NAME_SERVICES_ANSWER", name}}};
+  const auto to_a_host = [](bytes record, std::size_t remote, int family) {
+    return endpoint(record, remote, family, 80, loopback4, long6);
+  };
+  const std::string local4 = host + name.substr(0, 15) + " ", local6_cut = host + name.substr(0, 9);
+  const std::string flows = to_a_host(full_flow(2, 6), 108, 2) + to_a_host(full_flow(30, 6), 108, 30);
+  EXPECT_EQ(
+      run_on(flow_list, flows, "netstat -a", named),
+      printed(flow_header + full_row(" tcp4 ", local4, local4) + full_row(" tcp6 ", local6_cut, local6_cut)));
+  const std::string address4 = name.substr(0, 255), gateway6 = name.substr(0, 49);
+  const std::string routes = to_a_host(route(2, 0x20), 100, 2) + to_a_host(route(30, 0x20), 100, 30);
+  EXPECT_EQ(run_on("kern.tarvel.stats.flow_route", routes, "flow-route", named),
+            printed(route_header + route_row(address4, address4, "-", "-g---", address4) +
+                    route_row(address6, gateway6, "-", "-g---", address6)));
 }
 
 // Those that netstat filters

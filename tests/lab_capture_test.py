@@ -7,6 +7,7 @@ import functools
 import ipaddress
 import os
 import pathlib
+import pty
 import random
 import shutil
 import signal
@@ -244,6 +245,10 @@ class Moments(CaptureTest):
                 (kernel.root / path).rename(self.directory / f"removed {time.monotonic_ns()}")
                 kept and kept.rename(kernel.root / path)
         self.assertEqual(self.replay("echo", "seen").stdout, "seen\n")
+        os.mkfifo(kernel.root / "größe\u202e")
+        reader, terminal = pty.openpty()
+        subprocess.run([lab, "run", kernel.root, "--", "true"], stderr=terminal, env={**os.environ, "LC_ALL": "C.UTF-8"})
+        self.assertRegex(os.read(reader, 4096).decode(), r"größe\?\?\?: no part of a capture\r\n")
 
 
 v4, v6 = (lambda t: ipaddress.ip_address(t).packed), (lambda t: ipaddress.ip_address(t).packed)

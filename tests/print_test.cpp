@@ -15,6 +15,8 @@
 
 namespace {
 
+using format::guard;
+
 #if defined(__SANITIZE_ADDRESS__) || !defined(__OPTIMIZE__)
 constexpr int rounds = 20'000;
 #else
@@ -35,19 +37,20 @@ struct watched_sink {
     text = {buffer, static_cast<std::size_t>(end - buffer)};
     ends_line = line_end;
   }
-  bool is_terminal() const { return terminal; }
+  guard reader_guard() const { return against; }
 
   static constexpr char fence = '\x55';
 
-  bool terminal = false, ends_line = false;
+  guard against = guard::none;
+  bool ends_line = false;
   char *fence_at = nullptr;
   std::string_view text{};
   char buffer[4096];
 };
 
 template <format::text F, class... Args>
-std::string shown(bool terminal, const Args &...args) {
-  watched_sink sink{.terminal = terminal};
+std::string shown(guard against, const Args &...args) {
+  watched_sink sink{.against = against};
   format::print_to<F>(sink, args...);
   return std::string(sink.text) + (sink.ends_line ? "$" : "");
 }
@@ -147,24 +150,33 @@ TEST(format, ExtremesAgreeWithPrintf) {
 }
 
 TEST(format, LiteralsSurroundConversionsAndMayEndALine) {
-  EXPECT_EQ((shown<"">(false)), "");
-  EXPECT_EQ((shown<"100%%\n">(false)), "100%\n$");
-  EXPECT_EQ((shown<"\n">(false)), "\n$");
-  EXPECT_EQ((shown<"a\nb">(false)), "a\nb");
-  EXPECT_EQ((shown<"\tPort[%2u] %-8s (fd %d)\t%%%c">(false, 7U, "en0", -1, '!')),
+  EXPECT_EQ((shown<"">(guard::none)), "");
+  EXPECT_EQ((shown<"100%%\n">(guard::none)), "100%\n$");
+  EXPECT_EQ((shown<"a\nb">(guard::none)), "a\nb");
+  EXPECT_EQ((shown<"\tPort[%2u] %-8s (fd %d)\t%%%c">(guard::none, 7U, "en0", -1, '!')),
             "\tPort[ 7] en0      (fd -1)\t%!");
 }
 
-TEST(format, ForeignControlCharactersAreHiddenFromTerminalsOnly) {
-  EXPECT_EQ((shown<"%12s|%-12s|%.2s">(true, foreign_text{"\033[1m\x7f"}, foreign_text{"\033[1m\x7f"},
-                                      foreign_text{"\033[1m\x7f"})),
-            "       ?[1m?|?[1m?       |?[");
-  EXPECT_EQ((shown<"%s">(false, foreign_text{"\033[1m\x7f"})), "\033[1m\x7f");
-  EXPECT_EQ((shown<"%s">(true, "\033[36mcyan\033[0m")), "\033[36mcyan\033[0m");
-  for (unsigned code = 0; code < 256; ++code) {
-    const bool control = code < 0x20 || code == 0x7f || (code >= 0x80 && code < 0xa0);
-    const std::string text(1, static_cast<char>(code));
-    EXPECT_EQ((shown<"%s">(true, foreign_text{text})), control ? "?" : text) << code;
+TEST(format, ForeignTextsAreGuardedWhenTheyAreCut) {
+  const foreign_text text{"\033[1m\u20ac"};
+  EXPECT_EQ((shown<"%12s|%-9.5s|%.2s">(guard::bytes, text, text, text)),
+            "     ?[1m\xe2?\xac|?[1m\xe2    |?[");
+  EXPECT_EQ((shown<"%9s|%-9.6s|%.5s">(guard::utf8, text, text, text)), "  ?[1m\u20ac|?[1m??   |?[1m?");
+  EXPECT_EQ((shown<"%s">(guard::none, text)), text.text);
+  EXPECT_EQ((shown<"%s">(guard::utf8, "\033[36mcyan\033[0m")), "\033[36mcyan\033[0m");
+  const foreign_text edges{"\x1f\x20\x7e\x7f\x80\x9f\xa0\xff"};
+  EXPECT_EQ((shown<"%s">(guard::bytes, edges)), "? ~???\xa0\xff");
+}
+
+TEST(format, Utf8HidesControlsAndWhatIsNoCharacter) {
+  for (const char *whole : {"\x20\x7e", "\xc2\xa0", "\u07ff", "\u0800", "\u2027", "\u202f", "\u2065",
+                            "\u206a", "\ud7ff", "\ue000", "\uffff", "\U00010000", "\U0010ffff"}) {
+    EXPECT_EQ((shown<"%s">(guard::utf8, foreign_text{whole})), whole);
+  }
+  for (const char *hidden : {"\x1f\x7f", "\xc2\x80", "\xc2\x9f", "\u2028", "\u202e", "\u2066", "\u2069",
+                             "\x80\xbf\xff", "\xc1\xbf", "\xe0\x9f\xbf", "\xf0\x8f\xbf\xbf", "\xed\xa0\x80",
+                             "\xed\xbf\xbf", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80", "\xe2\x82"}) {
+    EXPECT_EQ((shown<"%sz">(guard::utf8, foreign_text{hidden})), std::string(std::strlen(hidden), '?') + "z");
   }
 }
 

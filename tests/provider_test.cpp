@@ -83,11 +83,20 @@ TEST(provider, NameEndsAtItsLengthItsNulOrItsField) {
     EXPECT_EQ(list(provider(field, 2).u32(128, length)), printed(heading("net-if " + shown))) << length;
 }
 
-TEST(provider, ControlCharactersAreHiddenFromTerminalsOnly) {
-  const bytes record = provider("a\001\033[31m\x7f\x9b\r\nb\x1f\x20\xa0");
-  EXPECT_EQ(list(record), printed(heading("user-pipe a\001\033[31m\x7f\x9b\r\nb\x1f\x20\xa0")));
-  EXPECT_EQ(list(record, "provider", {.terminal = true}),
-            printed(heading("user-pipe a??[31m????b?\x20\xa0")));
+TEST(provider, NamesAreWholeOnATerminalOfTheirCharacterSetButCannotDriveIt) {
+  const std::string name = "\u00c4nderung, gr\u00f6\u00dfe\u20ac\033[31m\x7f\u202e\xc2\x9b\xc0\xaf";
+  const bytes record = provider(name + "\u20ac").u32(128, static_cast<std::uint32_t>(name.size() + 2));
+  const std::string by_bytes = "\xc3?nderung, gr\xc3\xb6\xc3?e\xe2?\xac?[31m?\xe2?\xae\xc2?\xc0\xaf\xe2?";
+  const std::pair<const char *, std::string> locales[] = {
+      {"C.UTF-8", "\u00c4nderung, gr\u00f6\u00dfe\u20ac?[31m" + std::string(10, '?')},
+      {"C", by_bytes},
+      {"no_WHERE.UTF-8", by_bytes}};
+  for (const auto &[locale, shown] : locales) {
+    run_options options{.environment = {{"LC_ALL", locale}}};
+    EXPECT_EQ(list(record, "provider", options), printed(heading("user-pipe " + name + "\xe2\x82")));
+    options.terminal = true;
+    EXPECT_EQ(list(record, "provider", options), printed(heading("user-pipe " + shown))) << locale;
+  }
 }
 
 TEST(provider, InstanceCountsThatLieAreNotFollowed) {

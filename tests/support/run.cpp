@@ -67,6 +67,8 @@ channel make_stdout(const run_options &options) {
   if (options.prepare) options.prepare();
   setenv("TARVEL_ROOT", kernel.root().c_str(), 1);
   setenv("POSIXLY_CORRECT", "", 1);  // options behind operands are options none the less
+  setenv("LC_ALL", "C", 1);
+  for (const auto &[name, value] : options.environment) setenv(name.c_str(), value.c_str(), 1);
 
   const std::string name = options.program_name.empty() ? TARVELCTL_PROGRAM : options.program_name;
   std::vector<char *> argv{const_cast<char *>(name.c_str())};

@@ -8,6 +8,7 @@
 #include <functional>
 #include <initializer_list>
 #include <iosfwd>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -56,6 +57,7 @@ struct run_options {
   std::string program_name{};         // in place of the program's path, as its first argument
   std::filesystem::path directory{};  // where it runs
   std::function<void()> prepare{};    // called in the process before it starts
+  std::map<std::string, std::string> environment{};  // beside that of the test, in the C locale
   std::function<void(const running &)> meanwhile{};  // called at least every few milliseconds
 };
 
