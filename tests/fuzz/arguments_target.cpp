@@ -26,7 +26,7 @@ constexpr struct {
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
   if (size == 0 || size > 1024) return -1;
   fuzz::surroundings around;
-  around.is_terminal = data[0] & 1;
+  if (data[0] & 1) around.reader = format::guard::bytes;
   around.files_can_open = data[0] & 2;
   around.sleeps = 1;
   for (const auto &each : tables)
@@ -39,7 +39,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
     rest = rest.subspan(std::min(rest.size(), words.back().size() + 1));
   }
   const fuzz::outcome &seen = fuzz::observe(around, std::move(words));
-  fuzz::expect_readable(seen.report, false);
+  fuzz::expect_readable(seen.report, format::guard::none);
   fuzz::expect(!seen.assertion, "whole tables fail an assertion", seen.assertion ? seen.assertion : "");
   fuzz::expect(!seen.has_exited || seen.status == 0 || seen.status == 64, "an exit status of no meaning",
                seen.diagnostics);

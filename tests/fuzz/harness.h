@@ -15,6 +15,8 @@
 #include <string_view>
 #include <vector>
 
+#include "common/guard.h"
+
 namespace fuzz {
 
 using bytes = std::span<const std::uint8_t>;
@@ -25,11 +27,11 @@ struct surroundings {
     std::string_view node;
     bytes content;
   };
-  std::vector<table> tables;    // of equal names the next one answers after each read, the last one for ever
-  std::string name;             // of every process and host; empty: nobody knows any
-  bool is_terminal = false;     // what the reports go to
-  bool files_can_open = false;  // what -f gets
-  int sleeps = 0;               // how many are slept through; the next one ends the watch
+  std::vector<table> tables;  // of equal names the next one answers after each read, the last one for ever
+  std::string name;           // of every process and host; empty: nobody knows any
+  format::guard reader = format::guard::none;  // what the reports go to
+  bool files_can_open = false;                 // what -f gets
+  int sleeps = 0;                              // how many are slept through; the next one ends the watch
 };
 
 struct outcome {
@@ -46,8 +48,11 @@ const outcome &observe(const surroundings &around, std::vector<std::string> word
 // Ends the fuzzer with a message where it does not hold.
 void expect(bool holds, const char *what, std::string_view seen = {});
 
+// Whether a reader takes the text for printable characters alone, in the judgement of the C library.
+bool is_plain(std::string_view text, format::guard reader);
+
 // Expects whole lines, and on a terminal nothing that drives it but the program's own colours.
-void expect_readable(std::string_view text, bool is_terminal);
+void expect_readable(std::string_view text, format::guard reader);
 
 }  // namespace fuzz
 

@@ -17,7 +17,7 @@ struct plain_sink {
   void commit(const char *end, bool /*ends_line*/) {
     text.resize(static_cast<std::size_t>(end - text.data()));
   }
-  bool is_terminal() const { return false; }
+  format::guard reader_guard() const { return format::guard::none; }
 
   std::string text;
 };
@@ -47,6 +47,18 @@ void agree_on_text(fuzz::bytes input) {
   checks[input[0] / 8 % std::size(checks)](value.c_str());
 }
 
+// What is left of a text is plain, each byte of it is the text's own or hidden, and a plain text stays whole.
+void guard(fuzz::bytes input) {
+  const auto reader = input[0] / 8 % 2 ? format::guard::utf8 : format::guard::bytes;
+  const std::string text(reinterpret_cast<const char *>(input.data() + 1), input.size() - 1);
+  std::string shown = text;
+  format::hide_controls(shown, reader);
+  const bool is_own = std::equal(text.begin(), text.end(), shown.begin(),
+                                 [](char own, char seen) { return seen == own || seen == '?'; });
+  fuzz::expect(is_own && fuzz::is_plain(shown, reader), "a text is not guarded", shown);
+  fuzz::expect(shown == text || !fuzz::is_plain(text, reader), "a plain text is hidden", text);
+}
+
 constexpr void (*kinds[])(fuzz::bytes) = {
     agree_on<int, "%d", "%3d", "%4d", "%10d", "%-11d", "|%d|\n">,
     agree_on<unsigned, "%u", "%2u", "%5u", "%-5u", "%x", "%02x", "%8x", "%-8x", "%o", "%04o", "%6u">,
@@ -56,6 +68,7 @@ constexpr void (*kinds[])(fuzz::bytes) = {
     agree_on<char, "%c", "%4c", "%-4c">,
     agree_on_text<"%s", "%8s", "%15s", "%-3s", "%-12s", "%.15s", "%10.4s", "%-10.4s", "%.0s", "%-43.43s",
                   "\t%-16s:">,
+    guard,
 };
 
 }  // namespace

@@ -43,7 +43,7 @@ def table_seeds(lab, name):
             first, *more = [(pathlib.Path(root) / "proc/sys/kern/tarvel" / node).read_bytes() for node in TABLES[name]]
         more += [b""] * (2 - len(more))
         for command in range(8):
-            yield struct.pack("<BBBBHH", command, command % 4, 1, command, *map(len, more)) + b"".join(more) + first
+            yield struct.pack("<BBBBHH", command, command % 8, 1, command, *map(len, more)) + b"".join(more) + first
             yield struct.pack("<BBBBHH", command, 0, 1, 0, 0, 0) + first[:-1]
 
 

@@ -132,7 +132,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   const target &target = the_target();
   fuzz::bytes rest(data + header_size, size - header_size);
   fuzz::surroundings around;
-  around.is_terminal = data[1] & 1;
+  if (data[1] & 1) around.reader = data[1] & 4 ? format::guard::utf8 : format::guard::bytes;
   const fuzz::bytes name = rest.last(std::min<std::size_t>(rest.size(), 20));
   if (data[1] & 2) around.name.assign(name.begin(), std::find(name.begin(), name.end(), 0));
   around.sleeps = 2;
@@ -148,7 +148,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   const std::string_view words = target.commands[data[0] % target.commands.size()];
   const fuzz::bytes place = rest.subspan(rest.empty() ? 0 : data[3] * 4 % rest.size());
   const fuzz::outcome &seen = fuzz::observe(around, entries(words, place));
-  fuzz::expect_readable(seen.report, around.is_terminal);
+  fuzz::expect_readable(seen.report, around.reader);
   if (seen.assertion) {
     fuzz::expect(std::count(target.assertions.begin(), target.assertions.end(), seen.assertion) > 0,
                  "an assertion of another table", seen.assertion);
