@@ -56,7 +56,7 @@ guard terminal_guard() {
   return answer;
 }
 
-void hide_controls(std::span<char> text, guard against) {
+void hide_controls(std::span<char> text, guard against) noexcept {
   while (!text.empty()) {
     const character next = against == guard::utf8 ? first_character(text)
                                                   : character{static_cast<unsigned char>(text.front()), 1};

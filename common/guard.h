@@ -18,7 +18,7 @@ guard terminal_guard();
 // Puts a "?" in the place of each byte of a control character (C0, DEL, C1), for a terminal in either
 // character set. In UTF-8 the same goes for what separates lines and paragraphs, for what reorders the text
 // around it, and for bytes that are no part of a valid character.
-void hide_controls(std::span<char> text, guard against);
+void hide_controls(std::span<char> text, guard against) noexcept;
 
 }  // namespace format
 

@@ -178,6 +178,7 @@ TEST(format, Utf8HidesControlsAndWhatIsNoCharacter) {
                              "\xed\xbf\xbf", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80", "\xe2\x82"}) {
     EXPECT_EQ((shown<"%sz">(guard::utf8, foreign_text{hidden})), std::string(std::strlen(hidden), '?') + "z");
   }
+  EXPECT_EQ((shown<"%s">(guard::utf8, foreign_text{"\xf0\x9f\x98\xc3\xa4\xe2(\xa1"})), "???\u00e4?(?");
 }
 
 }  // namespace
