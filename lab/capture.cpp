@@ -74,17 +74,16 @@ bool save_redacted(root_directory &root, const fetched_table &fetched, substitut
   return true;
 }
 
-// Saves a moment below `path`, redacted where there are substitutes. Backwards, because the names of arenas
-// and providers may hold those of processes, which must have been seen by then.
+// Saves a moment below `path`, redacted where there are substitutes.
 bool save(const snapshot &taken, const std::string &path, substitutes *by) {
   root_directory root(path);
   if (!root.prepare(0700)) return false;
   for (const auto &[pid, name] : taken.processes) {
     if (!root.put_process(pid, by ? by->process(name) : name)) return false;
   }
-  for (auto fetched = taken.tables.rbegin(); fetched != taken.tables.rend(); ++fetched) {
-    const bool saved = by ? save_redacted(root, *fetched, *by)
-                          : root.put_table(fetched->source->node, fetched->content.bytes());
+  for (const fetched_table &fetched : taken.tables) {
+    const bool saved = by ? save_redacted(root, fetched, *by)
+                          : root.put_table(fetched.source->node, fetched.content.bytes());
     if (!saved) return false;
   }
   return true;

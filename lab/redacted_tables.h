@@ -1,4 +1,4 @@
-// Tables without the addresses and process names of whom they came from.
+// Tables without the addresses and names of whom they came from.
 
 #ifndef TARVELCTL_LAB_REDACTED_TABLES_H
 #define TARVELCTL_LAB_REDACTED_TABLES_H
@@ -12,9 +12,9 @@
 
 namespace lab {
 
-// Writes the bytes of a table with substitutes for every address and process name, zeroes in place of what is
-// never read, and all else as it is. Names of providers, arenas and regions lose the process names seen so
-// far. Returns false where the table ends inside a record or is not known: all from there on is left out.
+// Writes the bytes of a table with what its records may show: numbers and UUIDs that reports read, and
+// substitutes for addresses and names; all else is zero. Returns false where the table ends inside a record
+// or is not known: all from there on is left out.
 bool redact_table(std::string_view node, std::span<const std::byte> table, substitutes &by, table_file &file);
 
 }  // namespace lab

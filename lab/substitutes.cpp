@@ -52,21 +52,13 @@ bool stays(const ipv6_address &address) {
   return *last <= 1 && std::all_of(address.bytes, last, [](std::uint8_t byte) { return byte == 0; });
 }
 
-// Whether both belong to one word.
-bool are_joined(char a, char b) {
-  const auto is_letter = [](char c) {
-    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || static_cast<unsigned char>(c) >= 0x80;
-  };
-  return is_letter(a) && is_letter(b);
-}
+// Types of interfaces that a name may begin with, none longer than an interface field with a number behind.
+constexpr std::string_view interface_types[] = {"bond",  "bridge", "en",     "eth", "gif",
+                                                "ipsec", "lo",     "pdp_ip", "ppp", "tap",
+                                                "tun",   "utun",   "vlan",   "wl",  "wlan"};
 
-// Whether a word may begin or end before position `at`.
-bool is_boundary(std::string_view text, std::size_t at) {
-  return at == 0 || at >= text.size() || !are_joined(text[at - 1], text[at]);
-}
-
-std::string process_number(std::uint32_t number) {
-  return "process" + std::to_string(number);
+bool is_digit(char c) {
+  return c >= '0' && c <= '9';
 }
 
 }  // namespace
@@ -127,42 +119,23 @@ void substitutes::replace_mac(std::uint8_t (&address)[6]) {
   put_number(macs_.of(key), address);
 }
 
+std::string substitutes::numbered(std::string_view word, std::string_view text) {
+  if (text.empty()) return {};
+  auto &known = texts_[word];
+  auto found = known.find(text);
+  if (found == known.end()) found = known.emplace(text, known.size() + 1).first;
+  return std::string(word) + std::to_string(found->second);
+}
+
 std::string substitutes::process(std::string_view name) {
-  if (name.empty()) return {};
-  const auto [known, is_new] = processes_.try_emplace(std::string(name.substr(0, known_length)), used_ + 1);
-  used_ += is_new;
-  const std::uint32_t number = known->second;
-  if (name.size() > known_length) processes_.try_emplace(std::string(name), number);
-  return process_number(number);
+  return numbered("process", name.substr(0, known_length));
 }
 
-// The length of the longest known name that `text` begins with, and what stands for it; 0 where there is
-// none. Behind a name of which only the beginning is known, the rest of the word belongs to it.
-std::size_t substitutes::process_at(std::string_view text, std::string &substitute) const {
-  for (std::size_t length = text.size(); length; --length) {
-    if (length != known_length && !is_boundary(text, length)) continue;
-    const auto known = processes_.find(text.substr(0, length));
-    if (known == processes_.end()) continue;
-    substitute = process_number(known->second);
-    while (!is_boundary(text, length)) ++length;
-    return length;
-  }
-  return 0;
-}
-
-std::string substitutes::without_processes(std::string_view text) const {
-  std::string result;
-  for (std::size_t at = 0; at < text.size();) {
-    std::string substitute;
-    const std::size_t length = is_boundary(text, at) ? process_at(text.substr(at), substitute) : 0;
-    if (length) {
-      result += substitute;
-      at += length;
-    } else {
-      result += text[at++];
-    }
-  }
-  return result;
+std::string substitutes::interface(std::string_view name) {
+  const auto digits = std::find_if_not(name.rbegin(), name.rend(), is_digit).base();
+  const auto type = std::ranges::find(interface_types, std::string_view(name.begin(), digits));
+  const bool is_known = type != std::end(interface_types) && digits != name.end();
+  return numbered(is_known ? *type : "if", name);
 }
 
 }  // namespace lab

@@ -1,7 +1,10 @@
-// What stands in a redacted capture in place of addresses and process names.
+// What stands in a redacted capture in place of addresses and names: an operation for each kind of field.
 //
-// The same address or name has the same substitute as long as the object lives. Substitutes are numbered as
-// they are first asked for, and from nothing else: there is no way back.
+// The same original has the same substitute as long as the object lives. Substitutes are numbered as they are
+// first asked for, and from nothing else: there is no way back.
+//
+// A text is replaced as a whole and never searched for another one. So it does not matter which names come
+// later, or never: one object can redact the moments of a capture one after the other, each for good.
 
 #ifndef TARVELCTL_LAB_SUBSTITUTES_H
 #define TARVELCTL_LAB_SUBSTITUTES_H
@@ -28,12 +31,16 @@ class substitutes {
   // 02:00 and a number. The null and the broadcast address stay.
   void replace_mac(std::uint8_t (&address)[6]);
 
-  // "process" and a number; empty where the name is. A process is known by the first 15 bytes of its name:
-  // some texts have no more of it.
+  // The word and a number, empty where the text is; each word has numbers of its own. `word` must outlive the
+  // object.
+  std::string numbered(std::string_view word, std::string_view text);
+
+  // "process" and a number. A process is known by the first 15 bytes of its name: some fields hold no more.
   std::string process(std::string_view name);
 
-  // The text with a substitute for each name seen so far that stands in it by itself, no letter beside it.
-  std::string without_processes(std::string_view text) const;
+  // The interface's type and a number where the name is just that, a known type and a number; "if" and a
+  // number for any other name: it may hold an address or the name of a place. Fits the interface fields.
+  std::string interface(std::string_view name);
 
  private:
   // Numbers in the order of the questions, from 1.
@@ -46,14 +53,11 @@ class substitutes {
     std::uint32_t used_ = 0;
   };
 
-  std::size_t process_at(std::string_view text, std::string &substitute) const;
-
   static constexpr std::size_t ipv4_kinds = 3;
   numbering ipv4_[ipv4_kinds];
   numbering ipv6_;
   numbering macs_;
-  std::map<std::string, std::uint32_t, std::less<>> processes_;  // by what is known of the name, and in full
-  std::uint32_t used_ = 0;                                       // numbers of processes
+  std::map<std::string_view, std::map<std::string, std::size_t, std::less<>>> texts_;  // by word
 };
 
 }  // namespace lab

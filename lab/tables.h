@@ -28,8 +28,7 @@ struct table {
   void (*mentioned)(std::span<const std::byte>, std::vector<std::int32_t> &);
 };
 
-// In the order in which they are published: what others refer to comes first. Names that may hold those of
-// processes come before the records that say who the processes are.
+// In the order in which they are published: what others refer to comes first.
 extern const std::span<const table> tables;
 
 // Each in the file of its name.

@@ -9,6 +9,7 @@ import os
 import pathlib
 import pty
 import random
+import re
 import shutil
 import signal
 import struct
@@ -18,7 +19,7 @@ import time
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run, text, u32  # noqa: E402
+from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run  # noqa: E402
 
 commands = ("channel", "flow -n", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a",
             "provider -D", "show -n", "tree", "channel-stats -n", "list-providers", "netstat -a -n")
@@ -251,7 +252,31 @@ class Moments(CaptureTest):
         self.assertRegex(os.read(reader, 4096).decode(), r"größe\?\?\?: no part of a capture\r\n")
 
 
+docs = pathlib.Path(__file__).parents[1] / "docs"
+# Of each record the fields that survive redaction, and all fields as (offset, size, type, name): as the manual has them.
+surviving = {record: set(re.split(r"[\s,;]+", names)) for records, names in
+             re.findall(r"^\.It Vt (.*)\n((?:[^.].*\n)+)", (docs / "tarvellab.1").read_text(), flags=re.M) for record in records.split(" , ")}
+rows = {record: [(int(at), int(size), *names) for at, size, *names in re.findall(r"^\.It (\d+) Ta (\d+) Ta (\S+) Ta (\S+)", columns, flags=re.M)]
+        for record, columns in re.findall(r"^\.Vt (\w+) ,\n\d+ bytes:\n(.*?)\.El", (docs / "tarvel-tables.5").read_text(), flags=re.M | re.S)}
+rows["uuid"], surviving["uuid"] = [(0, 16, "uuid", "uuid")], {"uuid"}
+nested = {56: "ring_activity", 64: "tv_flow_endpoint_stats", 28: "socket_address", 32: "tv_stats_nexus_head", 12 * 208: "tv_stats_region"}
+
+
+def survives(record, names=()):
+    """For each byte of a record whether it survives."""
+    result = []
+    for _, size, kind, field in rows[record]:
+        if kind.startswith("record"):
+            part = survives(nested[size], {name[len(field) + 1:] for name in surviving[record] if name.startswith(field + ".")})
+            result += part * (size // len(part))
+        else:
+            result += [field in names or field in surviving.get(record, ())] * size
+    return result
+
+
 v4, v6 = (lambda t: ipaddress.ip_address(t).packed), (lambda t: ipaddress.ip_address(t).packed)
+entry = ("tv_stats_flow_adv_entry", [], [])
+mac, group = (b"\1\2\3\4\5\6", b"\3\0\0\0\0\1"), (b"\xff" * 6, b"\xff" * 6)
 
 
 class Redact(CaptureTest):
@@ -265,78 +290,74 @@ class Redact(CaptureTest):
         self.assertNotIn("holds", errors)
         return {name: self.saved().table(name) for name in tables}
 
-    # Of each format: its size; what no one reads, as (offset, width); fields as (offset, before, after).
-    ends = [(137, 3), (148, 4), (176, 40), (240, 80)]
+    # Of each table its records: what they are amid noise, as (offset, before, after), and what does not survive then, as (offset, width).
     formats = {
-        "stats/flow": (
-            (320, ends + [(88, 16), (116, 16)], [(36, b"browser\0".ljust(32, b"x"), b"process1"), (81, b"\2"), (84, v4("10.0.0.1"), v4("240.0.0.1")),
-                                                 (109, b"\x1e"), (112, v4("10.0.0.2"), v4("240.0.0.2"))]),
-            (320, ends + [(84, 4), (112, 4)], [(36, b"com.example.browser".ljust(32, b"\0"), b"process2"), (81, b"\x1e"),
-                                               (88, v6("2001:db8::7"), v6("3fff::1")), (116, v6("fe80:4::7"), v6("fe80:4::3fff:0:0:2"))]),
-            (320, ends + [(84, 4), (88, 16), (112, 4), (116, 16)], [(36, bytes(32), b""), (81, b"\3")]),
-            (320, ends + [(88, 16), (116, 16)], [(36, b"com.example.bro".ljust(32, b"\0"), b"process2"), (81, b"\2"), (84, v4("10.0.0.2"), v4("240.0.0.2")),
-                                                 (112, v4("127.0.0.9"), v4("127.0.0.9"))])),
-        "stats/flow_route": (
-            (256, [(0, 32), (80, 16), (108, 16), (136, 16), (156, 36), (198, 58)],
-             [(101, b"\2"), (76, bytes(4), bytes(4)), (104, v4("224.0.0.251"), v4("239.0.0.1")), (132, v4("169.254.7.7"), v4("169.254.0.1")),
-              (192, b"\1\2\3\4\5\6", b"\3\0\0\0\0\1")]),
-            (256, [(0, 32), (76, 4), (104, 4), (132, 4), (156, 36), (198, 58)],
-             [(101, b"\x1e"), (80, v6("::1"), v6("::1")), (108, v6("ff02:5::fb"), v6("ff02:5::3fff:0:0:1")), (136, v6("::ffff:10.0.0.1"), v6("::ffff:240.0.0.1")),
-              (192, b"\0" * 6, b"\0" * 6)]),
-            (256, [(0, 32), (80, 16), (108, 16), (136, 16), (156, 36), (198, 58)],
-             [(101, b"\2"), (76, v4("255.255.255.255"), v4("255.255.255.255")), (104, v4("224.0.0.251"), v4("239.0.0.1")),
-              (132, bytes(4), bytes(4)), (192, b"\xff" * 6, b"\xff" * 6)]),
-            (256, [(0, 32), (76, 4), (104, 4), (132, 4), (156, 36), (198, 58)],
-             [(101, b"\x1e"), (80, v6("fec0::7"), v6("3fff::2")), (108, v6("ff01:5::fb"), v6("ff01:5::3fff:0:0:3")),
-              (136, v6("ff05:5::fb"), v6("ff05::3fff:0:0:4")), (192, b"\0" * 6, b"\0" * 6)])),
-        "stats/flow_owner": ((128, [(84, 44)], [(36, b"x" * 32, b"process1")]),),
-        "stats/netns": (
-            (32, [(4, 12), (19, 13)], [(0, v4("10.0.0.7"), v4("240.0.0.1")), (16, b"\4"), (18, b"\0")]),
-            (32, [(19, 13)], [(0, v6("fe80::7"), v6("fe80::3fff:0:0:1")), (16, b"\x10"), (18, b"\1")]),
-            (32, [(12, 4), (20, 12)], []),
-            (32, [(0, 16), (19, 13)], [(16, b"\0"), (18, b"\0")])),
-        "stats/net_if": ((320, [(264, 56)], []),),
-        "stats/flow_switch": ((448, [], []),),
-        "stats/userstack": ((2496, [(36, 12), (392, 8), (2312, 8)], []),),
-        "stats/flow_adv": ((40, [], [(36, b"\1\0\0\0")]), (20, [], [])),
-        "nexus_provider_list": ((264, [(16, 48), (136, 8), (176, 4), (196, 60), (260, 4)], [(256, b"\1\0\0\0")]), (16, [], [])),
-        "nexus_channel_list": ((24, [(20, 4)], [(16, b"\1\0\0\0")]), (48, [(40, 8)], [(32, b"\1\0\0\0\0\0\0\0")]),
-                               (184, [(4, 4), (64, 8), (144, 8), (176, 8)], [])),
-        "ring_stat_enable": ((1, [], []),),
-        "stats/arena": ((2608, [(68, 12)] + [(80 + 208 * i + 168, 8) for i in range(12)], []),),
+        "stats/flow": [
+            ("tv_stats_flow", [(16, b"en0\0", b"en1"), (36, b"browser\0", b"process1"), (81, b"\2"), (84, v4("10.0.0.1"), v4("240.0.0.1")),
+                               (112, v4("10.0.0.2"), v4("240.0.0.2"))], []),
+            ("tv_stats_flow", [(16, b"enx0050b6112233\0", b"if1"), (36, b"com.example.browser\0", b"process2"), (81, b"\x1e"),
+                               (88, v6("2001:db8::7"), v6("3fff::1")), (116, v6("fe80:4::7"), v6("fe80:4::3fff:0:0:2"))], []),
+            ("tv_stats_flow", [(16, b"pdp_ip3\0", b"pdp_ip1"), (36, b"\0", b""), (81, b"\3")], [(82, 2), (110, 2)]),
+            ("tv_stats_flow", [(16, b"en7\0", b"en2"), (36, b"com.example.bro\0", b"process2"), (81, b"\2"), (84, v4("10.0.0.2"), v4("240.0.0.2")),
+                               (112, v4("127.0.0.9"), v4("127.0.0.9"))], [])],
+        "stats/flow_route": [
+            ("tv_stats_flow_route", [(32, b"wlan\0", b"if1"), (56, b"\xa0"), (101, b"\2"), (76, bytes(4), bytes(4)),
+                                     (104, v4("224.0.0.251"), v4("239.0.0.1")), (132, v4("169.254.7.7"), v4("169.254.0.1")), (192, *mac)], []),
+            ("tv_stats_flow_route", [(32, b"7\0", b"if2"), (56, b"\xa0"), (101, b"\x1e"), (80, v6("::1"), v6("::1")),
+                                     (108, v6("ff02:5::fb"), v6("ff02:5::3fff:0:0:1")), (136, v6("::ffff:10.0.0.1"), v6("::ffff:240.0.0.1")),
+                                     (192, b"\0" * 6, b"\0" * 6)], []),
+            ("tv_stats_flow_route", [(32, b"\0", b""), (56, b"\x80"), (101, b"\2"), (76, v4("255.255.255.255"), v4("255.255.255.255")),
+                                     (104, v4("224.0.0.251"), v4("239.0.0.1")), (192, *group)], []),
+            ("tv_stats_flow_route", [(32, b"wlan\0", b"if1"), (56, b"\x20"), (101, b"\x1e"), (80, v6("fec0::7"), v6("3fff::2")),
+                                     (108, v6("ff01:5::fb"), v6("ff01:5::3fff:0:0:3")), (136, v6("ff05:5::fb"), v6("ff05::3fff:0:0:4"))], [])],
+        "stats/flow_owner": [("tv_stats_flow_owner", [(16, before + b"\0", after), (36, b"x" * size + b"\0" * (size < 32), b"process1")], [])
+                             for before, after, size in ((b"EN0", b"if1", 15), (b"en", b"if2", 16), (b"en0", b"en1", 32), (b"en00", b"en2", 31))],
+        "stats/netns": [("tv_stats_netns", [(0, v4("10.0.0.7"), v4("240.0.0.1")), (16, b"\4"), (18, b"\0")], []),
+                        ("tv_stats_netns", [(0, v6("fe80::7"), v6("fe80::3fff:0:0:1")), (16, b"\x10"), (18, b"\1")], []),
+                        ("tv_stats_netns_range", [], []), ("tv_stats_netns", [(16, b"\0"), (18, b"\0")], [])],
+        "stats/net_if": [("tv_stats_net_if", [(16, b"bridge0\0", b"bridge1")], [])],
+        "stats/flow_switch": [("tv_stats_flow_switch", [(16, b"enp0s31f6\0", b"if1")], [])],
+        "stats/userstack": [("tv_stats_userstack", [(16, b"lo0\0", b"lo1")], [])],
+        "stats/flow_adv": [("tv_stats_flow_adv", [(16, b"utun9\0", b"utun1"), (36, struct.pack("<I", 512))], []), *[entry] * 512,
+                           ("tv_stats_flow_adv", [(16, b"utun99\0", b"utun2"), (36, struct.pack("<I", 513))], []), *[(entry[0], [], [(0, 20)])] * 513],
+        "nexus_provider_list": [("nexus_provider_record", [(64, b"com.Browser.10.0.0.7\0", b"provider1"), (128, b"\x14\0\0\0", b"\x09"), (256, b"\1\0\0\0")], []),
+                                ("uuid", [], []),
+                                ("nexus_provider_record", [(64, b"en0\0", b"provider2"), (128, b"\0\0\0\0", b""), (256, b"\0\0\0\0")], [])],
+        "nexus_channel_list": [("nexus_channel_header", [(16, b"\1\0\0\0")], []), ("channel_entry", [(32, b"\1\0\0\0\0\0\0\0")], []), ("ring_stats", [], [])],
+        "stats/arena": [("tv_stats_arena", [(0, b"host.example\0", b"arena1"), *((80 + 208 * i, b"r%d\0" % (i // 2), b"region%d" % (i // 2 + 1)) for i in range(11)),
+                                            (80 + 208 * 11 + 104, bytes(8)), (2584, bytes(4))], [(2368 + 84, 68), (2368 + 168, 40), (2588, 20)])],
     }
 
-    def test_OnlyAddressesAndNamesChangeInEachRecord(self):
+    def test_OnlyWhatTheManualListsSurvives(self):
         noise = random.Random(1)
         for name, records in self.formats.items():
             before = after = b""
-            for size, unread, fields in records:
-                # Neither NULs nor letters, but in fields: texts fill their width, and no word is a name.
-                record = bytearray(noise.choices([*range(1, 48), *range(128, 256)], k=size))
-                expected = bytearray(record)
-                for at, width in unread:
+            for record, fields, gone in records:
+                mask = survives(record)
+                made = bytearray(noise.choices(range(1, 256), k=len(mask)))
+                for at, value, *_ in fields:
+                    made[at:at + len(value)] = value
+                expected = bytearray(byte * kept for byte, kept in zip(made, mask))
+                for at, width in gone:
                     expected[at:at + width] = bytes(width)
-                for at, value, *substitute in fields:
-                    record[at:at + len(value)] = value
-                    expected[at:at + len(value)] = (substitute or [value])[0].ljust(len(value), b"\0")
-                before, after = before + record, after + expected
+                for at, _, substitute in (field for field in fields if len(field) == 3):
+                    expected[at:at + len(substitute)] = substitute
+                before, after = before + made, after + expected
             self.assertEqual(self.redacted({name: before})[name], after, name)
 
-    def test_NamesOfProcessesStandInOtherNamesToo(self):
-        owner = bytes(36) + b"browser".ljust(32, b"\0") + struct.pack("<i", 7) + bytes(56)
-        long = bytes(36) + b"a.long.name.of.all".ljust(32, b"\0") + bytes(60)
-        word = bytes(36) + b"averylongprocessor".ljust(32, b"\0") + bytes(60)
-        names = (b"browser", b"com.browser.3", b"browsers", b"x-browser94/browser", b"a.long.name.of.all.port", b"a.long.name",
-                 "browserX[browser]{browser}browser\u00e9".encode(), b"averylongprocesses.1")
-        shown = (b"process1", b"com.process1.3", b"browsers", b"x-process194/process1", b"process2.port", b"a.long.name",
-                 "browserX[process1]{process1}browser\u00e9".encode(), b"process3.1")
-        arena, provider = bytes(2608), bytes(264)
-        for name, expected in zip(names, shown):
-            seen = self.redacted({"stats/flow_owner": owner + long + word,
-                                  "stats/arena": name.ljust(80, b"\0") + name.ljust(208, b"\0") + arena[288:],
-                                  "nexus_provider_list": bytes(64) + name.ljust(64, b"\0") + struct.pack("<I", len(name)) + provider[132:]})
-            self.assertEqual([text(seen["stats/arena"], at, 64) for at in (0, 80)], [expected.decode()] * 2)
-            self.assertEqual((text(seen["nexus_provider_list"], 64, 64), u32(seen["nexus_provider_list"], 128)), (expected.decode(), len(expected)))
+    def test_ReportsAreTheSameButForSubstitutes(self):
+        kernel, mapped = self.generate(), {}
+        self.capture(kernel.root, "--redact")
+        substitute = re.compile(r"(process|provider|arena|region|en|bridge)\d+|2(40|39)(\.\d+){3}|169\.254(\.\d+){2}|3fff::[\da-f]+|[\da-f:]+:3fff:0:0:[\da-f]+|0[23](:..){5}")
+        for command in commands:
+            live, redacted = (subprocess.run([tarvelctl, *command.split()], capture_output=True, text=True, env={**os.environ, "TARVEL_ROOT": str(root)}).stdout
+                              for root in (kernel.root, self.directory / "saved"))
+            self.assertEqual(live.count("\n"), redacted.count("\n"))
+            for original, shown in zip(live.split(), redacted.split(), strict=True):
+                found = substitute.search(shown)
+                self.assertTrue(shown == original or original.startswith(shown[:found.start()]) and original.endswith(shown[found.end():]), (command, original, shown))
+                self.assertEqual(mapped.setdefault(original, shown), shown)
+        self.assertEqual(len(set(mapped.values())), len(mapped))
 
     def test_WhatCannotBeDecodedIsLeftOut(self):
         secret = b"secret".ljust(64, b"\0")
@@ -359,18 +380,14 @@ class Redact(CaptureTest):
             originals |= {record[at + 16:at + 24] if record[101] == 30 else record[at + 4:at + 8] for at in (72, 100, 128)} | {record[192:198]}
         originals |= {head[:head[16]] for head, _ in made.chains("stats/netns", 32, 18, 32) if head[16]}
         originals = {original for original in originals if any(original[:-1])}  # all but unspecified, and the 1 of fe80::1
-        names = {path.read_bytes().strip() for path in made.root.glob("proc/*/comm")}
+        names = {path.read_bytes().strip() for path in made.root.glob("proc/*/comm")} | {b"com.example"}  # of arenas, ...
         self.assertGreater(len(originals), 100)
-        self.assertGreater(len(names), 10)
+        self.assertGreater(len(names), 11)
         self.assertEqual([(path, found) for path, content in saved.items() for found in originals | names if found in content], [])
         self.assertIn(b"host: redacted\n", saved["capture.txt"])
-        # The same stand for the same, in every table and moment.
+        # The same stand for the same, in every moment.
         for moment in (self.directory / "saved/moments").iterdir():
             self.assertEqual(files(moment / "proc"), files(self.directory / "saved/proc"))
-        for name, size in ("stats/flow", 320), ("stats/flow_owner", 128):
-            for record in self.saved().records(name, size):
-                self.assertEqual(text(record, 36, 32) + "\n", (self.directory / f"saved/proc/{u32(record, 68)}/comm").read_text())
-        self.assertEqual(len({path.read_text() for path in self.directory.glob("saved/proc/*/comm")}), len(names))
 
 
 if __name__ == "__main__":
