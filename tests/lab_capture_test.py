@@ -72,6 +72,13 @@ class Capture(CaptureTest):
         modes = {(p.is_dir(), p.stat().st_mode & 0o777) for p in (self.directory / "saved", *(self.directory / "saved").rglob("*"))}
         self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
 
+    def test_NamesOfProcessesThatNoOneReadsAreNotSaved(self):
+        self.write(f"made/{node_dir}stats/arena", bytes(2576) + struct.pack("<8i", 7, 0, 8, 0, 0, 0, 0, 0))
+        for pid in 7, 8:
+            self.write(f"made/proc/{pid}/comm", b"name\n")
+        self.capture(self.directory / "made")
+        self.assertEqual([path.parent.name for path in self.directory.glob("saved/proc/*/comm")], ["7"])
+
     def test_NothingIsOverwritten(self):
         kernel = self.generate()
         made = files(kernel.root)
