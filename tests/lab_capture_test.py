@@ -362,7 +362,7 @@ class Redact(CaptureTest):
             self.assertEqual(live.count("\n"), redacted.count("\n"))
             for original, shown in zip(live.split(), redacted.split(), strict=True):
                 found = substitute.search(shown)
-                self.assertTrue(shown == original or original.startswith(shown[:found.start()]) and original.endswith(shown[found.end():]), (command, original, shown))
+                self.assertTrue(shown == original or found and original.startswith(shown[:found.start()]) and original.endswith(shown[found.end():]), (command, original, shown))
                 self.assertEqual(mapped.setdefault(original, shown), shown)
         self.assertEqual(len(set(mapped.values())), len(mapped))
 
