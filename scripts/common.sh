@@ -1,6 +1,7 @@
 # shellcheck shell=bash disable=SC2034
 # What the scripts share; sourced, not run. Leaves the caller in the top folder of the repository.
 
+unset CDPATH  # where it names another tree, cd would go there
 cd "$(dirname "${BASH_SOURCE[0]}")/.." || exit
 
 build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase python3)

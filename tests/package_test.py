@@ -44,7 +44,11 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     assert installed == expected, installed ^ expected
 
     os.environ.pop("TARVEL_ROOT", None)
-    shown = run(f"{sources}/scripts/demo", root / "usr/bin")
+    os.environ["CDPATH"] = str(scratch)  # has such a folder too
+    (scratch / "scripts").mkdir()
+    os.chdir(sources)
+    shown = run("scripts/demo", root / "usr/bin")
+    assert not (scratch / "build").exists()
     for sign in f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14", "Proto Local Address", "LISTENER":
         assert sign in shown, f"no {sign} in {shown}"
     page = run("gzip", "-cd", root / "usr/share/man/man1/tarvelctl.1.gz")
