@@ -192,7 +192,13 @@ constexpr struct {
   void (*print)();
 } forms[] = {{"bash", print_bash}, {"zsh", print_zsh}, {"fish", print_fish}, {"words", print_words}};
 
-// Copies the body to standard output. False where it has no place for the tables.
+// Says on standard error what is wrong. Returns false.
+bool complain(const char *about, const char *what) {
+  std::fprintf(stderr, "generate_completions: %s: %s\n", about, what);
+  return false;
+}
+
+// Copies the body to standard output. False, after a message, where it has no place for the tables.
 bool print_script(const char *body, void (*print_tables)()) {
   bool placed = false;
   std::ifstream in(body);
@@ -204,7 +210,7 @@ bool print_script(const char *body, void (*print_tables)()) {
       std::printf("%s\n", line.c_str());
     }
   }
-  return placed;
+  return placed || complain(body, "no line for the tables");
 }
 
 }  // namespace
@@ -213,7 +219,9 @@ int main(int argc, char **argv) {
   for (const auto &form : forms) {
     if (argc < 2 || form.name != argv[1]) continue;
     if (argc == 2) form.print();
-    return argc == 2 || print_script(argv[2], form.print) ? 0 : 1;
+    const bool made = argc == 2 || print_script(argv[2], form.print);
+    const bool written = std::fflush(stdout) == 0 && !std::ferror(stdout);
+    return (written || complain("standard output", "write error")) && made ? 0 : 1;
   }
   std::fprintf(stderr, "usage: generate_completions bash|zsh|fish|words [BODY]\n");
   return 64;

@@ -32,6 +32,8 @@ def options_in(text):
 class Commands(unittest.TestCase):
     def test_EveryCommandHasItsSectionWithItsOptionsAndNoOthers(self):
         program = {}
+        with open("/dev/full", "w") as full:
+            self.assertEqual(subprocess.run([generate_completions, "words"], stdout=full, stderr=subprocess.PIPE).returncode, 1)
         for line in subprocess.check_output([generate_completions, "words"], text=True).splitlines():
             command, *option = line.split()
             program.setdefault(command, set()).update(option)
