@@ -4,11 +4,17 @@
 #define TARVELCTL_LAB_TABLE_FILE_H
 
 #include <cstddef>
+#include <ranges>
 #include <span>
 #include <string>
 #include <type_traits>
 
 namespace lab {
+
+// What is all in its own bytes: neither points to the rest nor is a view of it, as a span is.
+template <class T>
+concept plain_record = std::is_trivially_copyable_v<T> && !std::is_pointer_v<T> && !std::ranges::range<T>;
+static_assert(plain_record<char> && !plain_record<std::span<const char>>);
 
 // A file that is written beside its place and moved there when it is complete. What was never committed
 // leaves nothing behind.
@@ -21,9 +27,8 @@ class table_file {
 
   void put(std::span<const std::byte> bytes);
 
-  template <class Record>
+  template <plain_record Record>
   void put(const Record &record) {
-    static_assert(std::is_trivially_copyable_v<Record>);
     put(std::as_bytes(std::span(&record, 1)));
   }
 
