@@ -234,16 +234,32 @@ int output::abandon() const noexcept {
   return error == EPIPE ? 0 : error;
 }
 
-void attach_diagnostics() {
+namespace {
+
+// Opens standard descriptors that are closed in a way that makes their use fail.
+void take_standard_descriptors() {
   for (int fd = STDIN_FILENO; fd <= STDERR_FILENO; ++fd) {
     if (fcntl(fd, F_GETFD) < 0) open("/dev/null", O_RDONLY | O_CLOEXEC);
   }
-  // The C library writes to standard error too, and would lose what a full pipe does not take at once.
-  const int own = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
-  diagnostics.attach(own < 0 ? STDERR_FILENO : own);
 }
 
+// Where no descriptor is free, the standard one has to do.
+void attach_duplicate(output &to, int fd) {
+  const int own = fcntl(fd, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+  to.attach(own < 0 ? fd : own);
+}
+
+}  // namespace
+
 void attach_standard_outputs() {
-  attach_diagnostics();
+  take_standard_descriptors();
   report.attach(STDOUT_FILENO);
+  // The C library writes to standard error too, and would lose what a full pipe does not take at once.
+  attach_duplicate(diagnostics, STDERR_FILENO);
+}
+
+void attach_own_outputs() {
+  take_standard_descriptors();
+  attach_duplicate(report, STDOUT_FILENO);
+  attach_duplicate(diagnostics, STDERR_FILENO);
 }

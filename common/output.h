@@ -152,8 +152,8 @@ void say_last_words(const Args &...args) {
 // makes their use fail, so that no file opened later can take their place.
 void attach_standard_outputs();
 
-// The same for standard error alone, in a program that leaves standard output as it is. A program that it
-// starts gets its standard descriptors as they were.
-void attach_diagnostics();
+// The same for a program that starts others, with descriptors of their own: those others get their standard
+// descriptors as they were.
+void attach_own_outputs();
 
 #endif

@@ -110,6 +110,7 @@ bool capture_later_moments(const options &asked, std::int64_t began, substitutes
 }  // namespace
 
 int capture(const options &asked) {
+  hold_file_size_signal();
   umask(077);  // others must not see what a privileged user may read
   if (!is_vacant(asked.directory)) return EXIT_FAILURE;
   sigset_t stop{};

@@ -19,6 +19,13 @@ sigset_t block_stop_signals() {
   return stop;
 }
 
+void hold_file_size_signal() {
+  sigset_t file_size;
+  sigemptyset(&file_size);
+  sigaddset(&file_size, SIGXFSZ);
+  sigprocmask(SIG_BLOCK, &file_size, nullptr);
+}
+
 bool stopped_before(std::int64_t due, const sigset_t &stop) {
   for (;;) {
     const std::int64_t wait = due - monotonic_milliseconds();

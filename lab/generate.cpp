@@ -1,8 +1,9 @@
 // generate and simulate: a world in a directory.
 
-#include <cstdio>
 #include <cstdlib>
 
+#include "common/output.h"
+#include "common/text.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
 #include "lab/root_directory.h"
@@ -11,6 +12,7 @@
 namespace lab {
 
 int generate(const options &asked) {
+  hold_file_size_signal();
   root_directory root(asked.directory);
   const bool made =
       root.prepare(0777) && root.remove_processes() && root.publish(make_world(asked.size, asked.seed));
@@ -31,11 +33,12 @@ bool keep_moving(world &state, root_directory &root, std::uint32_t interval, con
 
 int simulate(const options &asked) {
   const sigset_t stop = block_stop_signals();
+  hold_file_size_signal();
   root_directory root(asked.directory);
   world state = make_world(asked.size, asked.seed);
   if (!root.prepare(0777) || !root.remove_processes() || !root.publish(state)) return EXIT_FAILURE;
-  std::printf("simulating in %s\n", asked.directory.c_str());
-  std::fflush(stdout);
+  print<"simulating in %s\n">(foreign_text{asked.directory});
+  report.flush();
   return keep_moving(state, root, asked.interval, stop) ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 

@@ -3,7 +3,7 @@
 #include "lab/command_line.h"
 
 int main(int argc, char **argv) {
-  attach_diagnostics();
+  attach_own_outputs();
   make_new_fail_fast();
   return lab::run_command_line(argc, argv);
 }

@@ -132,10 +132,16 @@ bool start_replay(const std::string &first, const std::vector<captured_moment> &
   });
 }
 
-// Where a program of this name stands beside this one; otherwise empty.
+// Where a program of this name stands beside this one; empty where none does or, after a message, where this
+// one cannot tell its own place.
 std::string beside_this_program(const char *name) {
+  constexpr const char *own = "/proc/self/exe";
   std::error_code error;
-  std::filesystem::path self = std::filesystem::read_symlink("/proc/self/exe", error);
+  std::filesystem::path self = std::filesystem::read_symlink(own, error);
+  if (error) {
+    complain_about(own, error.value());
+    return {};
+  }
   const std::string path = self.replace_filename(name).string();
   return access(path.c_str(), X_OK) == 0 ? path : std::string();
 }
@@ -215,6 +221,7 @@ int run(const options &asked) {
   for (const int signal : passed_on) sigaddset(&signals, signal);
   sigaddset(&signals, SIGCHLD);
   sigprocmask(SIG_BLOCK, &signals, &before);
+  hold_file_size_signal();
   signal(SIGCHLD, SIG_DFL);  // a caller that ignores it would take the command's status with it
 
   std::string given;

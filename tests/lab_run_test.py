@@ -7,6 +7,7 @@ import os
 import pathlib
 import pty
 import resource
+import shutil
 import signal
 import subprocess
 import sys
@@ -70,6 +71,11 @@ class Simulate(LabTest):
             process.terminate()
             self.assertEqual(process.wait(5), 0)
 
+    def test_EndsWhereItsLineCannotBeWritten(self):
+        with open("/dev/full", "w") as full:
+            failed = subprocess.run([lab, "simulate", self.directory], stdout=full, stderr=subprocess.PIPE, timeout=10)
+        self.assertEqual((failed.returncode, failed.stderr), (74, b"write error: No space left on device\n"))
+
     def test_EndsWhereItsDirectoryIsTakenAway(self):
         process, kernel = self.simulate("--interval", "10", stderr=subprocess.PIPE)
         (self.directory / "proc").rename(self.directory / "gone")
@@ -120,6 +126,14 @@ class Run(LabTest):
             os.close(0)  # the loader needs one
             resource.setrlimit(resource.RLIMIT_NOFILE, (3, 3))
         self.assertRegex(run("nope", preexec_fn=leave_no_descriptor).stderr, "^usage:\n")
+    def test_AProgramThatCannotTellItsPlaceHasNoneBesideIt(self):
+        script = "import os, sys\nfor _ in range(20): os.mkdir('x' * 250); os.chdir('x' * 250)\n" \
+                 "os.link(sys.argv[1], 'lab'); open('tarvelctl', 'w').write('#!/bin/sh\\necho seen'); os.chmod('tarvelctl', 0o700)\n" \
+                 "os.execv('./lab', ['lab', 'run', '--', 'tarvelctl'])"
+        copied = shutil.copy(lab, self.directory)
+        seen = subprocess.run([sys.executable, "-c", script, copied], env=self.env, cwd=self.directory, capture_output=True, text=True)
+        self.assertEqual((seen.returncode, seen.stdout), (127, ""))
+        self.assertIn("/proc/self/exe: File name too long", seen.stderr)
 
     def test_ASignalThatCameBeforeTheCommandIsItsEnd(self):
         def signalled():

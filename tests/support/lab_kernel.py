@@ -3,7 +3,6 @@ import os
 import pathlib
 import resource
 import shutil
-import signal
 import struct
 import subprocess
 import sys
@@ -23,7 +22,6 @@ def run(*words, **options):
 
 def limit_files(size):
     """For a process that is about to start: no file grows beyond a size."""
-    signal.signal(signal.SIGXFSZ, signal.SIG_IGN)
     resource.setrlimit(resource.RLIMIT_FSIZE, (size, resource.RLIM_INFINITY))
 
 
