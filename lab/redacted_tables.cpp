@@ -326,10 +326,11 @@ constexpr struct {
 
 }  // namespace
 
-bool redact_table(std::string_view node, std::span<const std::byte> table, substitutes &by,
-                  table_file &file) {
+redaction redact_table(std::string_view node, std::span<const std::byte> table, substitutes &by,
+                       table_file &file) {
   const auto row = std::ranges::find(rows, node, [](const auto &entry) { return entry.node; });
-  return row != std::end(rows) && row->redact(table, by, file);
+  if (row == std::end(rows)) return redaction::unknown;
+  return row->redact(table, by, file) ? redaction::whole : redaction::cut;
 }
 
 }  // namespace lab
