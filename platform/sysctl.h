@@ -24,7 +24,8 @@ extern "C" {
 //   EACCES   the caller may not read it
 //   EISDIR   the name stands for a group of variables
 //   ENOMEM   the buffer is too small for the data; what it holds is then undefined
-//   EPERM    a new value was given: variables can only be read here
+//   EPERM    a new value was given: variables can only be read here; or another kernel is looked at, and this
+//            variable is the live one's
 // and whatever else reading it can fail with. An interrupted read goes on by itself.
 int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, const void *new_value,
                  std::size_t new_length);

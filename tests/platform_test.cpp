@@ -4,6 +4,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <limits.h>
+#include <stdarg.h>
 #include <sys/mman.h>
 #include <sys/prctl.h>
 #include <unistd.h>
@@ -15,6 +16,22 @@
 #include "platform/process.h"
 #include "platform/sysctl.h"
 #include "tests/support/kernel_dir.h"
+
+// Files of the live kernel that fail or are long, under names of variables, and a machine without /proc.
+static bool has_proc = true;
+
+extern "C" int __real_open(const char *path, int flags, ...);
+extern "C" int __wrap_open(const char *path, int flags, ...) {
+  va_list more;
+  va_start(more, flags);
+  const mode_t mode = flags & O_CREAT ? va_arg(more, mode_t) : 0;
+  va_end(more);
+  const std::string_view name(path);
+  if (name == "/proc/sys/kern/broken") path = "/proc/self/mem";
+  if (name == "/proc/sys/kern/long") path = "/proc/self/maps";
+  if (!has_proc && name.starts_with("/proc/")) path = "/none";
+  return __real_open(path, flags, mode);
+}
 
 namespace {
 
@@ -144,10 +161,38 @@ TEST_F(sysctl_test, WithoutALengthTellsWhetherThereIsSuchAVariable) {
   EXPECT_EQ(sysctlbyname("kern.none", nullptr, nullptr, nullptr, 0) == -1 ? errno : 0, ENOENT);
 }
 
+// What is below a root was made by whoever made the root.
+TEST_F(sysctl_test, BelowARootNothingButItsOwnFilesIsOpened) {
+  kernel.table(node, "inside").table("kern.other", "x");
+  write_file(kernel.file("outside/tarvel/stats/flow"), "outside");
+  const auto link = kernel.file("link");
+  std::filesystem::create_symlink(kernel.root(), link);
+  for (const auto &root : {kernel.root(), link}) {  // a link to the root is its caller's choice
+    setenv("TARVEL_ROOT", root.c_str(), 1);
+    EXPECT_EQ(read(node, 10), (answer{0, 6}));
+    for (const bool there : {false, true}) {
+      has_proc = there;
+      EXPECT_EQ(measure("kern.other"), (answer{0, 1}));
+      EXPECT_EQ(measure("kern.none").first, ENOENT);
+      EXPECT_EQ(measure("kern.other.none").first, ENOTDIR);
+    }
+    std::filesystem::create_symlink("other", kernel.table_path("kern.link"));
+    EXPECT_EQ(measure("kern.link").first, ELOOP);
+    remove(kernel.table_path("kern.link"));
+    std::filesystem::rename(kernel.table_path("kern.tarvel"), kernel.file("aside"));
+    std::filesystem::create_symlink(kernel.file("outside/tarvel"), kernel.table_path("kern.tarvel"));
+    EXPECT_EQ(measure(node).first, ENOTDIR);
+    remove(kernel.table_path("kern.tarvel"));
+    std::filesystem::rename(kernel.file("aside"), kernel.table_path("kern.tarvel"));
+  }
+  setenv("TARVEL_ROOT", "/", 1);
+  EXPECT_EQ(process_name(getpid()), "(none)");
+  EXPECT_EQ(measure("kernel.ostype").first, EPERM);
+}
+
 // What cannot be read at its front: no process has memory there.
 TEST_F(sysctl_test, ErrorsOfReadsArePassedOn) {
-  kernel.table("kern.other", "x");
-  std::filesystem::create_symlink("/proc/self/mem", kernel.table_path("kern.broken"));
+  unsetenv("TARVEL_ROOT");
   EXPECT_EQ(measure("kern.broken").first, EIO);
   for (const std::size_t size : {0U, 1U, 100U}) EXPECT_EQ(read("kern.broken", size).first, EIO) << size;
 }
@@ -156,13 +201,11 @@ TEST_F(sysctl_test, LargeFilesNeedNotStateTheirSize) {
   char *const pages =
       static_cast<char *>(mmap(nullptr, 800 * 4096, PROT_READ, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
   for (int i = 0; i < 800; i += 2) mprotect(pages + 4096 * i, 4096, PROT_NONE);
-  kernel.table("kern.other", "x");
-  std::filesystem::create_symlink("/proc/self/maps",
-                                  kernel.table_path("kern.maps"));  // a line for each of them
-  const std::size_t size = measure("kern.maps").second;
+  unsetenv("TARVEL_ROOT");
+  const std::size_t size = measure("kern.long").second;  // a line for each of them
   EXPECT_GT(size, 800 * 40U);
-  EXPECT_EQ(read("kern.maps", size / 2).first, ENOMEM);
-  EXPECT_EQ(read("kern.maps", 2 * size).first, 0);
+  EXPECT_EQ(read("kern.long", size / 2).first, ENOMEM);
+  EXPECT_EQ(read("kern.long", 2 * size).first, 0);
   EXPECT_GT(data.size(), 800 * 40U);
   munmap(pages, 800 * 4096);
 }

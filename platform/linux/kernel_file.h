@@ -1,8 +1,9 @@
 // Files that stand for the kernel's own, on Linux.
 //
 // The environment variable TARVEL_ROOT puts a directory in front of every path, so that a simulated or
-// captured kernel can be looked at. Once it is set, and not empty, nothing falls back to the live machine. It
-// is ignored where the process runs with more rights than its caller.
+// captured kernel can be looked at, whoever made it: below it no link is followed, nothing but a regular file
+// is opened, and no file of the live kernel. Once it is set, and not empty, nothing falls back to the live
+// machine. It is ignored where the process runs with more rights than its caller.
 
 #ifndef TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
 #define TARVELCTL_PLATFORM_LINUX_KERNEL_FILE_H
@@ -18,7 +19,8 @@ namespace platform {
 class kernel_file {
  public:
   // Opens "/proc/" + `path` below the root for reading. Only regular files count: a directory is EISDIR, and
-  // a device or a pipe, which might block or never end, is EINVAL.
+  // a device or a pipe, which might block or never end, is EINVAL. Below a root that is given, a link is ELOOP
+  // or, on the way to the file, ENOTDIR, and what is part of a real /proc is EPERM.
   explicit kernel_file(std::string_view path);
   ~kernel_file();
   kernel_file(const kernel_file &) = delete;
