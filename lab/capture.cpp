@@ -1,16 +1,18 @@
 // capture: the kernel in sight, as a directory to look at elsewhere, at one moment or at several.
 
-#include <sys/stat.h>
 #include <time.h>
 
+#include <algorithm>
+#include <cerrno>
 #include <cstdlib>
-#include <filesystem>
+#include <cstring>
 #include <unordered_set>
 #include <utility>
 #include <vector>
 
 #include "common/kernel_table.h"
 #include "common/output.h"
+#include "common/text.h"
 #include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
@@ -18,6 +20,7 @@
 #include "lab/root_directory.h"
 #include "lab/tables.h"
 #include "platform/process.h"
+#include "platform/sysctl.h"
 
 namespace lab {
 
@@ -64,49 +67,83 @@ snapshot fetch() {
   return taken;
 }
 
-bool save_redacted(root_directory &root, const fetched_table &fetched, substitutes &by) {
+// What has been saved so far.
+struct tally {
+  std::uint32_t moments = 0;
+  std::uint32_t tables = 0;
+  std::uint32_t names = 0;
+  std::uint64_t bytes = 0;
+  bool kernel_was_gone = false;
+};
+
+// Why no table of the kernel in sight can be read, as an error number, or 0.
+int kernel_error() {
+  int error = 0;
+  for (const table &row : tables) {
+    std::size_t length = 0;
+    if (sysctlbyname(row.node, nullptr, &length, nullptr, 0) == 0) return 0;
+    error = errno;
+  }
+  return error;
+}
+
+// Says so, once, where the kernel is not there.
+bool kernel_is_there(tally &saved) {
+  const int error = kernel_error();
+  if (error && !saved.kernel_was_gone) complain<"tarvellab: no table can be read: %s\n">(strerror(error));
+  saved.kernel_was_gone |= error != 0;
+  return !error;
+}
+
+// Writes a table with substitutes. False where there is nothing to keep of it.
+bool put_redacted(const fetched_table &fetched, substitutes &by, table_file &file) {
   const char *node = fetched.source->node;
-  table_file file(root.table_path(node));
   const redaction done = redact_table(node, fetched.content.bytes(), by, file);
   if (done == redaction::unknown) {
     complain<"tarvellab: %s is left out: it is not known how to redact it\n">(node);
-    return true;
+    return false;
   }
   if (done == redaction::cut) {
     complain<"tarvellab: %s is cut: the rest of it cannot be redacted\n">(node);
   }
-  if (const int error = file.commit()) return complain_about(root.table_path(node), error);
   return true;
 }
 
-// Saves a moment below `path`, redacted where there are substitutes.
-bool save(const snapshot &taken, const std::string &path, substitutes *by) {
-  root_directory root(path);
-  if (!root.prepare(0700)) return false;
+// Saves a moment, redacted where there are substitutes.
+bool save(const snapshot &taken, own_directory top, substitutes *by, tally &saved) {
+  root_directory root(std::move(top));
+  if (!root.prepare()) return false;
+  tally with = saved;
   for (const auto &[pid, name] : taken.processes) {
     if (!root.put_process(pid, by ? by->process(name) : name)) return false;
+    ++with.names;
   }
   for (const fetched_table &fetched : taken.tables) {
-    const bool saved = by ? save_redacted(root, fetched, *by)
-                          : root.put_table(fetched.source->node, fetched.content.bytes());
-    if (!saved) return false;
+    table_file file = root.new_table(fetched.source->node);
+    if (by && !put_redacted(fetched, *by, file)) continue;
+    if (!by) file.put(fetched.content.bytes());
+    if (!file.commit()) return false;
+    ++with.tables;
+    with.bytes += file.size();
   }
+  ++with.moments;
+  saved = with;
   return true;
 }
 
 // Takes the moments behind the first, which was taken at `began`, each at its time on the clock, so that none
 // drifts. Those that the machine is too slow for come later, in time with the rest.
-bool capture_later_moments(const options &asked, std::int64_t began, substitutes *by, const sigset_t &stop) {
+bool capture_later_moments(const options &asked, const own_directory &top, std::int64_t began,
+                           substitutes *by, const sigset_t &stop, tally &saved) {
   std::int64_t due = began;
   for (std::uint32_t taken = 1; taken < asked.count; ++taken) {
     const std::int64_t late = std::max<std::int64_t>(monotonic_milliseconds() - due, 0);
     due += (1 + late / asked.every) * asked.every;
     if (stopped_before(due, stop)) return true;
+    if (!kernel_is_there(saved)) continue;
     const std::int64_t offset = monotonic_milliseconds() - began;
-    const std::string path = moment_in_progress(asked.directory);
-    if (save(fetch(), path, by) && finish_moment(asked.directory, offset)) continue;
-    std::error_code ignored;
-    std::filesystem::remove_all(path, ignored);
+    if (save(fetch(), moment_in_progress(top), by, saved) && finish_moment(top, offset)) continue;
+    drop_moment(top);
     return false;
   }
   return true;
@@ -116,23 +153,34 @@ bool capture_later_moments(const options &asked, std::int64_t began, substitutes
 
 int capture(const options &asked) {
   hold_file_size_signal();
-  umask(077);  // others must not see what a privileged user may read
-  if (!is_vacant(asked.directory)) return EXIT_FAILURE;
   sigset_t stop{};
   if (asked.count > 1) stop = block_stop_signals();
+  const bool redacted = asked.redact || shows_redacted_capture();
   const time_t taken = time(nullptr);
   const std::int64_t began = monotonic_milliseconds();
+  tally saved;
+  if (!kernel_is_there(saved)) return EXIT_FAILURE;
   substitutes redaction;
   substitutes *const by = asked.redact ? &redaction : nullptr;
+  own_directory top;
   {
     const snapshot first = fetch();
-    if (first.tables.empty() || !save(first, asked.directory, by)) return EXIT_FAILURE;
+    if (first.tables.empty()) return EXIT_FAILURE;
+    top = make_vacant(asked.directory);
+    if (!top.is_open() || !save(first, top.enter("."), by, saved)) return EXIT_FAILURE;
   }
-  if (!write_note(asked.directory, taken, asked.redact)) return EXIT_FAILURE;
-  if (!asked.redact) {
-    complain<"tarvellab: %s holds addresses and process names; --redact replaces them\n">(asked.directory);
+  if (!write_note(top, taken, redacted)) return EXIT_FAILURE;
+  if (!redacted) {
+    complain<"tarvellab: %s holds addresses and process names; --redact replaces them\n">(
+        foreign_text{asked.directory});
   }
-  return capture_later_moments(asked, began, by, stop) ? EXIT_SUCCESS : EXIT_FAILURE;
+  const bool done = capture_later_moments(asked, top, began, by, stop, saved);
+  const std::uint64_t expected = saved.moments * tables.size();
+  print<"saved in %s: moments %u of %u, tables %u of %llu, names %u, bytes %llu\n">(
+      foreign_text{asked.directory}, saved.moments, std::max(asked.count, 1U), saved.tables, expected,
+      saved.names, saved.bytes);
+  report.flush();
+  return done && !saved.kernel_was_gone && saved.tables == expected ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
 }  // namespace lab

@@ -10,43 +10,35 @@
 #include <cerrno>
 #include <charconv>
 #include <cstdio>
-#include <filesystem>
+#include <cstdlib>
 #include <string_view>
-#include <system_error>
 
 #include "common/output.h"
 #include "common/text.h"
-#include "lab/root_directory.h"
 #include "lab/table_file.h"
 
 namespace lab {
 
 namespace {
 
-namespace fs = std::filesystem;
-
+constexpr char note_name[] = "capture.txt";
+constexpr char moments_name[] = "moments";
+constexpr char unfinished[] = ".new";
 constexpr std::string_view format_version = "1";
 constexpr std::size_t note_size = 4096;  // what is read of a note: far more than one has
 constexpr int deepest = 7;               // folders above moments/1.000/proc/sys/kern/tarvel/stats/flow
 
-std::string note_of(const std::string &directory) {
-  return directory + "/capture.txt";
-}
-
-std::string moments_of(const std::string &directory) {
-  return directory + "/moments";
-}
-
-// Reads a note from whoever made it: no link, no pipe, no more than its beginning. Returns 0 or an error
-// number.
-int read_note(const std::string &path, std::string &text) {
-  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY);
+// Reads the note in a directory from whoever made it: no link, no pipe, no more than its beginning. Returns 0
+// or an error number.
+int read_note(int directory, std::string &text) {
+  struct stat status {};
+  if (fstatat(directory, note_name, &status, AT_SYMLINK_NOFOLLOW) < 0) return errno;
+  if (!S_ISREG(status.st_mode)) return EINVAL;
+  const int fd = openat(directory, note_name, O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY);
   if (fd < 0) return errno;
-  struct stat status;
-  int error = fstat(fd, &status) < 0 ? errno : S_ISREG(status.st_mode) ? 0 : EINVAL;
   text.resize(note_size);
-  const ssize_t got = error ? 0 : read(fd, text.data(), text.size());
-  if (got < 0) error = errno;
+  const ssize_t got = read(fd, text.data(), text.size());
+  const int error = got < 0 ? errno : 0;
   text.resize(got > 0 ? static_cast<std::size_t>(got) : 0);
   close(fd);
   return error;
@@ -72,26 +64,38 @@ bool understands(const std::string &path, std::string_view note) {
   const bool is_number = !version.empty() && version[0] != '0' && is_digits(version);
   if (is_number) {
     complain<"tarvellab: %s: format %s is newer than this program, which knows %s\n">(
-        path, foreign_text{version}, format_version);
+        foreign_text{path}, foreign_text{version}, format_version);
   } else {
-    complain<"tarvellab: %s: does not state the capture's format\n">(path);
+    complain<"tarvellab: %s: does not state the capture's format\n">(foreign_text{path});
   }
   return false;
 }
 
+// Whether a file says that it is large, and takes no room: an archive of a few bytes would fill the memory.
+bool is_hollow(const struct stat &status) {
+  constexpr off_t notable = 16 << 20;
+  constexpr off_t block = 512;
+  return status.st_size > notable && status.st_blocks < status.st_size / (16 * block);
+}
+
 // A capture comes from elsewhere: a link would lead out of it, a device may do something when it is opened,
 // and a chain of folders without end takes memory without end.
-bool holds_only_files(const std::string &directory) {
-  std::error_code error;
-  fs::recursive_directory_iterator entry(directory, error);
-  for (; !error && entry != fs::recursive_directory_iterator(); entry.increment(error)) {
-    const fs::file_type type = entry->symlink_status(error).type();
-    const bool is_folder = type == fs::file_type::directory && entry.depth() < deepest;
-    if (error || type == fs::file_type::regular || is_folder) continue;
-    complain<"tarvellab: %s: no part of a capture\n">(foreign_text{entry->path().native()});
+bool holds_only_files(const own_directory &directory, int depth) {
+  return directory.for_each([&](const std::string &name) {
+    struct stat status {};
+    if (fstatat(directory.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) < 0) {
+      return errno == ENOENT || complain_about(directory.path_of(name), errno);  // a simulation may move on
+    }
+    if (S_ISDIR(status.st_mode) && depth < deepest) {
+      const own_directory below = directory.enter(name);
+      return below.is_open() && holds_only_files(below, depth + 1);
+    }
+    if (S_ISREG(status.st_mode) && !is_hollow(status)) return true;
+    const std::string path = directory.path_of(name);
+    if (S_ISREG(status.st_mode)) complain<"tarvellab: %s: mostly holes\n">(foreign_text{path});
+    if (!S_ISREG(status.st_mode)) complain<"tarvellab: %s: no part of a capture\n">(foreign_text{path});
     return false;
-  }
-  return !error || complain_about(directory, error.value());
+  });
 }
 
 // The milliseconds in "1.000". False for any other form, and beyond what any capture lasts.
@@ -117,54 +121,84 @@ std::string name_of(std::int64_t offset) {
 
 }  // namespace
 
-bool is_vacant(const std::string &directory) {
-  std::error_code error;
-  const bool empty = fs::is_empty(fs::path(directory) / ".", error);
-  if (error == std::errc::no_such_file_or_directory || (!error && empty)) return true;
-  return complain_about(directory, error ? error.value() : ENOTEMPTY);
+own_directory make_vacant(const std::string &path) {
+  own_directory top = own_directory::make(path);
+  bool vacant = true;
+  const bool listed = top.for_each([&](const std::string & /*name*/) { return vacant = false; });
+  if (!vacant) complain_about(path, ENOTEMPTY);
+  if (!listed) return {};
+  if (fchmod(top.fd(), 0700) == 0) return top;
+  complain_about(path, errno);
+  return {};
 }
 
-bool write_note(const std::string &directory, time_t taken, bool redacted) {
+bool write_note(const own_directory &top, time_t taken, bool redacted) {
   tm utc;
   char time[32];
-  std::strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", gmtime_r(&taken, &utc));
+  strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", gmtime_r(&taken, &utc));
   utsname machine{};
   uname(&machine);
   std::string host = redacted ? "redacted" : machine.nodename;
   std::ranges::replace(host, '\n', '?');
   const std::string text = "format: " + std::string(format_version) + "\ntime: " + time + "\nhost: " + host +
                            "\nredacted: " + (redacted ? "yes" : "no") + "\n";
-  table_file file(note_of(directory));
+  table_file file(top.enter("."), note_name);
   file.put(std::as_bytes(std::span(text)));
-  if (const int error = file.commit()) return complain_about(note_of(directory), error);
-  return true;
+  return file.commit();
 }
 
-std::string moment_in_progress(const std::string &directory) {
-  return moments_of(directory) + "/.new";
+own_directory moment_in_progress(const own_directory &top) {
+  return top.make_below(moments_name).make_below(unfinished);
 }
 
-bool finish_moment(const std::string &directory, std::int64_t offset) {
-  const std::string path = moments_of(directory) + "/" + name_of(offset);
-  return std::rename(moment_in_progress(directory).c_str(), path.c_str()) == 0 || complain_about(path, errno);
+bool finish_moment(const own_directory &top, std::int64_t offset) {
+  const own_directory moments = top.enter(moments_name);
+  return moments.is_open() && moments.rename(unfinished, name_of(offset));
 }
 
-bool find_moments(const std::string &directory, std::vector<captured_moment> &found) {
-  std::string note;
-  const int error = read_note(note_of(directory), note);
-  if (error == ENOENT || error == ENOTDIR) return true;
-  if (error) return complain_about(note_of(directory), error);
-  if (!understands(note_of(directory), note)) return false;
-  if (!holds_only_files(directory)) return false;
-  std::error_code ignored;
-  fs::directory_iterator entry(moments_of(directory), ignored);
-  for (; entry != fs::directory_iterator(); entry.increment(ignored)) {
-    std::int64_t offset = 0;
-    const bool is_moment = parse_offset(entry->path().filename().string(), offset);
-    if (is_moment && entry->is_directory(ignored)) found.push_back({offset, entry->path().string()});
+void drop_moment(const own_directory &top) {
+  top.enter(moments_name).remove(unfinished);
+}
+
+bool shows_redacted_capture() {
+  const char *root = secure_getenv("TARVEL_ROOT");
+  // A moment lies two directories below the note.
+  for (const char *top : {"/", "/../.."}) {
+    const int fd = open(std::string(root ? root : "").append(top).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
+    std::string note;
+    const bool found = fd >= 0 && read_note(fd, note) == 0;
+    if (fd >= 0) close(fd);
+    if (found && root) return value_of(note, "redacted: ") == "yes";
   }
-  std::ranges::sort(found, {}, &captured_moment::offset);
-  return true;
+  return false;
+}
+
+bool look_into(const own_directory &top, captured &found) {
+  std::string note;
+  const int error = read_note(top.fd(), note);
+  if (error == ENOENT) {
+    const own_directory kernel = top.enter("proc");
+    return kernel.is_open() && holds_only_files(kernel, 1);
+  }
+  const std::string path = top.path_of(note_name);
+  if (error) return complain_about(path, error);
+  if (!understands(path, note) || !holds_only_files(top, 0)) return false;
+  found.is_capture = true;
+  found.host = value_of(note, "host: ");
+  found.time = value_of(note, "time: ");
+  if (faccessat(top.fd(), moments_name, F_OK, 0) != 0) return true;
+  const own_directory moments = top.enter(moments_name);
+  const bool listed = moments.for_each([&](const std::string &name) {
+    std::int64_t offset = 0;
+    struct stat status {};
+    const bool is_moment = parse_offset(name, offset) &&
+                           fstatat(moments.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+                           S_ISDIR(status.st_mode);
+    if (is_moment) found.later.push_back({offset, moments.path_of(name)});
+    return true;
+  });
+  std::ranges::sort(found.later, {}, &captured_moment::offset);
+  return listed;
 }
 
 }  // namespace lab

@@ -15,6 +15,8 @@
 #include <string>
 #include <vector>
 
+#include "lab/own_directory.h"
+
 namespace lab {
 
 struct captured_moment {
@@ -22,22 +24,35 @@ struct captured_moment {
   std::string path;     // its root
 };
 
-// Whether a capture may be made in `directory`: there is nothing there, or an empty directory. Like all
-// below, returns false after a message on standard error.
-bool is_vacant(const std::string &directory);
+// What a directory has of a capture: nothing where it is none.
+struct captured {
+  bool is_capture = false;
+  std::string host;
+  std::string time;                    // of the first moment
+  std::vector<captured_moment> later;  // behind the first, in order
+};
+
+// Makes a directory for a capture, for its owner only. It may be there where it is empty. Like all below,
+// says on standard error what fails.
+own_directory make_vacant(const std::string &path);
 
 // Writes capture.txt, which makes a capture of the directory, with the time of its first moment and, unless
 // redacted, the name of this machine.
-bool write_note(const std::string &directory, time_t taken, bool redacted);
+bool write_note(const own_directory &top, time_t taken, bool redacted);
 
-// Where a moment is put together, hidden, and its move to its place when it is complete.
-std::string moment_in_progress(const std::string &directory);
-bool finish_moment(const std::string &directory, std::int64_t offset);
+// Where a moment is put together, hidden, and its move to its place when it is complete, or its end.
+own_directory moment_in_progress(const own_directory &top);
+bool finish_moment(const own_directory &top, std::int64_t offset);
+void drop_moment(const own_directory &top);
 
-// Finds the moments of a capture behind the first, in order; what is no moment does not count. There are none
-// where the directory is no capture. False where it is one of a format that this program does not know, or
-// holds more than files and directories, or directories below those of the tables.
-bool find_moments(const std::string &directory, std::vector<captured_moment> &found);
+// Whether the kernel in sight is that of a redacted capture.
+bool shows_redacted_capture();
+
+// Finds what there is of a capture; what is no moment does not count. False where the capture is one of a
+// format that this program does not know. False also where someone else might change what a reader sees, or
+// sent what would change it: where the capture, or else the kernel, holds more than files and directories, or
+// directories below those of the tables, or files that are nothing but large.
+bool look_into(const own_directory &top, captured &found);
 
 }  // namespace lab
 

@@ -13,9 +13,9 @@ namespace lab {
 
 int generate(const options &asked) {
   hold_file_size_signal();
-  root_directory root(asked.directory);
+  root_directory root(own_directory::make(asked.directory));
   const bool made =
-      root.prepare(0777) && root.remove_processes() && root.publish(make_world(asked.size, asked.seed));
+      root.prepare() && root.remove_processes() && root.publish(make_world(asked.size, asked.seed));
   return made ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
@@ -34,9 +34,9 @@ bool keep_moving(world &state, root_directory &root, std::uint32_t interval, con
 int simulate(const options &asked) {
   const sigset_t stop = block_stop_signals();
   hold_file_size_signal();
-  root_directory root(asked.directory);
+  root_directory root(own_directory::make(asked.directory));
   world state = make_world(asked.size, asked.seed);
-  if (!root.prepare(0777) || !root.remove_processes() || !root.publish(state)) return EXIT_FAILURE;
+  if (!root.prepare() || !root.remove_processes() || !root.publish(state)) return EXIT_FAILURE;
   print<"simulating in %s\n">(foreign_text{asked.directory});
   report.flush();
   return keep_moving(state, root, asked.interval, stop) ? EXIT_SUCCESS : EXIT_FAILURE;

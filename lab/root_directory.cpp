@@ -1,92 +1,71 @@
 #include "lab/root_directory.h"
 
-#include <dirent.h>
-#include <sys/stat.h>
+#include <fcntl.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <cstdlib>
-#include <cstring>
+#include <charconv>
 
-#include "common/output.h"
 #include "lab/programs.h"
-#include "lab/table_file.h"
 #include "lab/tables.h"
 
 namespace lab {
 
 namespace {
 
-// Makes a directory and those above it. Returns 0 or an error number.
-int make_directories(const std::string &path, mode_t mode) {
-  if (mkdir(path.c_str(), mode) == 0 || errno == EEXIST) return 0;
-  const std::size_t slash = path.rfind('/');
-  if (errno != ENOENT || slash == 0 || slash == path.npos) return errno;
-  if (const int error = make_directories(path.substr(0, slash), 0777)) return error;
-  return mkdir(path.c_str(), mode) == 0 || errno == EEXIST ? 0 : errno;
+using step = own_directory (own_directory::*)(const std::string &) const;
+
+constexpr char processes_name[] = "proc";
+
+// The folder of a table's file, proc/sys/kern/tarvel/stats for kern.tarvel.stats.flow; `go` enters or makes
+// each on the way.
+own_directory folder_of(std::string_view node, const own_directory &top, step go) {
+  own_directory folder = ((top.*go)(processes_name).*go)("sys");
+  for (std::size_t dot; (dot = node.find('.')) != node.npos; node.remove_prefix(dot + 1)) {
+    folder = (folder.*go)(std::string(node.substr(0, dot)));
+  }
+  return folder;
 }
 
-// Of a name, which is not empty.
-bool is_number(const char *text) {
-  return text[std::strspn(text, "0123456789")] == '\0';
+// Whether this is how a process id is written: what only begins like one may be out of its range.
+bool is_pid(const std::string &name) {
+  std::int32_t pid = 0;
+  std::from_chars(name.data(), name.data() + name.size(), pid);
+  return pid > 0 && std::to_string(pid) == name;
+}
+
+bool remove_name(const own_directory &processes, const std::string &pid) {
+  const own_directory process = processes.enter(pid);
+  if (!process.is_open()) return false;
+  unlinkat(process.fd(), "comm", 0);
+  unlinkat(processes.fd(), pid.c_str(), AT_REMOVEDIR);
+  return true;
 }
 
 }  // namespace
 
-bool complain_about(const std::string &path, int error) {
-  complain<"tarvellab: %s: %s\n">(path, strerror(error));
-  return false;
-}
-
-std::string root_directory::table_path(std::string_view node) const {
-  std::string path = path_ + "/proc/sys/";
-  for (const char c : node) path += c == '.' ? '/' : c;
-  return path;
-}
-
-bool root_directory::prepare(unsigned mode) {
-  if (const int error = make_directories(path_, mode)) return complain_about(path_, error);
+bool root_directory::prepare() {
   for (const table &row : tables) {
-    const std::string path = table_path(row.node);
-    const std::string folder = path.substr(0, path.rfind('/'));
-    if (const int error = make_directories(folder, 0777)) return complain_about(folder, error);
+    if (!folder_of(row.node, top_, &own_directory::make_below).is_open()) return false;
   }
   return true;
 }
 
 bool root_directory::remove_processes() {
-  const std::string processes = path_ + "/proc";
-  DIR *listing = opendir(processes.c_str());
-  if (!listing) return complain_about(processes, errno);
-  while (const dirent *entry = readdir(listing)) {
-    if (is_number(entry->d_name))
-      remove_process(static_cast<std::int32_t>(std::strtol(entry->d_name, nullptr, 10)));
-  }
-  closedir(listing);
-  return true;
+  const own_directory processes = top_.enter(processes_name);
+  return processes.for_each(
+      [&](const std::string &name) { return !is_pid(name) || remove_name(processes, name); });
 }
 
-bool root_directory::put_table(std::string_view node, std::span<const std::byte> bytes) {
-  table_file file(table_path(node));
-  file.put(bytes);
-  if (const int error = file.commit()) return complain_about(table_path(node), error);
-  return true;
+table_file root_directory::new_table(std::string_view node) const {
+  const std::string_view name = node.substr(node.rfind('.') + 1);
+  return {folder_of(node, top_, &own_directory::enter), std::string(name)};
 }
 
 bool root_directory::put_process(std::int32_t pid, std::string_view name) {
-  const std::string folder = path_ + "/proc/" + std::to_string(pid);
-  if (const int error = make_directories(folder, 0777)) return complain_about(folder, error);
-  table_file file(folder + "/comm");
+  table_file file(top_.enter(processes_name).make_below(std::to_string(pid)), "comm");
   file.put(std::as_bytes(std::span(name)));
   file.put('\n');
-  if (const int error = file.commit()) return complain_about(folder + "/comm", error);
-  return true;
-}
-
-void root_directory::remove_process(std::int32_t pid) {
-  const std::string folder = path_ + "/proc/" + std::to_string(pid);
-  unlink((folder + "/comm").c_str());
-  rmdir(folder.c_str());
+  return file.commit();
 }
 
 bool root_directory::publish(const world &state) {
@@ -95,11 +74,13 @@ bool root_directory::publish(const world &state) {
     if (!put_process(source.pid, programs[source.program].name)) return false;
   }
   for (const table &row : tables) {
-    table_file file(table_path(row.node));
+    table_file file = new_table(row.node);
     row.write(state, file);
-    if (const int error = file.commit()) return complain_about(table_path(row.node), error);
+    if (!file.commit()) return false;
   }
-  for (const std::int32_t pid : state.ended) remove_process(pid);
+  for (const std::int32_t pid : state.ended) {
+    if (!remove_name(top_.enter(processes_name), std::to_string(pid))) return false;
+  }
   return true;
 }
 

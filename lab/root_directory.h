@@ -3,33 +3,27 @@
 #ifndef TARVELCTL_LAB_ROOT_DIRECTORY_H
 #define TARVELCTL_LAB_ROOT_DIRECTORY_H
 
-#include <cstddef>
 #include <cstdint>
-#include <span>
 #include <string>
 #include <string_view>
 
+#include "lab/own_directory.h"
+#include "lab/table_file.h"
 #include "lab/world.h"
 
 namespace lab {
 
 class root_directory {
  public:
-  explicit root_directory(std::string path) : path_(std::move(path)) {}
+  explicit root_directory(own_directory top) : top_(std::move(top)) {}
 
-  const std::string &path() const { return path_; }
+  // Makes the directories below it. Like all here, returns false after a message on standard error.
+  bool prepare();
 
-  // The file of a kernel table.
-  std::string table_path(std::string_view node) const;
-
-  // Makes the directories, those above included. The root itself gets `mode`, the umask applied, where it is
-  // new. Like all below, returns false after a message on standard error.
-  bool prepare(unsigned mode);
-
-  bool put_table(std::string_view node, std::span<const std::byte> bytes);
+  // What becomes the file of a kernel table.
+  table_file new_table(std::string_view node) const;
 
   bool put_process(std::int32_t pid, std::string_view name);
-  void remove_process(std::int32_t pid);
 
   // Removes all process names, such as those of an earlier use.
   bool remove_processes();
@@ -39,11 +33,8 @@ class root_directory {
   bool publish(const world &state);
 
  private:
-  std::string path_;
+  own_directory top_;
 };
-
-// Says on standard error what failed about `path`. Returns false.
-bool complain_about(const std::string &path, int error);
 
 }  // namespace lab
 

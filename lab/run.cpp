@@ -20,6 +20,7 @@
 #include <vector>
 
 #include "common/output.h"
+#include "common/text.h"
 #include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
@@ -45,22 +46,30 @@ class temporary_directory {
     if (!mkdtemp(path_.data())) {
       complain_about(path_, errno);
       path_.clear();
+    } else {
+      opened_ = own_directory::open(path_);
     }
   }
   ~temporary_directory() { remove(); }
   temporary_directory(const temporary_directory &) = delete;
   temporary_directory &operator=(const temporary_directory &) = delete;
 
+  // Of what is in it nothing is left, whatever its path leads to by now.
   void remove() const {
-    std::error_code ignored;
-    if (!path_.empty()) std::filesystem::remove_all(path_, ignored);
+    if (!opened_.is_open()) return;
+    opened_.for_each([&](const std::string &name) {
+      opened_.remove(name);
+      return true;
+    });
+    rmdir(path_.c_str());
   }
 
-  // Empty where it could not be made.
-  const std::string &path() const { return path_; }
+  // None where it could not be made.
+  const own_directory &opened() const { return opened_; }
 
  private:
   std::string path_;
+  own_directory opened_;
 };
 
 // A child process that keeps the kernel in a temporary directory moving. Ends with its owner.
@@ -100,20 +109,23 @@ class mover {
 
 // Makes a world in the directory and keeps it moving.
 bool start_simulation(const options &asked, const temporary_directory &directory, mover &kernel) {
-  root_directory root(directory.path());
+  root_directory root(directory.opened().enter("."));
   world state = make_world(asked.size, asked.seed);
-  if (!root.prepare(0700) || !root.publish(state)) return false;
+  if (!root.prepare() || !root.publish(state)) return false;
   return kernel.start(directory,
                       [&](const sigset_t &stop) { keep_moving(state, root, asked.interval, stop); });
 }
 
+// The link to the moment that is shown: a reader follows one to the root, and none below it.
+constexpr char shown[] = "moment";
+
 // Puts a moment of a capture into the place of the one before, all of it at once: the files stay where they
 // are.
-bool show(const std::string &moment, const temporary_directory &directory) {
-  const std::string place = directory.path() + "/proc";
-  const std::string next = directory.path() + "/.proc";
-  if (symlink((moment + "/proc").c_str(), next.c_str()) != 0) return complain_about(next, errno);
-  return std::rename(next.c_str(), place.c_str()) == 0 || complain_about(place, errno);
+bool show(const std::string &moment, const own_directory &directory) {
+  constexpr char next[] = ".moment";
+  if (symlinkat(moment.c_str(), directory.fd(), next) != 0)
+    return complain_about(directory.path_of(next), errno);
+  return directory.rename(next, shown);
 }
 
 // Shows the first moment and then the others, at the pace at which they were taken. All come a little earlier
@@ -121,12 +133,13 @@ bool show(const std::string &moment, const temporary_directory &directory) {
 // has their interval reads each once, in the quarters that are left, though it comes later from read to read.
 bool start_replay(const std::string &first, const std::vector<captured_moment> &later,
                   const temporary_directory &directory, mover &kernel) {
-  if (!show(first, directory)) return false;
+  if (!show(first, directory.opened())) return false;
   const std::int64_t began = monotonic_milliseconds() - later[0].offset / 4;
   return kernel.start(directory, [&](const sigset_t &stop) {
     for (const captured_moment &moment : later) {
-      if (stopped_before(began + moment.offset, stop) || !show(moment.path, directory)) return;
+      if (stopped_before(began + moment.offset, stop) || !show(moment.path, directory.opened())) return;
     }
+    complain<"tarvellab: the last moment is shown\n">();
     int signal;
     sigwait(&stop, &signal);
   });
@@ -212,6 +225,19 @@ int early_signal(const sigset_t &signals) {
   }
 }
 
+// Finds what there is in the directory that was named, says whose it is, and stores where it really lies.
+bool open_given(const std::string &name, std::string &root, captured &found) {
+  std::error_code error;
+  root = std::filesystem::canonical(name, error);
+  if (error) return complain_about(name, error.value());
+  const own_directory top = own_directory::open(root);
+  if (!top.is_open() || !look_into(top, found)) return false;
+  if (found.is_capture) {
+    complain<"tarvellab: this is %s at %s\n">(foreign_text{found.host}, foreign_text{found.time});
+  }
+  return true;
+}
+
 }  // namespace
 
 int run(const options &asked) {
@@ -224,25 +250,23 @@ int run(const options &asked) {
   hold_file_size_signal();
   signal(SIGCHLD, SIG_DFL);  // a caller that ignores it would take the command's status with it
 
-  std::string given;
-  std::vector<captured_moment> later;
+  std::string root;
+  captured found;
   if (!asked.directory.empty()) {
-    std::error_code error;
-    given = std::filesystem::canonical(asked.directory, error);
-    if (error) complain_about(asked.directory, error.value());
-    if (error || !find_moments(given, later)) return EXIT_FAILURE;
-    if (later.empty()) return end_like(run_command(asked.command, given, signals, before));
+    if (!open_given(asked.directory, root, found)) return EXIT_FAILURE;
+    if (found.later.empty()) return end_like(run_command(asked.command, root, signals, before));
   }
   int status;
   {
     const temporary_directory directory;
-    if (directory.path().empty()) return EXIT_FAILURE;
+    if (!directory.opened().is_open()) return EXIT_FAILURE;
     mover kernel;
-    const bool started = given.empty() ? start_simulation(asked, directory, kernel)
-                                       : start_replay(given, later, directory, kernel);
+    const bool started = root.empty() ? start_simulation(asked, directory, kernel)
+                                      : start_replay(root, found.later, directory, kernel);
     if (!started) return EXIT_FAILURE;
+    root = root.empty() ? directory.opened().path() : directory.opened().path_of(shown);
     const int early = early_signal(signals);
-    status = early ? W_EXITCODE(0, early) : run_command(asked.command, directory.path(), signals, before);
+    status = early ? W_EXITCODE(0, early) : run_command(asked.command, root, signals, before);
   }
   return end_like(status);
 }

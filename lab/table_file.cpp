@@ -4,7 +4,7 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdio>
+#include <cstdint>
 #include <utility>
 
 namespace lab {
@@ -14,27 +14,31 @@ namespace {
 constexpr std::size_t flush_size = 256 * 1024;
 
 // Hidden, and no other writer's: two simulations of one directory do not spoil each other's files.
-std::string temporary_path(const std::string &path) {
-  const std::size_t name = path.rfind('/') + 1;
-  return path.substr(0, name) + "." + path.substr(name) + "." + std::to_string(getpid());
+std::string temporary_name(const std::string &name) {
+  std::uint64_t number = 0;
+  getentropy(&number, sizeof number);
+  return "." + name + "." + std::to_string(number);
 }
 
 }  // namespace
 
-table_file::table_file(std::string path)
-    : path_(std::move(path)),
-      temporary_(temporary_path(path_)),
-      fd_(open(temporary_.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, 0666)) {
+table_file::table_file(own_directory folder, std::string name)
+    : folder_(std::move(folder)),
+      name_(std::move(name)),
+      temporary_(temporary_name(name_)),
+      fd_(openat(folder_.fd(), temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
+                 0600)) {
   if (fd_ < 0) error_ = errno;
 }
 
 table_file::~table_file() {
   if (fd_ < 0) return;
   close(fd_);
-  unlink(temporary_.c_str());
+  folder_.remove(temporary_);
 }
 
 void table_file::put(std::span<const std::byte> bytes) {
+  size_ += bytes.size();
   buffer_.append(reinterpret_cast<const char *>(bytes.data()), bytes.size());
   if (buffer_.size() >= flush_size) flush();
 }
@@ -51,15 +55,15 @@ void table_file::flush() {
   buffer_.clear();
 }
 
-int table_file::commit() {
+bool table_file::commit() {
+  if (!folder_.is_open()) return false;
   flush();
-  if (error_) return error_;
-  const bool closed = close(fd_) == 0;
+  if (error_) return complain_about(folder_.path_of(name_), error_);
+  const bool closed = close(fd_) == 0 || complain_about(folder_.path_of(name_), errno);
   fd_ = -1;
-  if (closed && std::rename(temporary_.c_str(), path_.c_str()) == 0) return 0;
-  const int error = errno;
-  unlink(temporary_.c_str());
-  return error;
+  if (closed && folder_.rename(temporary_, name_)) return true;
+  folder_.remove(temporary_);
+  return false;
 }
 
 }  // namespace lab

@@ -9,6 +9,8 @@
 #include <string>
 #include <type_traits>
 
+#include "lab/own_directory.h"
+
 namespace lab {
 
 // What is all in its own bytes: neither points to the rest nor is a view of it, as a span is.
@@ -16,11 +18,11 @@ template <class T>
 concept plain_record = std::is_trivially_copyable_v<T> && !std::is_pointer_v<T> && !std::ranges::range<T>;
 static_assert(plain_record<char> && !plain_record<std::span<const char>>);
 
-// A file that is written beside its place and moved there when it is complete. What was never committed
-// leaves nothing behind.
+// A file, for its owner only, that is written beside its place and moved there when it is complete. What was
+// never committed leaves nothing behind.
 class table_file {
  public:
-  explicit table_file(std::string path);
+  table_file(own_directory folder, std::string name);
   ~table_file();
   table_file(const table_file &) = delete;
   table_file &operator=(const table_file &) = delete;
@@ -32,16 +34,21 @@ class table_file {
     put(std::as_bytes(std::span(&record, 1)));
   }
 
-  // Moves the file to its place. Returns 0, or the error number of the first thing that failed, after which
-  // the place is as it was.
-  int commit();
+  // The bytes put so far.
+  std::size_t size() const { return size_; }
+
+  // Moves the file to its place. False, with the place as it was, after a message about the first thing that
+  // failed.
+  bool commit();
 
  private:
   void flush();
 
-  std::string path_;
+  own_directory folder_;
+  std::string name_;
   std::string temporary_;
   std::string buffer_;
+  std::size_t size_ = 0;
   int fd_;
   int error_ = 0;
 };

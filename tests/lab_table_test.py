@@ -121,15 +121,15 @@ class Generate(LabTest):
         flow, comm, made = node_dir + "stats/flow", "proc/94/comm", self.directory / "made"
         link = functools.partial(os.symlink, "nowhere")
         for path, make, named, reason in (
-                (flow, os.mkdir, flow, "Is a directory"), (comm, os.mkdir, comm, "Is a directory"),
-                ("proc/94", link, comm, "No such file or directory"), ("proc", pathlib.Path.touch, node_dir[:-1], "Not a directory"),
-                ("proc", link, node_dir[:-1], "No such file or directory"), ("", pathlib.Path.touch, node_dir[:-1], "Not a directory")):
+                (flow, os.mkdir, "/" + flow, "Is a directory"), (comm, os.mkdir, "/" + comm, "Is a directory"),
+                *(("/".join(path), make, "/".join(["", *path]), "Not a directory") for path in (["proc", "94"], ["proc"], [])
+                  for make in (link, pathlib.Path.touch))):
             for command in "generate", "simulate":
                 (made / path).parent.mkdir(parents=True, exist_ok=True)
                 make(made / path)
                 failed = run(command, made)
-                self.assertEqual((failed.returncode, failed.stdout, failed.stderr), (1, "", f"tarvellab: {made}/{named}: {reason}\n"))
-                made.unlink() if made.is_file() else shutil.rmtree(made)
+                self.assertEqual((failed.returncode, failed.stdout, failed.stderr), (1, "", f"tarvellab: {made}{named}: {reason}\n"))
+                made.unlink() if made.is_file() or made.is_symlink() else shutil.rmtree(made)
         for size, named in (0, "proc/\\d+/comm"), (1000, node_dir + ".*"):
             failed = run("generate", made, preexec_fn=functools.partial(limit_files, size))
             self.assertEqual(failed.returncode, 1)
