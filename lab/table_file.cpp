@@ -16,7 +16,7 @@ constexpr std::size_t flush_size = 256 * 1024;
 // Hidden, and no other writer's: two simulations of one directory do not spoil each other's files.
 std::string temporary_name(const std::string &name) {
   std::uint64_t number = 0;
-  getentropy(&number, sizeof number);
+  if (getentropy(&number, sizeof number) != 0) number = static_cast<std::uint64_t>(getpid());
   return "." + name + "." + std::to_string(number);
 }
 

@@ -43,6 +43,11 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     installed = {str(path.relative_to(root / "usr")) for path in root.glob("usr/**/*") if not path.is_dir()}
     assert installed == expected, installed ^ expected
 
+    for program in "tarvelctl", "tarvellab":
+        hardened = run("readelf", "--wide", "--program-headers", "--dynamic", "--dyn-syms", root / "usr/bin" / program)
+        for sign in "GNU_RELRO", "BIND_NOW", "__stack_chk_fail", "__snprintf_chk":
+            assert sign in hardened, f"{program}: no {sign}"
+
     os.environ.pop("TARVEL_ROOT", None)
     os.environ["CDPATH"] = str(scratch)  # has such a folder too
     (scratch / "scripts").mkdir()
