@@ -161,14 +161,16 @@ void drop_moment(const own_directory &top) {
 }
 
 bool shows_redacted_capture() {
-  const char *root = secure_getenv("TARVEL_ROOT");
+  const char *given = secure_getenv("TARVEL_ROOT");
+  if (!given || !*given) return false;
   // A moment lies two directories below the note.
-  for (const char *top : {"/", "/../.."}) {
-    const int fd = open(std::string(root ? root : "").append(top).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
+  for (const char *top : {"", "/../.."}) {
+    const int fd = open((given + std::string(top)).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
+    if (fd < 0) return false;
     std::string note;
-    const bool found = fd >= 0 && read_note(fd, note) == 0;
-    if (fd >= 0) close(fd);
-    if (found && root) return value_of(note, "redacted: ") == "yes";
+    const bool is_redacted = read_note(fd, note) == 0 && value_of(note, "redacted: ") == "yes";
+    close(fd);
+    if (is_redacted) return true;
   }
   return false;
 }
