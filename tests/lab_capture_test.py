@@ -30,6 +30,7 @@ class CaptureTest(LabTest):
     def capture(self, root, *words, name="saved", status=0, **options):
         saved = run("capture", *words, self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)}, **options)
         self.assertEqual(saved.returncode, status, saved.stderr)
+        self.printed = saved.stdout
         return saved.stderr
 
     def saved(self, name="saved"):
@@ -71,6 +72,8 @@ class Capture(CaptureTest):
         self.assertEqual(note, {"format": "1", "host": os.uname().nodename, "redacted": "no"})
         mentioned = {f"proc/{pid}/comm" for pid in kernel.pids()}
         self.assertEqual(saved, {name: made[name] for name in made if "comm" not in name or name in mentioned})
+        sizes = [len(content) for name, content in saved.items() if "comm" not in name]
+        self.assertEqual(self.printed, f"saved in {self.directory}/saved: moments 1 of 1, tables 12 of 12, names {len(saved) - 12}, bytes {sum(sizes)}\n")
         modes = {(p.is_dir(), p.stat().st_mode & 0o777) for p in (self.directory / "saved", *(self.directory / "saved").rglob("*"))}
         self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
 
@@ -88,13 +91,15 @@ class Capture(CaptureTest):
         self.assertEqual(files(kernel.root), made)
         self.write("file")
         self.assertIn("Not a directory", self.capture(kernel.root, name="file", status=1))
-        (self.directory / "empty").mkdir()
+        (self.directory / "empty").mkdir(0o755)
         self.capture(kernel.root, name="empty")
+        self.assertEqual((self.directory / "empty").stat().st_mode & 0o777, 0o700)
 
     def test_MissingTablesAreLeftOut(self):
         kernel = self.generate()
         (kernel.root / node_dir / "stats/flow").unlink()
         self.assertIn("kern.tarvel.stats.flow is left out", self.capture(kernel.root, status=1))
+        self.assertIn("tables 11 of 12", self.printed)
         self.assertEqual(files(self.directory / "saved").keys() & {node_dir + "stats/flow"}, set())
         errors = self.capture(self.directory / "empty", name="nothing", status=1)
         self.assertEqual(errors, "tarvellab: no table can be read: No such file or directory\n")
@@ -124,11 +129,13 @@ class Capture(CaptureTest):
     def test_AMomentThatDoesNotFitEndsItAndLeavesTheOthers(self):
         small, saved = self.directory / "small", self.directory / "saved"
         self.write(f"small/{node_dir}ring_stat_enable", b"\1")
-        capture = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", saved], stderr=subprocess.PIPE, text=True,
-                                   env={**os.environ, "TARVEL_ROOT": str(small)}, preexec_fn=lambda: limit_files(1000))
+        capture = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", saved], stdout=subprocess.PIPE, stderr=subprocess.PIPE,
+                                   text=True, env={**os.environ, "TARVEL_ROOT": str(small)}, preexec_fn=lambda: limit_files(1000))
         self.wait_for(lambda: len(list(saved.glob("moments/[0-9]*"))) > 1)
         self.write(f"small/{node_dir}stats/flow", bytes(3200))
-        self.assertIn("File too large", capture.communicate(timeout=10)[1])
+        printed, errors = capture.communicate(timeout=10)
+        self.assertIn("File too large", errors)
+        self.assertRegex(printed, "^saved in .*: moments (\\d+) of 1000, tables \\1 of \\d+, names 0, bytes \\1\n$")
         self.assertEqual(capture.returncode, 1)
         self.assertEqual([name for name in files(saved) if "/." in name], [])
 
@@ -170,7 +177,7 @@ class Moments(CaptureTest):
             self.assertGreater(len(list(Kernel(root).channels())), 10)
             self.assertGreater(len(list(root.glob("proc/*/comm"))), 5)
         long = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", self.directory / "long"],
-                                stderr=subprocess.DEVNULL, env={**os.environ, "TARVEL_ROOT": str(self.directory / "made")})
+                                stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL, env={**os.environ, "TARVEL_ROOT": str(self.directory / "made")})
         self.wait_for(lambda: len(list(self.directory.glob("long/moments/[0-9]*"))) > 2)
         long.send_signal(signal.SIGINT)
         self.assertEqual(long.wait(5), 0)
@@ -202,16 +209,32 @@ class Moments(CaptureTest):
         watch = self.replay("timeout", "--preserve-status", "-s", "INT", "4.4", tarvelctl, "-w", "1", "channel")
         self.assertEqual([line.split()[3] for line in watch.stdout.splitlines() if line.startswith("TX[0]")][:3], ["1.00K", "4.00K", "9.00K"])
 
-    def test_AReplayDoesNotOutliveAKilledRun(self):
-        self.make()
-        self.moment("0.100", b"later\n")
-        script = "until grep -q later $TARVEL_ROOT/proc/94/comm; do sleep 0.01; done; echo $$; exec sleep 60"
-        process, child = self.start("run", self.directory / "made", "--", "sh", "-c", script,
-                                    env={**os.environ, "TMPDIR": str(self.directory)})
-        process.kill()
-        process.wait()
-        os.kill(int(child), signal.SIGKILL)
-        self.wait_for(lambda: not list(self.directory.glob("tarvellab-*")))
+    def test_AKernelThatGoesAwayIsMissed(self):
+        capture = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "8", self.directory / "saved"], stdout=subprocess.PIPE,
+                                   stderr=subprocess.PIPE, text=True, env={**os.environ, "TARVEL_ROOT": str(self.make().root)})
+        self.wait_for(lambda: (self.directory / "saved/moments").exists())
+        (self.directory / "made").rename(self.directory / "gone")
+        printed, errors = capture.communicate(timeout=10)
+        self.assertEqual(errors.splitlines()[1:], ["tarvellab: no table can be read: No such file or directory"])
+        self.assertRegex(printed, "moments [2-7] of 8, tables (24|36|48|60|72|84) of \\1, ")
+        self.assertEqual(capture.returncode, 1)
+
+    def test_WhatWasRedactedStaysRedacted(self):
+        self.capture(self.generate().root, "--redact", "--every", "0.01", "--count", 2)
+        for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
+            self.assertEqual(self.capture(root, name=f"again {root.name}"), "")
+            self.assertRegex((self.directory / f"again {root.name}/capture.txt").read_text(), "host: redacted\nredacted: yes\n$")
+
+    def test_PathsDoNotDriveTheTerminal(self):
+        (self.directory / "named").symlink_to("\x1b[2Jthere")
+        (self.directory / "\x1b[2Jthere/proc/\x9b1m").mkdir(parents=True)
+        (self.directory / "\x1b[2Jthere/proc/\x9b1m/link").symlink_to(".")
+        mine, terminal = pty.openpty()
+        for words in ("run", "named", "--", "true"), ("generate", "/proc/\x1b]0;x\x07"):
+            subprocess.run([lab, *words], cwd=self.directory, stderr=terminal)
+        seen = os.read(mine, 10000)
+        self.assertIn(b"/?[2Jthere/proc/", seen)
+        self.assertEqual(set(b"\x1b\x07\x9b") & set(seen), set())
 
     def test_OtherFormatsAreRefused(self):
         kernel = self.make()
