@@ -53,20 +53,6 @@ void fetch_processes(snapshot &taken) {
   }
 }
 
-snapshot fetch() {
-  snapshot taken;
-  for (const table &row : tables) {
-    fetched_table fetched{&row, {}};
-    if (fetched.content.fetch(row.node)) {
-      complain<"tarvellab: %s is left out\n">(row.node);
-    } else {
-      taken.tables.push_back(std::move(fetched));
-    }
-  }
-  fetch_processes(taken);
-  return taken;
-}
-
 // What has been saved so far.
 struct tally {
   std::uint32_t moments = 0;
@@ -93,6 +79,24 @@ bool kernel_is_there(tally &saved) {
   if (error && !saved.kernel_was_gone) complain<"tarvellab: no table can be read: %s\n">(strerror(error));
   saved.kernel_was_gone |= error != 0;
   return !error;
+}
+
+// What the kernel shows now: nothing where it is not there, or goes away meanwhile.
+snapshot fetch(tally &saved) {
+  snapshot taken;
+  if (!kernel_is_there(saved)) return taken;
+  for (const table &row : tables) {
+    fetched_table fetched{&row, {}};
+    if (fetched.content.fetch(row.node) == 0) {
+      taken.tables.push_back(std::move(fetched));
+    } else if (kernel_is_there(saved)) {
+      complain<"tarvellab: %s is left out\n">(row.node);
+    } else {
+      return {};
+    }
+  }
+  fetch_processes(taken);
+  return taken;
 }
 
 // Writes a table with substitutes. False where there is nothing to keep of it.
@@ -140,9 +144,10 @@ bool capture_later_moments(const options &asked, const own_directory &top, std::
     const std::int64_t late = std::max<std::int64_t>(monotonic_milliseconds() - due, 0);
     due += (1 + late / asked.every) * asked.every;
     if (stopped_before(due, stop)) return true;
-    if (!kernel_is_there(saved)) continue;
     const std::int64_t offset = monotonic_milliseconds() - began;
-    if (save(fetch(), moment_in_progress(top), by, saved) && finish_moment(top, offset)) continue;
+    const snapshot next = fetch(saved);
+    if (next.tables.empty()) continue;
+    if (save(next, moment_in_progress(top), by, saved) && finish_moment(top, offset)) continue;
     drop_moment(top);
     return false;
   }
@@ -159,12 +164,11 @@ int capture(const options &asked) {
   const time_t taken = time(nullptr);
   const std::int64_t began = monotonic_milliseconds();
   tally saved;
-  if (!kernel_is_there(saved)) return EXIT_FAILURE;
   substitutes redaction;
   substitutes *const by = asked.redact ? &redaction : nullptr;
   own_directory top;
   {
-    const snapshot first = fetch();
+    const snapshot first = fetch(saved);
     if (first.tables.empty()) return EXIT_FAILURE;
     top = make_vacant(asked.directory);
     if (!top.is_open() || !save(first, top.enter("."), by, saved)) return EXIT_FAILURE;

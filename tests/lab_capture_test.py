@@ -78,6 +78,7 @@ class Capture(CaptureTest):
         self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
 
     def test_NamesOfProcessesThatNoOneReadsAreNotSaved(self):
+        self.generate("--processes", "0")
         self.write(f"made/{node_dir}stats/arena", bytes(2576) + struct.pack("<8i", 7, 0, 8, 0, 0, 0, 0, 0))
         for pid in 7, 8:
             self.write(f"made/proc/{pid}/comm", b"name\n")
@@ -215,7 +216,8 @@ class Moments(CaptureTest):
         self.wait_for(lambda: (self.directory / "saved/moments").exists())
         (self.directory / "made").rename(self.directory / "gone")
         printed, errors = capture.communicate(timeout=10)
-        self.assertEqual(errors.splitlines()[1:], ["tarvellab: no table can be read: No such file or directory"])
+        self.assertEqual(errors.splitlines()[-1], "tarvellab: no table can be read: No such file or directory")
+        self.assertLess(len(errors.splitlines()), 5)  # one table may be missed first
         self.assertRegex(printed, "moments [2-7] of 8, tables (24|36|48|60|72|84) of \\1, ")
         self.assertEqual(capture.returncode, 1)
 
