@@ -29,7 +29,7 @@ COMMAND_LINES = ["provider -D", "tree 00000000-0000-0000-0000-000000000000", "ne
                  "flow -n -- -w", "NETSTAT --uuid x --pid 3 --wait 1", "show -w", "list-providers --details -f",
                  "flow-adv", "flow-owner", "flow-route -n", "interface", "flow-switch", "channel-stats extra", "-w x"]
 # Executions of each target in the long form: fewer where a record fills pages.
-LONG = {"print": 40_000_000, "arguments": 12_000_000,
+LONG = {"print": 40_000_000, "arguments": 12_000_000, "capture": 1_000_000,
         **{name: 3_000_000 if name in ("provider", "channel", "flow", "userstack", "arena") else 6_000_000
            for name in TABLES}}
 CHUNK = 500_000  # executions of a process, which keeps what it has seen of memory regions and code
@@ -47,8 +47,19 @@ def table_seeds(lab, name):
             yield struct.pack("<BBBBHH", command, 0, 1, 0, 0, 0) + first[:-1]
 
 
+def capture_seeds():
+    """A capture with a second moment, as steps: what, where, name, how; then the same with each step changed."""
+    tree = [(1, 0, 7, 0), *((0, i, i, 1) for i in range(5)), (1, 5, 5, 0), (0, 0, 8, 1), (0, 6, 9, 1), (5, 7, 0, 0)]
+    for changed in range(len(tree) + 1):
+        for what in 2, 3, 4:
+            steps = [(what, *step[1:3], 33) if i == changed else step for i, step in enumerate(tree)]
+            yield bytes(sum(steps + [(2, 0, 7, 2)] * (32 - len(steps)), ())) + b"format: 1\nhost: a\ntime: b\nredacted: yes\n"
+
+
 def seeds(lab, name):
-    if name == "arguments":
+    if name == "capture":
+        yield from capture_seeds()
+    elif name == "arguments":
         yield from (b"\0" + "\0".join(["tarvelctl", *line.split()]).encode() for line in COMMAND_LINES)
     elif name == "print":
         yield from (struct.pack("<Bq", kind, value) for kind in range(64) for value in (0, 1, -1, 1 << 62))
@@ -97,7 +108,7 @@ def main():
     parser.add_argument("--long", action="store_true")
     parser.add_argument("--seconds", type=int, default=2, help="of each target, in the short form")
     parser.add_argument("--jobs", type=int, default=1)
-    parser.add_argument("--only", nargs="*", default=[*TABLES, "arguments", "print"])
+    parser.add_argument("--only", nargs="*", default=[*TABLES, "arguments", "print", "capture"])
     options = parser.parse_args()
     with concurrent.futures.ThreadPoolExecutor(options.jobs) as pool:
         results = list(pool.map(lambda name: fuzz(options.lab, options.folder.resolve(), name,
