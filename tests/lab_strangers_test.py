@@ -8,17 +8,15 @@ import os
 import pathlib
 import shutil
 import signal
-import stat
 import subprocess
 import sys
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import LabTest, files, lab, node_dir, run  # noqa: E402
+from lab_kernel import LabTest, files, lab, node_dir  # noqa: E402
 
 stranger = 65534
 tarvelctl = pathlib.Path(lab).with_name("tarvelctl")
-table = node_dir + "nexus_provider_list"
 secret = (bytes(64) + b"secret".ljust(64, b"\0")).ljust(264, b"\0")
 
 
@@ -27,11 +25,10 @@ class Strangers(LabTest):
         super().setUp()
         self.directory.chmod(0o755)
         self.kernel = self.generate("--flows", 3, name="kernel").root
-        self.victim, self.theirs = self.directory / "victim", self.directory / "theirs"
+        self.victim, self.theirs, self.place = (self.directory / name for name in ("victim", "theirs", "place"))
         for path in self.victim / "stats", self.victim / "94", self.theirs:
             path.mkdir(parents=True)
-        (self.victim / "table").write_bytes(secret)
-        (self.victim / "94/comm").write_bytes(b"secret\n")
+        (self.victim / "nexus_provider_list").write_bytes(secret)
         os.chown(self.theirs, stranger, stranger)
         self.before = self.listing(self.victim)
 
@@ -40,94 +37,84 @@ class Strangers(LabTest):
 
     @contextlib.contextmanager
     def meanwhile(self, act):
-        """The stranger acts again and again; what fails it tries the next time."""
+        """The stranger acts again and again; what fails now may work the next time."""
         child = os.fork()
-        if child == 0:
-            os.setgroups([]), os.setgid(stranger), os.setuid(stranger)
-            while True:
-                with contextlib.suppress(OSError):
-                    act()
+        while child == 0:
+            with contextlib.suppress(OSError):
+                os.getuid() or (os.setgroups([]), os.setgid(stranger), os.setuid(stranger))
+                act()
         try:
             yield
         finally:
             os.kill(child, signal.SIGKILL)
             os.waitpid(child, 0)
 
-    def lab_on(self, place, root=None, refused=None):
-        """Every command that makes or enters `place`; a refusal says why, at once."""
-        env = {**os.environ, "TARVEL_ROOT": str(root or self.kernel)}
-        for words in (["generate", place], ["simulate", place], ["capture", place], ["capture", "--redact", place], ["run", place, "--", "true"]):
-            with self.subTest(words):
-                done = subprocess.run(["timeout", "-s", "INT", "0.3", lab, *words] if refused is None else [lab, *words],
-                                      env=env, capture_output=True, text=True, timeout=10)
-                if refused:
-                    self.assertEqual((done.returncode, done.stderr), (1, f"tarvellab: {refused}\n"))
-                    self.assertEqual(self.listing(self.victim), self.before)
+    def run_on(self, place, *commands, kernel=None, seconds="20"):
+        """What is printed by commands that make or enter a place. What moves is ended."""
+        for command in commands:
+            words = [place if word == "DIR" else word for word in command.split()]
+            yield subprocess.run(["timeout", "-s", "INT", seconds, lab, *words], capture_output=True, text=True, timeout=60,
+                                 env={**os.environ, "TARVEL_ROOT": str(kernel or self.kernel)}).stderr
 
-    def test_DirectoriesOfOthersAreRefused(self):
-        place = self.directory / "place"
-        self.lab_on(self.theirs, refused=f"{self.theirs}: belongs to another user")
-        self.assertEqual(list(self.theirs.iterdir()), [])
+    made, run_there = ("generate DIR", "simulate DIR"), "run DIR -- true"
+    all = *made, "capture DIR", "capture --redact DIR", run_there
+
+    def test_WhatIsNotTheCallersAloneIsRefused(self):
+        self.assertEqual({*self.run_on(self.theirs, *self.all)}, {f"tarvellab: {self.theirs}: belongs to another user\n"})
         for mode in 0o775, 0o757:
-            place.mkdir()
-            place.chmod(mode)
-            self.lab_on(place, refused=f"{place}: others may write to it")
-            self.assertEqual(list(place.iterdir()), [])
-            place.rmdir()
-        for below in "proc", "proc/sys/kern/tarvel", node_dir + "stats":
-            shutil.copytree(self.kernel, place)
-            os.chown(place / below, stranger, stranger)
-            for words in ["generate", place], ["simulate", place], ["run", place, "--", "true"]:
-                self.assertEqual(run(*words).stderr, f"tarvellab: {place / below}: belongs to another user\n")
-            self.assertEqual(files(place), files(self.kernel))
-            shutil.rmtree(place)
+            self.place.mkdir()
+            self.place.chmod(mode)
+            self.assertEqual({*self.run_on(self.place, *self.all)}, {f"tarvellab: {self.place}: others may write to it\n"})
+            self.place.rmdir()  # empty
+        self.assertEqual([*self.theirs.iterdir()], [])
+        shutil.copytree(self.kernel, self.place)
+        for below in node_dir + "stats", "proc":
+            os.chown(self.place / below, stranger, stranger)
+            self.assertEqual({*self.run_on(self.place, *self.made, self.run_there)}, {f"tarvellab: {self.place / below}: belongs to another user\n"})
+        self.assertEqual(files(self.place), files(self.kernel))
 
     def test_PlantedLinksAndPipesLeadNowhere(self):
         for below, target in ("proc", "."), (node_dir + "stats", "stats"), ("proc/94", "94"):
-            place = self.directory / "place"
-            shutil.copytree(self.kernel, place)
-            (place / below).rename(self.directory / "aside")
-            (place / below).symlink_to(self.victim / target)
-            for words in ["generate", place], ["simulate", place]:
-                self.assertEqual(run(*words).stderr, f"tarvellab: {place / below}: Not a directory\n")
-            self.assertRegex(run("run", place, "--", "true").stderr, f"{place / below}: (no part of a capture|Not a directory)\n")
-            self.assertEqual(self.listing(self.victim), self.before)
-            shutil.rmtree(place), shutil.rmtree(self.directory / "aside")
-        for name in "stats/flow", "stats/.flow":
-            (self.kernel / node_dir / name).unlink(missing_ok=True)
-            os.mkfifo(self.kernel / node_dir / name)
-        self.assertEqual(run("generate", self.kernel).stderr, "")
+            shutil.copytree(self.kernel, self.place)
+            shutil.rmtree(self.place / below)
+            (self.place / below).symlink_to(self.victim / target)
+            for seen in self.run_on(self.place, *self.made, self.run_there):
+                self.assertRegex(seen, f"^tarvellab: {self.place / below}: (no part of a capture|Not a directory)\n$")
+            shutil.rmtree(self.place)
+        self.assertEqual(self.listing(self.victim), self.before)
+        (self.kernel / node_dir / "stats/flow").unlink()
+        os.mkfifo(self.kernel / node_dir / "stats/flow")
+        self.assertEqual([*self.run_on(self.kernel, "generate DIR")], [""])
 
     def test_NothingReachesAPlaceThatIsExchangedMeanwhile(self):
         place, aside = self.theirs / "place", self.theirs / "aside"
 
         def exchange():
+            aside.mkdir(exist_ok=True)
             with contextlib.suppress(OSError):
-                place.rename(aside / str(os.urandom(4).hex()))
+                place.rename(aside / os.urandom(4).hex())
             os.symlink(self.victim, place)
             place.unlink()
             place.mkdir()
             (place / "proc").symlink_to(self.victim)
             shutil.rmtree(place)
-        with self.meanwhile(lambda: (aside.mkdir(exist_ok=True), exchange())):
+        with self.meanwhile(exchange):
             for _ in range(12):
-                self.lab_on(place)
+                [*self.run_on(place, *self.all, seconds="0.3")]
         self.assertEqual(self.listing(self.victim), self.before)
         for path in self.theirs.rglob("*"):
-            status = path.lstat()
-            if status.st_uid == 0:  # made by the lab: closed to others, and in nothing that is theirs but the named place
-                self.assertEqual(stat.S_IMODE(status.st_mode), 0o700 if path.is_dir() else 0o600, path)
+            if path.lstat().st_uid == 0:  # made by the lab: closed to others, and in nothing that is theirs but the named place
+                self.assertEqual(path.lstat().st_mode & 0o777, 0o700 if path.is_dir() else 0o600, path)
                 self.assertTrue(path.parent in (self.theirs, aside) or path.parent.lstat().st_uid == 0, path)
 
     def test_AStrangersKernelShowsNothingButItsOwnFiles(self):
-        shutil.copytree(self.kernel, self.theirs / "kernel")
+        kernel = shutil.copytree(self.kernel, self.theirs / "kernel")
         for path in self.theirs.rglob("*"):
             os.chown(path, stranger, stranger)
-        tarvel, name = (self.theirs / "kernel" / table).parent, pathlib.Path(table).name
-        (self.victim / name).write_bytes(secret)
+        tarvel, name = kernel / node_dir, "nexus_provider_list"
 
         def exchange():
-            for make in os.mkfifo, lambda path: os.symlink(self.victim / "table", path):
+            for make in os.mkfifo, lambda path: os.symlink(self.victim / name, path):
                 with contextlib.suppress(OSError):
                     make(tarvel / "new")
                     os.rename(tarvel / "new", tarvel / name)
@@ -135,14 +122,13 @@ class Strangers(LabTest):
             tarvel.symlink_to(self.victim)
             tarvel.unlink()
             tarvel.with_name("aside").rename(tarvel)
-        seen = ""
+        seen = b""
         with self.meanwhile(exchange):
             for number in range(60):
-                seen += subprocess.run([tarvelctl, "provider"], env={**os.environ, "TARVEL_ROOT": str(self.theirs / "kernel")},
-                                       capture_output=True, text=True, timeout=10).stdout
-                run("capture", self.directory / f"saved{number}", env={**os.environ, "TARVEL_ROOT": str(self.theirs / "kernel")})
-        self.assertNotIn("secret", seen)
-        self.assertEqual([path for path, content in files(self.directory).items() if path.startswith("saved") and b"secret" in content], [])
+                seen += subprocess.run([tarvelctl, "provider"], env={"TARVEL_ROOT": str(kernel)}, capture_output=True, timeout=10).stdout
+                [*self.run_on(self.directory / f"saved{number}", "capture DIR", kernel=kernel)]
+        saved = b"".join(content for path, content in files(self.directory).items() if path.startswith("saved"))
+        self.assertNotIn(b"secret", seen + saved)
 
 
 if __name__ == "__main__":
