@@ -19,8 +19,8 @@ namespace platform {
 class kernel_file {
  public:
   // Opens "/proc/" + `path` below the root for reading. Only regular files count: a directory is EISDIR, and
-  // a device or a pipe, which might block or never end, is EINVAL. Below a root that is given, a link is ELOOP
-  // or, on the way to the file, ENOTDIR, and what is part of a real /proc is EPERM.
+  // a device or a pipe, which might block or never end, is EINVAL. Below a root that is given, a link is
+  // ELOOP or, on the way to the file, ENOTDIR, and what is part of a real /proc is EPERM.
   explicit kernel_file(std::string_view path);
   ~kernel_file();
   kernel_file(const kernel_file &) = delete;
