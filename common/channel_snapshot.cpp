@@ -1,7 +1,7 @@
 #include "common/channel_snapshot.h"
 
-#include "common/memory.h"
-#include "common/output.h"
+#include "common/text/memory.h"
+#include "common/text/output.h"
 
 bool channel_snapshot_fetch(channel_snapshot &snapshot) {
   if (snapshot.table_.fetch(channel_list_node) != 0 || snapshot.table_.empty()) return false;

@@ -9,10 +9,10 @@
 #include <optional>
 #include <span>
 
-#include "common/channel.h"
-#include "common/kernel_table.h"
-#include "common/key_index.h"
-#include "common/record_walk.h"
+#include "common/tables/channel.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/key_index.h"
+#include "common/tables/record_walk.h"
 
 // Where the bytes of a channel lie in the table that holds them.
 struct channel_ref {

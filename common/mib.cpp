@@ -2,12 +2,12 @@
 
 #include <algorithm>
 
-#include "common/channel.h"
-#include "common/flow.h"
-#include "common/invariant.h"
-#include "common/memory.h"
-#include "common/output.h"
-#include "common/provider.h"
+#include "common/tables/channel.h"
+#include "common/tables/flow.h"
+#include "common/tables/provider.h"
+#include "common/text/invariant.h"
+#include "common/text/memory.h"
+#include "common/text/output.h"
 
 namespace {
 

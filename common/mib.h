@@ -10,11 +10,11 @@
 #include <set>
 #include <vector>
 
-#include "common/flow.h"
-#include "common/kernel_table.h"
-#include "common/key_index.h"
-#include "common/record_walk.h"
-#include "common/sort_key.h"
+#include "common/tables/flow.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/key_index.h"
+#include "common/tables/record_walk.h"
+#include "common/tables/sort_key.h"
 
 // What an object is, and what the payload of its node is.
 enum class object_type : std::uint32_t {

@@ -7,13 +7,13 @@
 #include <cstring>
 #include <iterator>
 
-#include "common/channel.h"
-#include "common/flow.h"
-#include "common/flow_naming.h"
 #include "common/mib.h"
-#include "common/output.h"
-#include "common/process_names.h"
-#include "common/provider.h"
+#include "common/names/flow_naming.h"
+#include "common/names/process_names.h"
+#include "common/tables/channel.h"
+#include "common/tables/flow.h"
+#include "common/tables/provider.h"
+#include "common/text/output.h"
 
 namespace {
 

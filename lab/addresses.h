@@ -6,7 +6,7 @@
 
 #include <cstdint>
 
-#include "common/socket_address.h"
+#include "common/tables/socket_address.h"
 #include "lab/random.h"
 
 namespace lab {

@@ -1,6 +1,6 @@
 // kern.tarvel.stats.arena
 
-#include "common/arena.h"
+#include "common/tables/arena.h"
 
 #include <algorithm>
 

@@ -10,9 +10,9 @@
 #include <utility>
 #include <vector>
 
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/text.h"
+#include "common/tables/kernel_table.h"
+#include "common/text/output.h"
+#include "common/text/text.h"
 #include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"

@@ -13,8 +13,8 @@
 #include <cstdlib>
 #include <string_view>
 
-#include "common/output.h"
-#include "common/text.h"
+#include "common/text/output.h"
+#include "common/text/text.h"
 #include "lab/table_file.h"
 
 namespace lab {

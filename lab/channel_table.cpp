@@ -1,6 +1,6 @@
 // kern.tarvel.nexus_channel_list and kern.tarvel.ring_stat_enable
 
-#include "common/channel.h"
+#include "common/tables/channel.h"
 
 #include <algorithm>
 

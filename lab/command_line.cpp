@@ -4,7 +4,7 @@
 #include <cmath>
 #include <string_view>
 
-#include "common/output.h"
+#include "common/text/output.h"
 
 namespace lab {
 

@@ -10,7 +10,7 @@
 #include <string_view>
 #include <vector>
 
-#include "common/counters.h"
+#include "common/tables/counters.h"
 
 namespace lab {
 

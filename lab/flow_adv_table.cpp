@@ -1,6 +1,6 @@
 // kern.tarvel.stats.flow_adv
 
-#include "common/flow.h"
+#include "common/tables/flow.h"
 #include "lab/tables.h"
 
 namespace lab {

@@ -1,6 +1,6 @@
 // kern.tarvel.stats.flow
 
-#include "common/flow.h"
+#include "common/tables/flow.h"
 
 #include "lab/flow_states.h"
 #include "lab/tables.h"

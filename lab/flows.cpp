@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "common/flow.h"
+#include "common/tables/flow.h"
 #include "lab/flow_states.h"
 #include "lab/programs.h"
 #include "lab/world_parts.h"

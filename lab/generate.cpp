@@ -2,8 +2,8 @@
 
 #include <cstdlib>
 
-#include "common/output.h"
-#include "common/text.h"
+#include "common/text/output.h"
+#include "common/text/text.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
 #include "lab/root_directory.h"

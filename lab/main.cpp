@@ -1,5 +1,5 @@
-#include "common/memory.h"
-#include "common/output.h"
+#include "common/text/memory.h"
+#include "common/text/output.h"
 #include "lab/command_line.h"
 
 int main(int argc, char **argv) {

@@ -1,6 +1,6 @@
 // kern.tarvel.stats.netns
 
-#include "common/netns.h"
+#include "common/tables/netns.h"
 
 #include <algorithm>
 #include <map>

@@ -1,6 +1,6 @@
 // kern.tarvel.stats.net_if and kern.tarvel.stats.flow_switch
 
-#include "common/counters.h"
+#include "common/tables/counters.h"
 #include "lab/counter_recipe.h"
 #include "lab/tables.h"
 

@@ -12,8 +12,8 @@
 #include <string_view>
 #include <system_error>
 
-#include "common/output.h"
-#include "common/text.h"
+#include "common/text/output.h"
+#include "common/text/text.h"
 
 namespace lab {
 

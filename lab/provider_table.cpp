@@ -4,7 +4,7 @@
 #include <iterator>
 #include <string>
 
-#include "common/provider.h"
+#include "common/tables/provider.h"
 #include "lab/tables.h"
 
 namespace lab {

@@ -6,7 +6,7 @@
 #include <cstdint>
 #include <cstring>
 
-#include "common/uuid.h"
+#include "common/tables/uuid.h"
 
 namespace lab {
 

@@ -19,8 +19,8 @@
 #include <system_error>
 #include <vector>
 
-#include "common/output.h"
-#include "common/text.h"
+#include "common/text/output.h"
+#include "common/text/text.h"
 #include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"

@@ -15,8 +15,8 @@
 #include <string>
 #include <string_view>
 
-#include "common/key_index.h"
-#include "common/socket_address.h"
+#include "common/tables/key_index.h"
+#include "common/tables/socket_address.h"
 
 namespace lab {
 

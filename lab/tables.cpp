@@ -1,11 +1,11 @@
 #include "lab/tables.h"
 
-#include "common/arena.h"
-#include "common/channel.h"
-#include "common/counters.h"
-#include "common/flow.h"
-#include "common/netns.h"
-#include "common/provider.h"
+#include "common/tables/arena.h"
+#include "common/tables/channel.h"
+#include "common/tables/counters.h"
+#include "common/tables/flow.h"
+#include "common/tables/netns.h"
+#include "common/tables/provider.h"
 
 namespace lab {
 

@@ -10,8 +10,8 @@
 #include <string_view>
 #include <vector>
 
-#include "common/record_walk.h"
-#include "common/text.h"
+#include "common/tables/record_walk.h"
+#include "common/text/text.h"
 #include "lab/table_file.h"
 #include "lab/world.h"
 

@@ -1,6 +1,6 @@
 // kern.tarvel.stats.userstack
 
-#include "common/counters.h"
+#include "common/tables/counters.h"
 #include "lab/counter_recipe.h"
 #include "lab/tables.h"
 

@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "common/uuid.h"
+#include "common/tables/uuid.h"
 #include "lab/addresses.h"
 #include "lab/programs.h"
 #include "lab/random.h"

@@ -1,7 +1,7 @@
 // channel: the channels of each nexus instance with their owners and, where the kernel collects them, the
 // statistics of their rings.
 
-#include "common/channel.h"
+#include "common/tables/channel.h"
 
 #include <unistd.h>
 
@@ -9,9 +9,9 @@
 #include <cstring>
 
 #include "common/channel_snapshot.h"
-#include "common/output.h"
-#include "common/output_helpers.h"
-#include "common/process_names.h"
+#include "common/names/process_names.h"
+#include "common/text/output.h"
+#include "common/text/output_helpers.h"
 #include "platform/sysctl.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/ring_stats.h"

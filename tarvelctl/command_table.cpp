@@ -1,4 +1,4 @@
-#include "common/output_helpers.h"
+#include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
 
 const option no_options[] = {{}};

@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "common/output.h"
+#include "common/text/output.h"
 #include "tarvelctl/netstat_options.h"
 
 void print_counters(const counter_name *names, std::span<const std::uint64_t> counters) {

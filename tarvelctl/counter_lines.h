@@ -6,7 +6,7 @@
 #include <cstdint>
 #include <span>
 
-#include "common/counters.h"
+#include "common/tables/counters.h"
 
 // Prints a line for each counter that is not 0, or for each one where the settings ask for zeros. `names` has
 // as many names as there are counters, and is closed by an empty one.

@@ -1,16 +1,16 @@
 // flow: every flow of the flow switches, by owning process.
 
-#include "common/flow.h"
+#include "common/tables/flow.h"
 
 #include <string_view>
 #include <vector>
 
-#include "common/flow_naming.h"
-#include "common/invariant.h"
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/record_walk.h"
-#include "common/sort_key.h"
+#include "common/names/flow_naming.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/tables/sort_key.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 #include "tarvelctl/reports.h"

@@ -1,10 +1,10 @@
 // flow-owner: which process holds which nexus port.
 
-#include "common/flow.h"
-#include "common/invariant.h"
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/record_walk.h"
+#include "common/tables/flow.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 #include "tarvelctl/reports.h"

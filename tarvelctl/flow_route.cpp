@@ -1,11 +1,11 @@
 // flow-route: the routes of the flow switches, with gateway and link-layer address of the next hop.
 
-#include "common/flow.h"
-#include "common/flow_naming.h"
-#include "common/invariant.h"
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/record_walk.h"
+#include "common/names/flow_naming.h"
+#include "common/tables/flow.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 #include "tarvelctl/reports.h"

@@ -3,13 +3,13 @@
 #include <iterator>
 #include <limits>
 
-#include "common/arena.h"
-#include "common/invariant.h"
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/output_helpers.h"
-#include "common/process_names.h"
-#include "common/record_walk.h"
+#include "common/names/process_names.h"
+#include "common/tables/arena.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
+#include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/region_set.h"
 

@@ -1,6 +1,6 @@
 // netns: port reservations, of one namespace or of all.
 
-#include "common/netns.h"
+#include "common/tables/netns.h"
 
 #include <arpa/inet.h>
 #include <netinet/in.h>
@@ -10,10 +10,10 @@
 #include <iterator>
 #include <string_view>
 
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/output_helpers.h"
-#include "common/record_walk.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/output.h"
+#include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/protocol_words.h"
 

@@ -5,7 +5,7 @@
 #include <iterator>
 #include <string_view>
 
-#include "common/output.h"
+#include "common/text/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 #include "tarvelctl/protocol_words.h"

@@ -5,7 +5,7 @@
 
 #include <cstdint>
 
-#include "common/uuid.h"
+#include "common/tables/uuid.h"
 
 // One record for the process, all zero at its start and then only ever set: by the netstat command from its
 // options, and `numerical` by the flow listings too. Reports that run as commands of their own see no filter.

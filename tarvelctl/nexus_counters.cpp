@@ -3,11 +3,11 @@
 #include <algorithm>
 #include <vector>
 
-#include "common/counters.h"
-#include "common/invariant.h"
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/record_walk.h"
+#include "common/tables/counters.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/counter_lines.h"
 #include "tarvelctl/netstat_options.h"

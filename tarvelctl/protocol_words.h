@@ -5,7 +5,7 @@
 
 #include <string_view>
 
-#include "common/netns.h"
+#include "common/tables/netns.h"
 #include "tarvelctl/netstat_options.h"
 
 // Of `netns -p`, with the number of each in the table.

@@ -1,14 +1,14 @@
 // provider: the registered nexus providers and their instances.
 
-#include "common/provider.h"
+#include "common/tables/provider.h"
 
 #include <cstring>
 #include <iterator>
 
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/output_helpers.h"
-#include "common/record_walk.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/output.h"
+#include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
 
 const option provider_options[] = {{"details", no_argument, nullptr, 'D'}, {}};

@@ -2,7 +2,7 @@
 
 #include <cstdlib>
 
-#include "common/output.h"
+#include "common/text/output.h"
 
 namespace {
 

@@ -7,9 +7,9 @@
 #include <memory>
 #include <span>
 
-#include "common/arena.h"
-#include "common/key_index.h"
-#include "common/memory.h"
+#include "common/tables/arena.h"
+#include "common/tables/key_index.h"
+#include "common/text/memory.h"
 
 // Regions by UUID, with type and memory as they were when each was first seen. It only grows.
 class region_set {

@@ -2,9 +2,9 @@
 
 #include <optional>
 
-#include "common/key_index.h"
-#include "common/output.h"
-#include "common/record_walk.h"
+#include "common/tables/key_index.h"
+#include "common/tables/record_walk.h"
+#include "common/text/output.h"
 
 unit_suffixes decimal_suffixes = {"", "K", "M", "G", "T"};
 unit_suffixes power_of_two_suffixes = {"", "KB", "MB", "GB", "TB"};

@@ -8,8 +8,8 @@
 #include <cstdint>
 #include <span>
 
-#include "common/channel.h"
-#include "common/print.h"
+#include "common/tables/channel.h"
+#include "common/text/print.h"
 
 // Ring blocks as they lie in a table: ring_stats records back to back.
 using ring_blocks = std::span<const std::byte>;

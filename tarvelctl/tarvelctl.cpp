@@ -13,9 +13,9 @@
 #include <string_view>
 #include <vector>
 
-#include "common/memory.h"
-#include "common/output.h"
-#include "common/output_helpers.h"
+#include "common/text/memory.h"
+#include "common/text/output.h"
+#include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
 
 const char *progname = "";

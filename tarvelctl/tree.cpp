@@ -1,8 +1,8 @@
 // tree: the object tree, whole or below one object, as nested JSON objects.
 
 #include "common/mib.h"
-#include "common/output.h"
-#include "common/output_helpers.h"
+#include "common/text/output.h"
+#include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
 
 int cmd_tree(int argc, char **argv) {

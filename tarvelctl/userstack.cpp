@@ -1,11 +1,11 @@
 // The IP, IPv6, TCP and UDP counters of the protocol stacks in user space, for netstat.
 
-#include "common/counters.h"
-#include "common/invariant.h"
-#include "common/kernel_table.h"
-#include "common/output.h"
-#include "common/process_names.h"
-#include "common/record_walk.h"
+#include "common/names/process_names.h"
+#include "common/tables/counters.h"
+#include "common/tables/kernel_table.h"
+#include "common/tables/record_walk.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
 #include "tarvelctl/counter_lines.h"
 #include "tarvelctl/netstat_options.h"
 #include "tarvelctl/reports.h"

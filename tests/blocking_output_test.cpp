@@ -15,7 +15,7 @@
 #include <deque>
 #include <string>
 
-#include "common/output.h"
+#include "common/text/output.h"
 #include "platform/descriptor.h"
 
 namespace platform {

@@ -10,7 +10,7 @@
 #include <map>
 #include <random>
 
-#include "common/flow_naming.h"
+#include "common/names/flow_naming.h"
 
 namespace {
 

@@ -3,7 +3,7 @@
 #include <gtest/gtest.h>
 
 #include "common/channel_snapshot.h"
-#include "common/key_index.h"
+#include "common/tables/key_index.h"
 #include "tests/support/kernel_dir.h"
 
 namespace {

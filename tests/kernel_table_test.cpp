@@ -1,6 +1,6 @@
 // Fetching a table from a kernel that fails, grows and shrinks on cue.
 
-#include "common/kernel_table.h"
+#include "common/tables/kernel_table.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "common/output.h"
+#include "common/text/output.h"
 #include "platform/sysctl.h"
 #include "tarvelctl/command.h"
 #include "tests/support/capture.h"

@@ -57,7 +57,7 @@ class Commands(unittest.TestCase):
 
 class Tables(unittest.TestCase):
     text = (sources / "docs/tarvel-tables.5").read_text()
-    headers = "".join(path.read_text() for path in sorted((sources / "common").glob("*.h")))
+    headers = "".join(path.read_text() for path in sorted((sources / "common").rglob("*.h")))
 
     def rows(self, text):
         return [[cell.replace("\\&", "") for cell in line.split(" Ta ")] for line in re.findall(r"^\.It (\d.*)", text, flags=re.M)]
@@ -94,7 +94,7 @@ class Tables(unittest.TestCase):
         self.assertEqual(set(sections("tarvel-tables.5", "Ss")), {node.replace(".", "/") for node in nodes})
 
     def test_CountersHaveTheirPositions(self):
-        names = (sources / "common/counters.cpp").read_text()
+        names = (sources / "common/tables/counters.cpp").read_text()
         for block in "net_if", "flow_switch", "ip", "ip6", "tcp", "udp":
             body = re.search(rf" {block}_counter_names\[\] = {{(.*?)}};", names, flags=re.S)[1]
             place = rf"\.Ss stats/{block}\n" if block in ("net_if", "flow_switch") else rf"\.Va {block} :\n"

@@ -20,8 +20,9 @@ import sys
 import time
 
 # Decoders and bounds. What prints and writes has checks of its own: fuzzing against snprintf, writes that fail.
-SOURCES = ["common/[!op]*.cpp", "common/process_names.cpp", "common/provider.*", "common/record_walk.h",
-           "common/channel*.h", "common/flow.h", "common/netns.h", "tarvelctl/[!t]*.cpp", "tarvelctl/tree.cpp",
+SOURCES = ["common/*.cpp", "common/channel*.h", "common/names/*.cpp", "common/tables/*.cpp", "common/tables/provider.h",
+           "common/tables/record_walk.h", "common/tables/channel.h", "common/tables/flow.h", "common/tables/netns.h",
+           "common/text/invariant.cpp", "common/text/memory.cpp", "tarvelctl/[!t]*.cpp", "tarvelctl/tree.cpp",
            "platform/linux/[!dm]*.cpp"]
 OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
     (r" < ", " <= "), (r" <= ", " < "), (r" > ", " >= "), (r" >= ", " > "), (r" == ", " != "), (r" != ", " == "),

@@ -1,7 +1,7 @@
 // The buffered output: whole rows, whatever their length and whoever reads them; and what commands print
 // with.
 
-#include "common/output.h"
+#include "common/text/output.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -11,7 +11,7 @@
 #include <thread>
 
 #include "common/mib.h"
-#include "common/output_helpers.h"
+#include "common/text/output_helpers.h"
 #include "tests/support/capture.h"
 #include "tests/support/kernel_dir.h"
 

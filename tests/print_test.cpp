@@ -1,6 +1,6 @@
 // Compile-time formats against the C library's printf.
 
-#include "common/print.h"
+#include "common/text/print.h"
 
 #include <gtest/gtest.h>
 
@@ -11,7 +11,7 @@
 #include <random>
 #include <string>
 
-#include "common/text.h"
+#include "common/text/text.h"
 
 namespace {
 

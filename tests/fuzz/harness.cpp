@@ -15,8 +15,8 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "common/invariant.h"
-#include "common/output.h"
+#include "common/text/invariant.h"
+#include "common/text/output.h"
 #include "platform/descriptor.h"
 #include "platform/process.h"
 #include "platform/sysctl.h"

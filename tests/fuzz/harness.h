@@ -15,7 +15,7 @@
 #include <string_view>
 #include <vector>
 
-#include "common/guard.h"
+#include "common/text/guard.h"
 
 namespace fuzz {
 

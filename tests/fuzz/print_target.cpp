@@ -4,7 +4,7 @@
 #include <cstdio>
 #include <cstring>
 
-#include "common/print.h"
+#include "common/text/print.h"
 #include "tests/fuzz/harness.h"
 
 namespace {

@@ -10,12 +10,12 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "common/arena.h"
-#include "common/channel.h"
-#include "common/counters.h"
-#include "common/flow.h"
-#include "common/netns.h"
-#include "common/provider.h"
+#include "common/tables/arena.h"
+#include "common/tables/channel.h"
+#include "common/tables/counters.h"
+#include "common/tables/flow.h"
+#include "common/tables/netns.h"
+#include "common/tables/provider.h"
 #include "tests/fuzz/harness.h"
 
 namespace {

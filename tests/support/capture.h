@@ -9,7 +9,7 @@
 
 #include <string>
 
-#include "common/output.h"
+#include "common/text/output.h"
 
 // Lets an output write into memory. Belongs to one test; the next one attaches the output anew.
 class capture {

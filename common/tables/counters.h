@@ -1,0 +1,78 @@
+// Counters of network interfaces, flow switches and user-space protocol stacks, as the tables
+// kern.tarvel.stats.net_if, kern.tarvel.stats.flow_switch and kern.tarvel.stats.userstack deliver them.
+
+#ifndef TARVELCTL_COMMON_TABLES_COUNTERS_H
+#define TARVELCTL_COMMON_TABLES_COUNTERS_H
+
+#include <cstddef>
+#include <cstdint>
+
+#include "common/tables/uuid.h"
+#include "common/text/text.h"
+
+inline constexpr char net_if_node[] = "kern.tarvel.stats.net_if";
+inline constexpr char flow_switch_node[] = "kern.tarvel.stats.flow_switch";
+inline constexpr char userstack_node[] = "kern.tarvel.stats.userstack";
+
+inline constexpr std::size_t net_if_counter_count = 29;
+inline constexpr std::size_t flow_switch_counter_count = 52;
+inline constexpr std::size_t ip_counter_count = 43;
+inline constexpr std::size_t ip6_counter_count = 36;
+inline constexpr std::size_t tcp_counter_count = 203;
+inline constexpr std::size_t udp_counter_count = 22;
+
+using counter_name = format::column_text<16, 24>;
+
+// The names of the counters of a block, by position. Each list is closed by an empty name.
+extern const counter_name net_if_counter_names[];
+extern const counter_name flow_switch_counter_names[];
+extern const counter_name ip_counter_names[];
+extern const counter_name ip6_counter_names[];
+extern const counter_name tcp_counter_names[];
+extern const counter_name udp_counter_names[];
+
+// What the records of both nexus tables begin with.
+struct tv_stats_nexus_head {
+  uuid nx_uuid;
+  text_field<16> name;  // of the interface
+};
+
+struct tv_stats_net_if {
+  tv_stats_nexus_head head;
+  std::uint64_t counters[net_if_counter_count];
+  std::uint8_t reserved_264[56];
+};
+
+struct tv_stats_flow_switch {
+  tv_stats_nexus_head head;
+  std::uint64_t counters[flow_switch_counter_count];
+};
+
+// The counters of one protocol stack in user space.
+struct tv_stats_userstack {
+  uuid nx_uuid;
+  text_field<16> if_name;
+  std::int32_t pid;  // 0: the sum of ports that are closed
+  std::uint8_t reserved_36[12];
+  std::uint64_t ip[ip_counter_count];
+  std::uint64_t reserved_392;
+  std::uint64_t ip6[ip6_counter_count];
+  std::uint64_t tcp[tcp_counter_count];
+  std::uint64_t reserved_2312;
+  std::uint64_t udp[udp_counter_count];
+};
+
+static_assert(offsetof(tv_stats_nexus_head, name) == 16);
+static_assert(sizeof(tv_stats_net_if) == 320);
+static_assert(offsetof(tv_stats_net_if, counters) == 32);
+static_assert(sizeof(tv_stats_flow_switch) == 32 + 52 * 8);
+static_assert(offsetof(tv_stats_flow_switch, counters) == 32);
+static_assert(sizeof(tv_stats_userstack) == 2496);
+static_assert(offsetof(tv_stats_userstack, if_name) == 16);
+static_assert(offsetof(tv_stats_userstack, pid) == 32);
+static_assert(offsetof(tv_stats_userstack, ip) == 48);
+static_assert(offsetof(tv_stats_userstack, ip6) == 400);
+static_assert(offsetof(tv_stats_userstack, tcp) == 688);
+static_assert(offsetof(tv_stats_userstack, udp) == 2320);
+
+#endif
