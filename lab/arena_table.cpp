@@ -10,17 +10,13 @@ namespace lab {
 
 namespace {
 
-enum arena_type : std::int32_t { nexus_arena, policy_arena, system_arena };
-
-enum region_mode : std::uint32_t {
-  no_redirect = 0x1,
-  map_ok = 0x2,
-  read_only = 0x4,
-  persistent = 0x8,
-  monolithic = 0x10,
-  no_cache = 0x20,
-  mirrored = 0x80000000,
-};
+constexpr std::uint32_t no_redirect = region_mode_names.bit("NOREDIRECT");
+constexpr std::uint32_t map_ok = region_mode_names.bit("MMAPOK");
+constexpr std::uint32_t read_only = region_mode_names.bit("READONLY");
+constexpr std::uint32_t persistent = region_mode_names.bit("PERSISTENT");
+constexpr std::uint32_t monolithic = region_mode_names.bit("MONOLITHIC");
+constexpr std::uint32_t no_cache = region_mode_names.bit("NOCACHE");
+constexpr std::uint32_t mirrored = region_mode_names.bit("MIRRORED");
 
 // Whose region it is: arenas of one channel, of one nexus or of the whole machine share it.
 enum scope : std::uint8_t { channel_scope, nexus_scope, machine_scope, scopes };
@@ -62,10 +58,10 @@ struct arena_parts {
   std::uint32_t regions;  // bits
 };
 
-constexpr arena_parts system_parts{system_arena, 1 << 8};
-constexpr arena_parts policy_parts{policy_arena, 1 << 0 | 1 << 5 | 1 << 11};
-constexpr arena_parts switch_parts{nexus_arena, 0xfff};
-constexpr arena_parts pipe_parts{nexus_arena, 0xfff & ~(1 << 6 | 1 << 7)};
+constexpr arena_parts system_parts{arena_types.number("SYSTEM"), 1 << 8};
+constexpr arena_parts policy_parts{arena_types.number("PLCY"), 1 << 0 | 1 << 5 | 1 << 11};
+constexpr arena_parts switch_parts{arena_types.number("NEXUS"), 0xfff};
+constexpr arena_parts pipe_parts{arena_types.number("NEXUS"), 0xfff & ~(1 << 6 | 1 << 7)};
 
 std::uint64_t rounded_up(std::uint64_t value, std::uint64_t step) {
   return (value + step - 1) / step * step;

@@ -66,10 +66,13 @@ void put_rings(const meter &moved, const uuid &id, std::uint32_t batch, std::uin
 }
 
 std::uint32_t flags_of(const world &state, const channel &source) {
-  constexpr std::uint32_t monitor = 0x1 | 0x2 | 0x4;  // sends, receives, without copies
-  constexpr std::uint32_t user_pool = 0x8;
-  constexpr std::uint32_t may_be_taken = 0x10;
-  constexpr std::uint32_t exclusive = 0x20;
+  constexpr auto bit = [](std::string_view name) consteval {
+    return channel_flag_names.bit(name);
+  };
+  constexpr std::uint32_t monitor = bit("MON_TX") | bit("MON_RX") | bit("NO_COPY");
+  constexpr std::uint32_t user_pool = bit("USER_PACKET_POOL");
+  constexpr std::uint32_t may_be_taken = bit("DEFUNCT_OK");
+  constexpr std::uint32_t exclusive = bit("EXCLUSIVE");
   if (source.state == channel::phase::defunct) return user_pool | may_be_taken | channel_entry::defunct;
   if (source.flow_switch != none) return user_pool | may_be_taken;
   switch (state.nexuses[source.nexus].kind) {

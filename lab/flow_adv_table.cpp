@@ -12,8 +12,8 @@ void write_advisories(const world &state, table_file &file) {
     if (source.advisory == none) continue;
     lists[state.channels[source.channel].flow_switch][source.advisory] = {
         .sfae_flow_uuid = source.id,
-        .sfae_flags =
-            tv_stats_flow_adv_entry::valid | (source.controlled ? tv_stats_flow_adv_entry::controlled : 0)};
+        .sfae_flags = advisory_flag_names.bit("VALID") |
+                      (source.controlled ? advisory_flag_names.bit("CONTROLLED") : 0)};
   }
   for (std::size_t i = 0; i < lists.size(); ++i) {
     const nexus &carrier = state.nexuses[state.switches[i].nexus];

@@ -7,7 +7,8 @@ namespace lab {
 
 namespace {
 
-enum route_flag : std::uint32_t { on_link = 0x10, resolved = 0x40 };
+constexpr std::uint32_t on_link = route_flag_names.bit("o");
+constexpr std::uint32_t resolved = route_flag_names.bit("r");
 
 constexpr std::uint32_t lifetime = 1200;  // seconds
 

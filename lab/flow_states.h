@@ -11,26 +11,26 @@ namespace lab {
 
 namespace tcp {
 enum state : std::uint8_t {
-  closed,
-  listening,
-  syn_sent,
-  syn_received,
-  established,
-  close_wait,
-  fin_wait_1,
-  closing,
-  last_ack,
-  fin_wait_2,
-  time_wait,
+  closed = flow_states.number("CLOSED"),
+  listening = flow_states.number("LISTEN"),
+  syn_sent = flow_states.number("SYN_SENT"),
+  syn_received = flow_states.number("SYN_RCVD"),
+  established = flow_states.number("ESTABLISHED"),
+  close_wait = flow_states.number("CLOSE_WAIT"),
+  fin_wait_1 = flow_states.number("FIN_WAIT_1"),
+  closing = flow_states.number("CLOSING"),
+  last_ack = flow_states.number("LAST_ACK"),
+  fin_wait_2 = flow_states.number("FIN_WAIT_2"),
+  time_wait = flow_states.number("TIME_WAIT"),
   gone  // no flow any more, whatever its protocol
 };
 }  // namespace tcp
 
 // Ends without connection state: by how many packets they have sent.
 namespace datagram {
-inline constexpr std::uint32_t no_traffic = 20;
-inline constexpr std::uint32_t single = 21;
-inline constexpr std::uint32_t multiple = 22;
+inline constexpr std::uint32_t no_traffic = flow_states.number("NO_TRAFFIC");
+inline constexpr std::uint32_t single = flow_states.number("SINGLE");
+inline constexpr std::uint32_t multiple = flow_states.number("MULTIPLE");
 }  // namespace datagram
 
 struct tcp_behaviour {

@@ -9,14 +9,12 @@ namespace lab {
 
 namespace {
 
-enum flow_flag : std::uint32_t {
-  tracked = 0x10,
-  connected = 0x20,
-  listener = 0x40,
-  marked = 0x100,  // its packets carry their service class
-  waits_for_close = 0x1000,
-  tells_close = 0x2000,
-};
+constexpr std::uint32_t tracked = flow_flag_names.bit("t");
+constexpr std::uint32_t connected = flow_flag_names.bit("c");
+constexpr std::uint32_t listener = flow_flag_names.bit("l");
+constexpr std::uint32_t marked = flow_flag_names.bit("q");  // its packets carry their service class
+constexpr std::uint32_t waits_for_close = flow_flag_names.bit("w");
+constexpr std::uint32_t tells_close = flow_flag_names.bit("e");
 
 std::uint32_t flags_of(const flow &source) {
   std::uint32_t flags = 0;

@@ -7,24 +7,26 @@
 #include <span>
 #include <string_view>
 
+#include "common/tables/flow.h"
 #include "lab/traffic.h"
 
 namespace lab {
 
-inline constexpr std::uint8_t tcp_protocol = 6;
-inline constexpr std::uint8_t udp_protocol = 17;
+inline constexpr std::uint8_t tcp_protocol = ip_protocols.number("tcp");
+inline constexpr std::uint8_t udp_protocol = ip_protocols.number("udp");
 
+// What a service asks for, by the label that reports give it.
 enum service_class : std::int32_t {
-  best_effort = 0,
-  background_system = 0x080090,
-  background = 0x100080,
-  responsive = 0x180010,
-  management = 0x200020,
-  audio_video = 0x280120,
-  responsive_video = 0x300110,
-  video = 0x380100,
-  voice = 0x400180,
-  control = 0x480190,
+  best_effort = service_classes.number("BE"),
+  background_system = service_classes.number("BKS"),
+  background = service_classes.number("BK"),
+  responsive = service_classes.number("RD"),
+  management = service_classes.number("OAM"),
+  audio_video = service_classes.number("AV"),
+  responsive_video = service_classes.number("RV"),
+  video = service_classes.number("VI"),
+  voice = service_classes.number("VO"),
+  control = service_classes.number("CTL"),
 };
 
 struct service {

@@ -21,14 +21,17 @@ struct provider_shape {
   std::int32_t mhints;
 };
 
+constexpr std::uint32_t flow_switch = nexus_types.number("flow-switch");
+constexpr std::uint32_t user_pipe = nexus_types.number("user-pipe");
+
 // By nexus_kind.
 constexpr provider_shape shapes[] = {
-    {nexus_type::flow_switch, flow_switch_subtype::multistack, 0, 512, 1024, 512, 1},
-    {nexus_type::network_interface, 0, 0, 512, 512, 512, 0},
-    {nexus_type::flow_switch, flow_switch_subtype::bridge, 0, 1024, 1024, 512, 0},
-    {nexus_type::user_pipe, 0, 0, 256, 256, 128, 0},
-    {nexus_type::kernel_pipe, 0, 0, 256, 512, 512, 2},
-    {nexus_type::user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
+    {flow_switch, flow_switch_subtypes.number("multistack"), 0, 512, 1024, 512, 1},
+    {nexus_types.number("net-if"), 0, 0, 512, 512, 512, 0},
+    {flow_switch, flow_switch_subtypes.number("bridge"), 0, 1024, 1024, 512, 0},
+    {user_pipe, 0, 0, 256, 256, 128, 0},
+    {nexus_types.number("kernel-pipe"), 0, 0, 256, 512, 512, 2},
+    {user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
 };
 static_assert(std::size(shapes) == nexus_kinds);
 

@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "common/tables/flow.h"
 #include "common/tables/uuid.h"
 #include "lab/addresses.h"
 #include "lab/programs.h"
@@ -17,7 +18,7 @@
 
 namespace lab {
 
-inline constexpr std::uint32_t none = 0xffffffff;  // in place of an index
+inline constexpr std::uint32_t none = no_index;  // in place of an index, in tables too
 
 // How much there is of everything. What has nothing to stand on is not made: no instance without a provider,
 // no channel without a process, no flow without a channel of a flow switch.

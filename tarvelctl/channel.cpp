@@ -20,16 +20,6 @@ const std::uint32_t channel_option_flags[] = {option_is_optional};
 
 namespace {
 
-constexpr bit_names channel_flag_names =
-    "\20"
-    "\1MON_TX"
-    "\2MON_RX"
-    "\3NO_COPY"
-    "\4USER_PACKET_POOL"
-    "\5DEFUNCT_OK"
-    "\6EXCLUSIVE"
-    "\40DEFUNCT";
-
 // Stores whether the kernel collects ring statistics. Returns 0, or -1 with a message on standard error.
 int ring_stat_enabled(bool &enabled) {
   char value = 0;

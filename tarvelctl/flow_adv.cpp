@@ -13,11 +13,6 @@
 
 namespace {
 
-constexpr bit_names advisory_flag_names =
-    "\20"
-    "\1VALID"
-    "\2CONTROLLED";
-
 void __tv_stats_flow_adv_print(const tv_stats_flow_adv &advisories, record_walk sfa_entries,
                                process_names &processes) {
   print<" - %s\n">(processes.of(advisories.sfa_pid));

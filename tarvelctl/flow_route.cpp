@@ -12,11 +12,6 @@
 
 namespace {
 
-constexpr flag_letter route_flag_letters[] = {
-    {0x10, 'o'},  {tv_stats_flow_route::has_gateway, 'g'}, {0x40, 'r'}, {tv_stats_flow_route::has_mac, 'i'},
-    {0x100, 'd'},
-};
-
 // IPv6 names are cut where the next column begins, but for the gateway's.
 void print_addresses(const tv_stats_flow_route &route) {
   const bool numerical = netstat_options.numerical;
@@ -43,7 +38,7 @@ void print_route(const tv_stats_flow_route &route) {
     print<" %-17s">("-");
   }
   print<" %8s %6u %6lld %5u %5u  %s\n">(route.sfr_if_name, route.sfr_refs, route.sfr_expire, route.sfr_bidx,
-                                        route.sfr_ibidx, flags_text{route.sfr_flags, route_flag_letters});
+                                        route.sfr_ibidx, flags_text{route.sfr_flags, route_flag_names});
 }
 
 }  // namespace

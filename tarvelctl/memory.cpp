@@ -15,33 +15,11 @@
 
 namespace {
 
-constexpr format::name_text arena_types[] = {"NEXUS", "PLCY", "SYSTEM"};
-
-constexpr format::name_text region_types[] = {"SCHEMA",  "RING",     "BUF",     "MDU", "USD", "USTATS",
-                                              "FLOWADV", "NEXUSADV", "SYSCTLS", "MDK", "KSD", "KSTATS"};
-static_assert(std::size(region_types) == SREG_MAX);
-
-constexpr bit_names region_mode_names =
-    "\20"
-    "\1NOREDIRECT"
-    "\2MMAPOK"
-    "\3READONLY"
-    "\4PERSISTENT"
-    "\5MONOLITHIC"
-    "\6NOCACHE"
-    "\40MIRRORED";
-
 // Outlives a run of the watch loop: a region counts with what it had when it was first seen.
 region_set tv_region_set;
 
 void tv_region_set_add(const tv_stats_region &region) {
   tv_region_set.add(region);
-}
-
-const format::name_text &type_name(std::span<const format::name_text> names, std::int32_t type) {
-  static constexpr format::name_text unknown = "UNKNOWN";
-  const auto index = static_cast<std::size_t>(type);
-  return index < names.size() ? names[index] : unknown;
 }
 
 void print_separator(char character) {
@@ -91,7 +69,7 @@ double occupancy(const tv_stats_region &region) {
 }
 
 void print_region(const tv_stats_region &region) {
-  print<"%15s  %s\n">(format::text_of<"%.12s region:", 64>(type_name(region_types, region.type)),
+  print<"%15s  %s\n">(format::text_of<"%.12s region:", 64>(region_types.of(region.type)),
                       region.name);
   print<"        allocs:  %llu\n">(region.allocs);
   print<"         frees:  %llu\n">(region.frees);
@@ -125,7 +103,7 @@ void print_arena_total(const memory_size &memory) {
 void print_arena(const tv_stats_arena &arena, process_names &processes) {
   for (const tv_stats_region &region : arena.regions) tv_region_set.prefetch(region);
   print_separator('=');
-  print<"%15s  %s\n">(format::text_of<"%.12s arena:", 64>(type_name(arena_types, arena.type)), arena.name);
+  print<"%15s  %s\n">(format::text_of<"%.12s arena:", 64>(arena_types.of(arena.type)), arena.name);
   for (const std::int32_t pid : arena.pids) {
     if (pid == 0) break;
     print<"%15s  %s\n">("", processes.of(pid));
@@ -157,7 +135,7 @@ void __tv_region_set_print_summary() {
   memory_size all;
   for (std::size_t type = 0; type < SREG_MAX; ++type) {
     const memory_size &memory = by_type[type];
-    print<"%14s:   %9llu KB  %9llu KB\n">(region_types[type], kilobytes(memory.total),
+    print<"%14s:   %9llu KB  %9llu KB\n">(region_types.rows[type].name, kilobytes(memory.total),
                                           kilobytes(memory.wired));
     all.add(memory);
   }

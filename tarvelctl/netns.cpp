@@ -95,7 +95,7 @@ void __tv_stats_netns_print(const tv_stats_netns &netns, record_walk ranges) {
   const char *address = "global namespace";
   if (netns.address_length == 4) address = inet_ntop(AF_INET, netns.address, text, sizeof text);
   if (netns.address_length == 16) address = inet_ntop(AF_INET6, netns.address, text, sizeof text);
-  print<"%s port reservations for %s\n">(netns.protocol == netns.udp ? "udp" : "tcp", address);
+  print<"%s port reservations for %s\n">(netns.protocol == ip_protocols.number("udp") ? "udp" : "tcp", address);
   print<"%11s %10s %10s %10s\n">("PORT(S)", "TARVEL", "BSD", "LISTENER");
   for (tv_stats_netns_range range; ranges.take(range);) print_range(range);
   print<"--------------------------------------------\n">();

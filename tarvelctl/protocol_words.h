@@ -14,8 +14,8 @@ struct netns_protocol_word {
   std::uint8_t number;
 };
 inline constexpr netns_protocol_word netns_protocols[] = {
-    {"tcp", tv_stats_netns::tcp},
-    {"udp", tv_stats_netns::udp},
+    {"tcp", ip_protocols.number("tcp")},
+    {"udp", ip_protocols.number("udp")},
 };
 
 // A word of the command line of netstat and the setting that it turns on.

@@ -53,7 +53,7 @@ void print_port(const object_tree &tree, const object_node &node, process_names 
 
 void print_flow_switches(const object_tree &tree, const object_node &provider, process_names &owners) {
   const auto parameters = provider.record<nexus_provider_parameters>();
-  if (parameters.subtype != flow_switch_subtype::multistack) return;
+  if (parameters.subtype != flow_switch_subtypes.number("multistack")) return;
   for_each_child(tree, provider, object_type::nexus, [&](const object_node &nexus) {
     print<"flow-switch %s %s\n">(nexus.uuid, parameters.name);
     for_each_child(tree, nexus, object_type::channel,

@@ -6,7 +6,7 @@
 #include <cstdint>
 #include <span>
 
-#include "common/tables/socket_address.h"
+#include "common/tables/flow.h"
 #include "common/text/print.h"
 
 // "tcp", "udp" or "unk." for an IP protocol number.
@@ -18,16 +18,10 @@ const format::name_text &flow_state_name(std::uint32_t state);
 // The label of a service class, or "UNK".
 const format::name_text &svc_class_name(std::int32_t service_class);
 
-// A flag and the letter that shows it.
-struct flag_letter {
-  std::uint32_t mask;
-  char letter;
-};
-
-// A letter for each flag that is set, "-" for each that is clear, in the order of `letters`.
+// The letter of each flag that is set, "-" for each that is clear, in the order of the names.
 struct flags_text {
   std::uint32_t flags;
-  std::span<const flag_letter> letters;  // at most 32
+  const bit_names &letters;
 
   static constexpr std::size_t text_size = 32;
   char *append_to(char *to) const;

@@ -6,30 +6,58 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "common/tables/description.h"
 #include "common/tables/uuid.h"
 #include "common/text/text.h"
 
 inline constexpr char arena_node[] = "kern.tarvel.stats.arena";
 
+inline constexpr value_names arena_types{"UNKNOWN", {{0, "NEXUS"}, {1, "PLCY"}, {2, "SYSTEM"}}};
+
+inline constexpr value_names region_types{"UNKNOWN",
+                                          {{0, "SCHEMA"},
+                                           {1, "RING"},
+                                           {2, "BUF"},
+                                           {3, "MDU"},
+                                           {4, "USD"},
+                                           {5, "USTATS"},
+                                           {6, "FLOWADV"},
+                                           {7, "NEXUSADV"},
+                                           {8, "SYSCTLS"},
+                                           {9, "MDK"},
+                                           {10, "KSD"},
+                                           {11, "KSTATS"}}};
+
+inline constexpr bit_names region_mode_names =
+    "\20"
+    "\1NOREDIRECT"
+    "\2MMAPOK"
+    "\3READONLY"
+    "\4PERSISTENT"
+    "\5MONOLITHIC"
+    "\6NOCACHE"
+    "\40MIRRORED";
+
 // How many types of regions there are: 0 to SREG_MAX - 1.
-inline constexpr std::size_t SREG_MAX = 12;
+inline constexpr std::size_t SREG_MAX = std::size(region_types.rows);
+static_assert(region_types.rows[SREG_MAX - 1].number == SREG_MAX - 1);
 
 // A region slot of an arena. A region may belong to several arenas; its UUID tells.
 struct tv_stats_region {
   text_field<64> name;
   uuid region_uuid;
-  std::int32_t type;           // SCHEMA, RING, ... in the report
-  std::uint32_t mode;          // bits that print_flags names
-  std::uint64_t seg_size_req;  // bytes, requested
-  std::uint64_t seg_size;      // bytes, effective
-  std::uint64_t seg_count;     // 0: an empty slot
-  std::uint64_t obj_size_req;  // bytes
+  std::int32_t type;
+  std::uint32_t mode;
+  std::uint64_t seg_size_req;
+  std::uint64_t seg_size;
+  std::uint64_t seg_count;
+  std::uint64_t obj_size_req;
   std::uint64_t obj_count_req;
-  std::uint64_t obj_size;  // bytes
+  std::uint64_t obj_size;
   std::uint64_t obj_count;
   std::uint64_t objs_per_seg;
-  std::uint64_t mem_total;  // bytes
-  std::uint64_t mem_wired;  // bytes; 0: not wired
+  std::uint64_t mem_total;
+  std::uint64_t mem_wired;
   std::uint64_t reserved_168;
   std::uint64_t seg_in_use;
   std::uint64_t rescales;
@@ -43,33 +71,51 @@ struct tv_stats_arena {
   static constexpr std::size_t pid_slots = 8;
 
   text_field<64> name;
-  std::int32_t type;  // NEXUS, PLCY, SYSTEM
+  std::int32_t type;
   std::uint8_t reserved_68[12];
   tv_stats_region regions[region_slots];
-  std::int32_t pids[pid_slots];  // processes that use the arena, up to the first 0
+  std::int32_t pids[pid_slots];
 };
 
 static_assert(sizeof(tv_stats_region) == 208);
-static_assert(offsetof(tv_stats_region, region_uuid) == 64);
-static_assert(offsetof(tv_stats_region, type) == 80);
-static_assert(offsetof(tv_stats_region, mode) == 84);
-static_assert(offsetof(tv_stats_region, seg_size_req) == 88);
-static_assert(offsetof(tv_stats_region, seg_size) == 96);
-static_assert(offsetof(tv_stats_region, seg_count) == 104);
-static_assert(offsetof(tv_stats_region, obj_size_req) == 112);
-static_assert(offsetof(tv_stats_region, obj_count_req) == 120);
-static_assert(offsetof(tv_stats_region, obj_size) == 128);
-static_assert(offsetof(tv_stats_region, obj_count) == 136);
-static_assert(offsetof(tv_stats_region, objs_per_seg) == 144);
-static_assert(offsetof(tv_stats_region, mem_total) == 152);
-static_assert(offsetof(tv_stats_region, mem_wired) == 160);
-static_assert(offsetof(tv_stats_region, seg_in_use) == 176);
-static_assert(offsetof(tv_stats_region, rescales) == 184);
-static_assert(offsetof(tv_stats_region, allocs) == 192);
-static_assert(offsetof(tv_stats_region, frees) == 200);
 static_assert(sizeof(tv_stats_arena) == 64 + 16 + 12 * 208 + 8 * 4);
-static_assert(offsetof(tv_stats_arena, type) == 64);
-static_assert(offsetof(tv_stats_arena, regions) == 80);
-static_assert(offsetof(tv_stats_arena, pids) == 2576);
+
+inline constexpr auto region_rows = [] {
+  using record = tv_stats_region;
+  using enum field_kind;
+  constexpr row segments = ROW(seg_count).is(gauge, "seg_count", "segments, 0: no region here");
+  // What the summary of the regions reads of an empty slot, too, is there without segments.
+  const auto of_region = [&](const row &each) { return each.unless_zero(segments); };
+  return join(of_region(ROW(name).is(field_kind::name, "name", "of the region")),
+              ROW(region_uuid).is(identifier, "region", "the same in all its arenas"),
+              ROW(type).is(enumeration, "type", "see below").of(region_types),
+              of_region(ROW(mode).is(flags, "mode", "see below").of(region_mode_names)),
+              of_region(ROW(seg_size_req).is(gauge, "seg_size_req", "of a segment, asked for").in("bytes")),
+              of_region(ROW(seg_size).is(gauge, "seg_size", "of a segment, given").in("bytes")), segments,
+              of_region(ROW(obj_size_req).is(gauge, "obj_size_req", "of an object, asked for").in("bytes")),
+              of_region(ROW(obj_count_req).is(gauge, "obj_count_req", "objects, asked for")),
+              of_region(ROW(obj_size).is(gauge, "obj_size", "of an object, given").in("bytes")),
+              of_region(ROW(obj_count).is(gauge, "obj_count", "objects, given")),
+              of_region(ROW(objs_per_seg).is(gauge, "objs_per_seg", "objects in a segment")),
+              ROW(mem_total).is(gauge, "mem_total", "memory").in("bytes"),
+              ROW(mem_wired).is(gauge, "mem_wired", "wired memory, 0: not wired").in("bytes"),
+              ROW(reserved_168), of_region(ROW(seg_in_use).is(gauge, "seg_in_use", "segments in use")),
+              of_region(ROW(rescales).is(counter, "rescales", "so far")),
+              of_region(ROW(allocs).is(counter, "allocs", "so far")),
+              of_region(ROW(frees).is(counter, "frees", "so far")));
+}();
+inline constexpr record_description region_description =
+    describe<tv_stats_region>("tv_stats_region", "region", region_rows);
+
+inline constexpr auto arena_rows = [] {
+  using record = tv_stats_arena;
+  using enum field_kind;
+  return join(ROW(name).is(field_kind::name, "name", "of the arena"),
+              ROW(type).is(enumeration, "type", "see below").of(arena_types), ROW(reserved_68),
+              ROW(regions).is(nested, "regions", "empty where seg_count is 0").of(region_description),
+              ROW(pids).is(pid, "pids", "users, up to the first 0").up_to(0));
+}();
+inline constexpr record_description arena_description =
+    describe<tv_stats_arena>("tv_stats_arena", "arena", arena_rows);
 
 #endif

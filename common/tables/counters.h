@@ -7,6 +7,7 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "common/tables/description.h"
 #include "common/tables/uuid.h"
 #include "common/text/text.h"
 
@@ -21,8 +22,6 @@ inline constexpr std::size_t ip6_counter_count = 36;
 inline constexpr std::size_t tcp_counter_count = 203;
 inline constexpr std::size_t udp_counter_count = 22;
 
-using counter_name = format::column_text<16, 24>;
-
 // The names of the counters of a block, by position. Each list is closed by an empty name.
 extern const counter_name net_if_counter_names[];
 extern const counter_name flow_switch_counter_names[];
@@ -34,7 +33,7 @@ extern const counter_name udp_counter_names[];
 // What the records of both nexus tables begin with.
 struct tv_stats_nexus_head {
   uuid nx_uuid;
-  text_field<16> name;  // of the interface
+  text_field<16> name;
 };
 
 struct tv_stats_net_if {
@@ -52,7 +51,7 @@ struct tv_stats_flow_switch {
 struct tv_stats_userstack {
   uuid nx_uuid;
   text_field<16> if_name;
-  std::int32_t pid;  // 0: the sum of ports that are closed
+  std::int32_t pid;
   std::uint8_t reserved_36[12];
   std::uint64_t ip[ip_counter_count];
   std::uint64_t reserved_392;
@@ -62,17 +61,43 @@ struct tv_stats_userstack {
   std::uint64_t udp[udp_counter_count];
 };
 
-static_assert(offsetof(tv_stats_nexus_head, name) == 16);
 static_assert(sizeof(tv_stats_net_if) == 320);
-static_assert(offsetof(tv_stats_net_if, counters) == 32);
 static_assert(sizeof(tv_stats_flow_switch) == 32 + 52 * 8);
-static_assert(offsetof(tv_stats_flow_switch, counters) == 32);
 static_assert(sizeof(tv_stats_userstack) == 2496);
-static_assert(offsetof(tv_stats_userstack, if_name) == 16);
-static_assert(offsetof(tv_stats_userstack, pid) == 32);
-static_assert(offsetof(tv_stats_userstack, ip) == 48);
-static_assert(offsetof(tv_stats_userstack, ip6) == 400);
-static_assert(offsetof(tv_stats_userstack, tcp) == 688);
-static_assert(offsetof(tv_stats_userstack, udp) == 2320);
+
+// Of a nexus with counters.
+template <class Nexus>
+constexpr auto nexus_rows(const counter_name *names) {
+  using record = Nexus;
+  using enum field_kind;
+  return join(ROW(head.nx_uuid).is(identifier, "nexus", "the nexus"),
+              ROW(head.name).is(interface, "interface", "its interface"),
+              ROW(counters).is(counter, "counters", "by position, see below").of(names));
+}
+
+inline constexpr auto net_if_rows = join(nexus_rows<tv_stats_net_if>(net_if_counter_names), [] {
+  using record = tv_stats_net_if;
+  return ROW(reserved_264);
+}());
+inline constexpr record_description net_if_description =
+    describe<tv_stats_net_if>("tv_stats_net_if", "interface", net_if_rows);
+
+inline constexpr auto flow_switch_rows = nexus_rows<tv_stats_flow_switch>(flow_switch_counter_names);
+inline constexpr record_description flow_switch_description =
+    describe<tv_stats_flow_switch>("tv_stats_flow_switch", "flow_switch", flow_switch_rows);
+
+inline constexpr auto userstack_rows = [] {
+  using record = tv_stats_userstack;
+  using enum field_kind;
+  return join(ROW(nx_uuid).is(identifier, "nexus", "the nexus"),
+              ROW(if_name).is(interface, "interface", "interface"),
+              ROW(pid).is(field_kind::pid, "pid", "process, 0: all ports now closed"), ROW(reserved_36),
+              ROW(ip).is(counter, "ip", "by position").of(ip_counter_names), ROW(reserved_392),
+              ROW(ip6).is(counter, "ip6", "by position").of(ip6_counter_names),
+              ROW(tcp).is(counter, "tcp", "by position").of(tcp_counter_names), ROW(reserved_2312),
+              ROW(udp).is(counter, "udp", "by position").of(udp_counter_names));
+}();
+inline constexpr record_description userstack_description =
+    describe<tv_stats_userstack>("tv_stats_userstack", "userstack", userstack_rows);
 
 #endif

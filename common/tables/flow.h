@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "common/tables/description.h"
 #include "common/tables/socket_address.h"
 #include "common/tables/uuid.h"
 #include "common/text/text.h"
@@ -18,55 +19,130 @@ inline constexpr char flow_route_node[] = "kern.tarvel.stats.flow_route";
 // In an index field: there is none.
 inline constexpr std::uint32_t no_index = 0xffffffff;
 
+inline constexpr value_names flow_states{"UNKNOWN",
+                                         {{0, "CLOSED"},
+                                          {1, "LISTEN"},
+                                          {2, "SYN_SENT"},
+                                          {3, "SYN_RCVD"},
+                                          {4, "ESTABLISHED"},
+                                          {5, "CLOSE_WAIT"},
+                                          {6, "FIN_WAIT_1"},
+                                          {7, "CLOSING"},
+                                          {8, "LAST_ACK"},
+                                          {9, "FIN_WAIT_2"},
+                                          {10, "TIME_WAIT"},
+                                          // Of flows without connection state.
+                                          {20, "NO_TRAFFIC"},
+                                          {21, "SINGLE"},
+                                          {22, "MULTIPLE"}}};
+
+inline constexpr value_names service_classes{"UNK",
+                                             {{0x000000, "BE"},
+                                              {0x080090, "BKS"},
+                                              {0x100080, "BK"},
+                                              {0x180010, "RD"},
+                                              {0x200020, "OAM"},
+                                              {0x280120, "AV"},
+                                              {0x300110, "RV"},
+                                              {0x380100, "VI"},
+                                              {0x400180, "VO"},
+                                              {0x480190, "CTL"}}};
+
+inline constexpr bit_names flow_flag_names =
+    "\20"
+    "\5t"
+    "\6c"
+    "\7l"
+    "\11q"
+    "\12b"
+    "\15w"
+    "\16e"
+    "\31a"
+    "\32n"
+    "\33d"
+    "\34o"
+    "\37x"
+    "\40r";
+
+inline constexpr bit_names route_flag_names =
+    "\20"
+    "\5o"
+    "\6g"
+    "\7r"
+    "\10i"
+    "\11d";
+
+inline constexpr bit_names advisory_flag_names =
+    "\20"
+    "\1VALID"
+    "\2CONTROLLED";
+
+// An end of a flow.
 struct tv_flow_endpoint_stats {
   std::uint64_t bytes;
   std::uint64_t packets;
-  std::uint32_t state;  // flow_state_name
-  std::uint32_t rtt;    // microseconds; 0: not measured
+  std::uint32_t state;
+  std::uint32_t rtt;
   std::uint8_t reserved_24[40];
 };
 
 static_assert(sizeof(tv_flow_endpoint_stats) == 64);
-static_assert(offsetof(tv_flow_endpoint_stats, bytes) == 0);
-static_assert(offsetof(tv_flow_endpoint_stats, packets) == 8);
-static_assert(offsetof(tv_flow_endpoint_stats, state) == 16);
-static_assert(offsetof(tv_flow_endpoint_stats, rtt) == 20);
 
 // A flow. The table is an array of these.
 struct tv_stats_flow {
-  uuid sf_nx_uuid;  // the flow switch that carries the flow
+  uuid sf_nx_uuid;
   text_field<16> sf_if_name;
-  std::uint32_t sf_bucket;  // or no_index
+  std::uint32_t sf_bucket;
   text_field<32> sf_proc_name;
   std::int32_t sf_pid;
-  std::uint32_t sf_flags;    // flow_flags_text
-  std::uint32_t sf_nx_port;  // or no_index
-  socket_address sf_local;   // its family holds for both endpoints
-  socket_address sf_remote;  // its family is not read
-  std::uint8_t sf_protocol;  // IP protocol number
+  std::uint32_t sf_flags;
+  std::uint32_t sf_nx_port;
+  socket_address sf_local;
+  socket_address sf_remote;
+  std::uint8_t sf_protocol;
   std::uint8_t reserved_137[3];
-  std::int32_t sf_svc;       // svc_class_name
-  std::uint32_t sf_adv_idx;  // among the advisory entries of the nexus, or no_index
+  std::int32_t sf_svc;
+  std::uint32_t sf_adv_idx;
   std::uint8_t reserved_148[4];
-  tv_flow_endpoint_stats sf_lstats;  // outgoing traffic
-  tv_flow_endpoint_stats sf_rstats;  // incoming traffic
+  tv_flow_endpoint_stats sf_lstats;
+  tv_flow_endpoint_stats sf_rstats;
   std::uint8_t reserved_280[40];
 };
 
 static_assert(sizeof(tv_stats_flow) == 320);
-static_assert(offsetof(tv_stats_flow, sf_if_name) == 16);
-static_assert(offsetof(tv_stats_flow, sf_bucket) == 32);
-static_assert(offsetof(tv_stats_flow, sf_proc_name) == 36);
-static_assert(offsetof(tv_stats_flow, sf_pid) == 68);
-static_assert(offsetof(tv_stats_flow, sf_flags) == 72);
-static_assert(offsetof(tv_stats_flow, sf_nx_port) == 76);
-static_assert(offsetof(tv_stats_flow, sf_local) == 80);
-static_assert(offsetof(tv_stats_flow, sf_remote) == 108);
-static_assert(offsetof(tv_stats_flow, sf_protocol) == 136);
-static_assert(offsetof(tv_stats_flow, sf_svc) == 140);
-static_assert(offsetof(tv_stats_flow, sf_adv_idx) == 144);
-static_assert(offsetof(tv_stats_flow, sf_lstats) == 152);
-static_assert(offsetof(tv_stats_flow, sf_rstats) == 216);
+
+constexpr auto endpoint_rows(const row &whole) {
+  using record = tv_flow_endpoint_stats;
+  using enum field_kind;
+  return join(
+      ROW(bytes).is(counter, "bytes", "bytes so far").in("bytes").part_of(whole),
+      ROW(packets).is(counter, "packets", "packets so far").in("packets").part_of(whole),
+      ROW(state).is(enumeration, "state", "see below").of(flow_states).part_of(whole),
+      ROW(rtt).is(gauge, "rtt_us", "round-trip time, 0: not measured").in("us").or_none(0).part_of(whole),
+      ROW(reserved_24).part_of(whole));
+}
+
+inline constexpr auto flow_rows = [] {
+  using record = tv_stats_flow;
+  using enum field_kind;
+  constexpr row family = ROW(sf_local.family);
+  return join(ROW(sf_nx_uuid).is(identifier, "nexus", "the flow switch"),
+              ROW(sf_if_name).is(interface, "interface", "interface"),
+              ROW(sf_bucket).is(number, "bucket", "bucket of the flow, or none").or_none(no_index),
+              ROW(sf_proc_name).is(process, "process", "owner"), ROW(sf_pid).is(pid, "pid", "owner"),
+              ROW(sf_flags).is(flags, "flags", "see below").of(flow_flag_names),
+              ROW(sf_nx_port).is(number, "port", "port of the nexus, or none").or_none(no_index),
+              address_rows(ROW(sf_local).is(nested, "local", "its family holds for both"), family, true),
+              address_rows(ROW(sf_remote).is(nested, "remote", "its family is not read"), family, true),
+              ROW(sf_protocol).is(enumeration, "protocol", "6 TCP, 17 UDP").of(ip_protocols),
+              ROW(reserved_137),
+              ROW(sf_svc).is(enumeration, "service_class", "see below").of(service_classes),
+              ROW(sf_adv_idx).is(number, "advisory", "index of its advisory, or none").or_none(no_index),
+              ROW(reserved_148), endpoint_rows(ROW(sf_lstats).is(nested, "tx", "local end: sent")),
+              endpoint_rows(ROW(sf_rstats).is(nested, "rx", "remote end: received")), ROW(reserved_280));
+}();
+inline constexpr record_description flow_description =
+    describe<tv_stats_flow>("tv_stats_flow", "flow", flow_rows);
 
 // The advisories of a flow switch. Its entries, `sfa_entries`, follow, then the next record.
 struct tv_stats_flow_adv {
@@ -82,9 +158,6 @@ struct tv_stats_flow_adv {
 };
 
 struct tv_stats_flow_adv_entry {
-  static constexpr std::uint32_t valid = 1;  // bits of `sfae_flags`
-  static constexpr std::uint32_t controlled = 2;
-
   uuid sfae_flow_uuid;
   std::uint32_t sfae_flags;
 };
@@ -94,11 +167,30 @@ inline std::uint64_t tv_stats_flow_adv::trailing_size() const {
 }
 
 static_assert(sizeof(tv_stats_flow_adv) == 40);
-static_assert(offsetof(tv_stats_flow_adv, sfa_if_name) == 16);
-static_assert(offsetof(tv_stats_flow_adv, sfa_pid) == 32);
-static_assert(offsetof(tv_stats_flow_adv, sfa_entries_count) == 36);
 static_assert(sizeof(tv_stats_flow_adv_entry) == 20);
-static_assert(offsetof(tv_stats_flow_adv_entry, sfae_flags) == 16);
+
+inline constexpr auto advisory_entry_rows = [] {
+  using record = tv_stats_flow_adv_entry;
+  using enum field_kind;
+  return join(ROW(sfae_flow_uuid).is(identifier, "flow", "the flow"),
+              ROW(sfae_flags).is(flags, "flags", "see below").of(advisory_flag_names));
+}();
+inline constexpr record_description advisory_entry_description =
+    describe<tv_stats_flow_adv_entry>("tv_stats_flow_adv_entry", "entry", advisory_entry_rows);
+
+inline constexpr auto advisory_rows = [] {
+  using record = tv_stats_flow_adv;
+  using enum field_kind;
+  return join(ROW(sfa_nx_uuid).is(identifier, "nexus", "the flow switch"),
+              ROW(sfa_if_name).is(interface, "interface", "interface"),
+              ROW(sfa_pid).is(pid, "pid", "process"),
+              ROW(sfa_entries_count).is(number, "entries", "entries that follow, up to 512"));
+}();
+inline constexpr follower advisory_followers[] = {{"entries", row_at(advisory_rows, "sfa_entries_count"),
+                                                   &advisory_entry_description,
+                                                   tv_stats_flow_adv::max_entries}};
+inline constexpr record_description advisory_description =
+    describe<tv_stats_flow_adv>("tv_stats_flow_adv", "flow_advisory", advisory_rows, advisory_followers);
 
 // The owner of a nexus port. The table is an array of these.
 struct tv_stats_flow_owner {
@@ -108,24 +200,31 @@ struct tv_stats_flow_owner {
   text_field<32> sfo_proc_name;
   std::int32_t sfo_pid;
   std::uint32_t sfo_nx_port;
-  std::uint32_t sfo_pid_bound;  // not 0: bound to the process id
-  std::uint32_t sfo_destroyed;  // not 0: destroyed
+  std::uint32_t sfo_pid_bound;
+  std::uint32_t sfo_destroyed;
   std::uint8_t reserved_84[44];
 };
 
 static_assert(sizeof(tv_stats_flow_owner) == 128);
-static_assert(offsetof(tv_stats_flow_owner, sfo_if_name) == 16);
-static_assert(offsetof(tv_stats_flow_owner, sfo_bucket) == 32);
-static_assert(offsetof(tv_stats_flow_owner, sfo_proc_name) == 36);
-static_assert(offsetof(tv_stats_flow_owner, sfo_pid) == 68);
-static_assert(offsetof(tv_stats_flow_owner, sfo_nx_port) == 72);
-static_assert(offsetof(tv_stats_flow_owner, sfo_pid_bound) == 76);
-static_assert(offsetof(tv_stats_flow_owner, sfo_destroyed) == 80);
+
+inline constexpr auto owner_rows = [] {
+  using record = tv_stats_flow_owner;
+  using enum field_kind;
+  return join(ROW(sfo_nx_uuid).is(identifier, "nexus", "the flow switch"),
+              ROW(sfo_if_name).is(interface, "interface", "interface"),
+              ROW(sfo_bucket).is(number, "bucket", "bucket of the owner"),
+              ROW(sfo_proc_name).is(process, "process", "owner"), ROW(sfo_pid).is(pid, "pid", "owner"),
+              ROW(sfo_nx_port).is(number, "port", "port of the nexus"),
+              ROW(sfo_pid_bound).is(number, "pid_bound", "not 0: bound to the process id"),
+              ROW(sfo_destroyed).is(number, "destroyed", "not 0: destroyed"), ROW(reserved_84));
+}();
+inline constexpr record_description owner_description =
+    describe<tv_stats_flow_owner>("tv_stats_flow_owner", "flow_owner", owner_rows);
 
 // A flow route. The table is an array of these.
 struct tv_stats_flow_route {
-  static constexpr std::uint32_t has_gateway = 0x20;  // bits of `sfr_flags`
-  static constexpr std::uint32_t has_mac = 0x80;
+  static constexpr std::uint32_t has_gateway = route_flag_names.bit("g");
+  static constexpr std::uint32_t has_mac = route_flag_names.bit("i");
 
   std::uint8_t reserved_0[32];
   text_field<16> sfr_if_name;
@@ -135,23 +234,36 @@ struct tv_stats_flow_route {
   std::uint32_t sfr_refs;
   std::int64_t sfr_expire;
   socket_address sfr_local;
-  socket_address sfr_remote;   // its family holds for all three addresses
-  socket_address sfr_gateway;  // where has_gateway is set
+  socket_address sfr_remote;
+  socket_address sfr_gateway;
   std::uint8_t reserved_156[36];
-  std::uint8_t sfr_mac[6];  // of the next hop, where has_mac is set
+  std::uint8_t sfr_mac[6];
   std::uint8_t reserved_198[58];
 };
 
 static_assert(sizeof(tv_stats_flow_route) == 256);
-static_assert(offsetof(tv_stats_flow_route, sfr_if_name) == 32);
-static_assert(offsetof(tv_stats_flow_route, sfr_bidx) == 48);
-static_assert(offsetof(tv_stats_flow_route, sfr_ibidx) == 52);
-static_assert(offsetof(tv_stats_flow_route, sfr_flags) == 56);
-static_assert(offsetof(tv_stats_flow_route, sfr_refs) == 60);
-static_assert(offsetof(tv_stats_flow_route, sfr_expire) == 64);
-static_assert(offsetof(tv_stats_flow_route, sfr_local) == 72);
-static_assert(offsetof(tv_stats_flow_route, sfr_remote) == 100);
-static_assert(offsetof(tv_stats_flow_route, sfr_gateway) == 128);
-static_assert(offsetof(tv_stats_flow_route, sfr_mac) == 192);
+
+inline constexpr auto route_rows = [] {
+  using record = tv_stats_flow_route;
+  using enum field_kind;
+  constexpr row family = ROW(sfr_remote.family);
+  constexpr row bits = ROW(sfr_flags).is(flags, "flags", "see below").of(route_flag_names);
+  return join(
+      ROW(reserved_0), ROW(sfr_if_name).is(interface, "interface", "interface"),
+      ROW(sfr_bidx).is(number, "bidx", "bucket"), ROW(sfr_ibidx).is(number, "ibidx", "second bucket"), bits,
+      ROW(sfr_refs).is(gauge, "refs", "users of the route"),
+      ROW(sfr_expire).is(gauge, "expire", "expiry, as the kernel keeps it"),
+      address_rows(ROW(sfr_local).is(nested, "local", "its port is not read"), family, false),
+      address_rows(ROW(sfr_remote).is(nested, "remote", "its family holds for all three"), family, false),
+      address_rows(ROW(sfr_gateway)
+                       .is(nested, "gateway", "where flag 0x20 is set")
+                       .where_bit(bits, record::has_gateway),
+                   family, false),
+      ROW(reserved_156),
+      ROW(sfr_mac).is(mac, "mac", "next hop, where flag 0x80 is set").where_bit(bits, record::has_mac),
+      ROW(reserved_198));
+}();
+inline constexpr record_description route_description =
+    describe<tv_stats_flow_route>("tv_stats_flow_route", "flow_route", route_rows);
 
 #endif

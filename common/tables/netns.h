@@ -6,16 +6,15 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "common/tables/description.h"
+
 inline constexpr char netns_node[] = "kern.tarvel.stats.netns";
 
 // The head of a namespace. `entry_count` ranges follow, then the next record.
 struct tv_stats_netns {
-  static constexpr std::uint8_t tcp = 6;  // values of `protocol`
-  static constexpr std::uint8_t udp = 17;
-
-  std::uint8_t address[16];     // network byte order; the first `address_length` bytes count
-  std::uint8_t address_length;  // 4: IPv4, 16: IPv6, any other: the global namespace
-  std::uint8_t protocol;        // any value but udp is shown as TCP
+  std::uint8_t address[16];
+  std::uint8_t address_length;
+  std::uint8_t protocol;
   std::uint8_t entry_count;
   std::uint8_t reserved_19[13];
 
@@ -24,10 +23,10 @@ struct tv_stats_netns {
 };
 
 struct tv_stats_netns_range {
-  std::uint16_t first_port;  // host byte order
-  std::uint16_t last_port;   // 0: a single port
-  std::int32_t subsystem;    // reservations of the kernel subsystem
-  std::int32_t bsd;          // reservations of BSD sockets
+  std::uint16_t first_port;
+  std::uint16_t last_port;
+  std::int32_t subsystem;
+  std::int32_t bsd;
   std::uint8_t reserved_12[4];
   std::int32_t listeners;
   std::uint8_t reserved_20[12];
@@ -38,13 +37,33 @@ inline std::uint64_t tv_stats_netns::trailing_size() const {
 }
 
 static_assert(sizeof(tv_stats_netns) == 32);
-static_assert(offsetof(tv_stats_netns, address_length) == 16);
-static_assert(offsetof(tv_stats_netns, protocol) == 17);
-static_assert(offsetof(tv_stats_netns, entry_count) == 18);
 static_assert(sizeof(tv_stats_netns_range) == 32);
-static_assert(offsetof(tv_stats_netns_range, last_port) == 2);
-static_assert(offsetof(tv_stats_netns_range, subsystem) == 4);
-static_assert(offsetof(tv_stats_netns_range, bsd) == 8);
-static_assert(offsetof(tv_stats_netns_range, listeners) == 16);
+
+inline constexpr auto range_rows = [] {
+  using record = tv_stats_netns_range;
+  using enum field_kind;
+  return join(ROW(first_port).is(number, "first", "machine's byte order"),
+              ROW(last_port).is(number, "last", "0: a single port").or_none(0),
+              ROW(subsystem).is(gauge, "tarvel", "reservations of the subsystem"),
+              ROW(bsd).is(gauge, "bsd", "reservations of sockets"), ROW(reserved_12),
+              ROW(listeners).is(gauge, "listeners", "listeners"), ROW(reserved_20));
+}();
+inline constexpr record_description range_description =
+    describe<tv_stats_netns_range>("tv_stats_netns_range", "range", range_rows);
+
+inline constexpr auto netns_rows = [] {
+  using record = tv_stats_netns;
+  using enum field_kind;
+  constexpr row length =
+      ROW(address_length).is(number, "address_length", "4: IPv4, 16: IPv6, others: global");
+  return join(
+      ROW(address).is(field_kind::address, "address", "its first address_length bytes").cut_to(length),
+      length, ROW(protocol).is(enumeration, "protocol", "17: UDP, others: TCP, by rights 6").of(ip_protocols),
+      ROW(entry_count).is(number, "ranges", "ranges that follow"), ROW(reserved_19));
+}();
+inline constexpr follower netns_followers[] = {
+    {"ranges", row_at(netns_rows, "entry_count"), &range_description}};
+inline constexpr record_description netns_description =
+    describe<tv_stats_netns>("tv_stats_netns", "netns", netns_rows, netns_followers);
 
 #endif

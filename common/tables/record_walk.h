@@ -45,7 +45,6 @@ class record_walk {
     return false;
   }
 
- private:
   // Points `bytes` at the next `count` bytes and steps over them. False where fewer remain. A count is
   // computed in 64 bits, so that what a table claims cannot wrap around.
   bool take(std::uint64_t count, std::span<const std::byte> &bytes) {
@@ -55,6 +54,7 @@ class record_walk {
     return true;
   }
 
+ private:
   std::span<const std::byte> rest_;
 };
 

@@ -6,10 +6,13 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "common/tables/description.h"
+
 // The kernel's numbers of address families, whatever this system's constants are.
+inline constexpr value_names address_families{"unknown", {{2, "IPv4"}, {30, "IPv6"}}};
 namespace address_family {
-inline constexpr std::uint8_t ipv4 = 2;
-inline constexpr std::uint8_t ipv6 = 30;
+inline constexpr std::uint8_t ipv4 = address_families.number("IPv4");
+inline constexpr std::uint8_t ipv6 = address_families.number("IPv6");
 }  // namespace address_family
 
 // Addresses in network byte order. Their texts are made without any look-up: a dotted quad, and the form of
@@ -29,18 +32,40 @@ struct ipv6_address {
 
 // The family says which of the two addresses is meant.
 struct socket_address {
-  std::uint8_t length;  // not read
+  std::uint8_t length;
   std::uint8_t family;
-  std::uint16_t port;  // network byte order
-  ipv4_address ipv4;   // the flow label of an IPv6 address, not read
+  std::uint16_t port;
+  ipv4_address ipv4;
   ipv6_address ipv6;
-  std::uint32_t scope_id;  // not read
+  std::uint32_t scope_id;
 };
 
 static_assert(sizeof(socket_address) == 28);
-static_assert(offsetof(socket_address, family) == 1);
-static_assert(offsetof(socket_address, port) == 2);
-static_assert(offsetof(socket_address, ipv4) == 4);
-static_assert(offsetof(socket_address, ipv6) == 8);
+
+// Of an address that is part of a record, where one of its families decides for all of them.
+constexpr auto address_rows(const row &whole, const row &family, bool has_port) {
+  using record = socket_address;
+  using enum field_kind;
+  const row of_family = ROW(family).part_of(whole);
+  const row of_port = ROW(port).as(field_type::net16).part_of(whole);
+  return join(ROW(length).part_of(whole),
+              of_family.offset == family.offset
+                  ? of_family.is(enumeration, "family", "2: IPv4, 30: IPv6").of(address_families)
+                  : of_family,
+              has_port ? of_port.is(number, "port", "network byte order")
+                             .where(family, address_family::ipv4, address_family::ipv6)
+                       : of_port,
+              ROW(ipv4)
+                  .as(field_type::bytes)
+                  .is(address, "address", "of an IPv6 address not read")
+                  .where(family, address_family::ipv4)
+                  .part_of(whole),
+              ROW(ipv6)
+                  .as(field_type::bytes)
+                  .is(address, "address", "of an IPv4 address not read")
+                  .where(family, address_family::ipv6)
+                  .part_of(whole),
+              ROW(scope_id).part_of(whole));
+}
 
 #endif

@@ -46,6 +46,13 @@ struct bit_names {
     format::small_text<24> name = "";
   };
 
+  // The bit of this name. A name that is none does not compile.
+  consteval std::uint32_t bit(std::string_view name) const {
+    std::size_t i = 0;
+    while (entries[i].name.view() != name) ++i;
+    return entries[i].bit;
+  }
+
   bool is_octal;
   std::size_t count = 0;
   entry entries[32];

@@ -57,7 +57,7 @@ struct small_text {
     std::copy_n(text, N, chars);
   }
 
-  std::string_view view() const { return {chars, size}; }
+  constexpr std::string_view view() const { return {chars, size}; }
 
   // Sets the size to where appending to `chars` ended.
   void end_at(const char *end) { size = static_cast<std::size_t>(end - chars); }
