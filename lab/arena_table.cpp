@@ -172,11 +172,4 @@ void write_arenas(const world &state, table_file &file) {
   }
 }
 
-void pids_of_arenas(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
-  tv_stats_arena arena;
-  for (record_walk walk(table); walk.take(arena);) {
-    pids.insert(pids.end(), arena.pids, std::ranges::find(arena.pids, 0));
-  }
-}
-
 }  // namespace lab

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "common/tables/kernel_table.h"
+#include "common/tables/table_walk.h"
 #include "common/text/output.h"
 #include "common/text/text.h"
 #include "lab/capture_directory.h"
@@ -38,19 +39,20 @@ struct snapshot {
   std::vector<std::pair<std::int32_t, std::string>> processes;  // in the order in which they are mentioned
 };
 
-// Who is gone has no name.
-void fetch_processes(snapshot &taken) {
-  std::vector<std::int32_t> pids;
-  for (const fetched_table &fetched : taken.tables) {
-    if (fetched.source->mentioned) fetched.source->mentioned(fetched.content.bytes(), pids);
-  }
-  std::unordered_set<std::int32_t> asked;
-  for (const std::int32_t pid : pids) {
-    char name[platform::process_name_size];
-    if (asked.insert(pid).second && platform::query_process_name(pid, name)) {
-      taken.processes.emplace_back(pid, name);
+// Adds the name of each process that a table mentions, whatever its bytes are. Who is gone has none.
+void fetch_processes(const fetched_table &fetched, std::unordered_set<std::int32_t> &asked, snapshot &taken) {
+  walk_table(*fetched.source->what->record, fetched.content.bytes(), [&](const found_record &found) {
+    for (const row &field : found.what->rows) {
+      if (field.kind != field_kind::pid) continue;
+      for (std::size_t i = 0; i < field.count_in(found.bytes); ++i) {
+        const auto pid = static_cast<std::int32_t>(field.at(i).in(found.bytes));
+        char name[platform::process_name_size];
+        if (asked.insert(pid).second && platform::query_process_name(pid, name)) {
+          taken.processes.emplace_back(pid, name);
+        }
+      }
     }
-  }
+  });
 }
 
 // What has been saved so far.
@@ -67,7 +69,7 @@ int kernel_error() {
   int error = 0;
   for (const table &row : tables) {
     std::size_t length = 0;
-    if (sysctlbyname(row.node, nullptr, &length, nullptr, 0) == 0) return 0;
+    if (sysctlbyname(row.what->node, nullptr, &length, nullptr, 0) == 0) return 0;
     error = errno;
   }
   return error;
@@ -87,30 +89,17 @@ snapshot fetch(tally &saved) {
   if (!kernel_is_there(saved)) return taken;
   for (const table &row : tables) {
     fetched_table fetched{&row, {}};
-    if (fetched.content.fetch(row.node) == 0) {
+    if (fetched.content.fetch(row.what->node) == 0) {
       taken.tables.push_back(std::move(fetched));
     } else if (kernel_is_there(saved)) {
-      complain<"tarvellab: %s is left out\n">(row.node);
+      complain<"tarvellab: %s is left out\n">(row.what->node);
     } else {
       return {};
     }
   }
-  fetch_processes(taken);
+  std::unordered_set<std::int32_t> asked;
+  for (const fetched_table &fetched : taken.tables) fetch_processes(fetched, asked, taken);
   return taken;
-}
-
-// Writes a table with substitutes. False where there is nothing to keep of it.
-bool put_redacted(const fetched_table &fetched, substitutes &by, table_file &file) {
-  const char *node = fetched.source->node;
-  const redaction done = redact_table(node, fetched.content.bytes(), by, file);
-  if (done == redaction::unknown) {
-    complain<"tarvellab: %s is left out: it is not known how to redact it\n">(node);
-    return false;
-  }
-  if (done == redaction::cut) {
-    complain<"tarvellab: %s is cut: the rest of it cannot be redacted\n">(node);
-  }
-  return true;
 }
 
 // Saves a moment, redacted where there are substitutes.
@@ -123,9 +112,11 @@ bool save(const snapshot &taken, own_directory top, substitutes *by, tally &save
     ++with.names;
   }
   for (const fetched_table &fetched : taken.tables) {
-    table_file file = root.new_table(fetched.source->node);
-    if (by && !put_redacted(fetched, *by, file)) continue;
+    table_file file = root.new_table(fetched.source->what->node);
     if (!by) file.put(fetched.content.bytes());
+    if (by && !redact_table(*fetched.source->what, fetched.content.bytes(), *by, file)) {
+      complain<"tarvellab: %s is cut: the rest of it cannot be redacted\n">(fetched.source->what->node);
+    }
     if (!file.commit()) return false;
     ++with.tables;
     with.bytes += file.size();

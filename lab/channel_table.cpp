@@ -117,18 +117,6 @@ void write_channels(const world &state, table_file &file) {
   }
 }
 
-void pids_of_channels(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
-  record_walk walk(table);
-  for (nexus_channel_header header; walk.take(header);) {
-    channel_entry entry;
-    std::span<const std::byte> rings;
-    for (std::uint32_t left = header.channel_count; left; --left) {
-      if (!walk.take(entry, rings)) return;
-      pids.push_back(entry.pid);
-    }
-  }
-}
-
 void write_ring_stat_enable(const world & /*state*/, table_file &file) {
   file.put(std::byte{1});
 }

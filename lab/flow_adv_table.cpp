@@ -26,12 +26,4 @@ void write_advisories(const world &state, table_file &file) {
   }
 }
 
-void pids_of_advisories(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
-  record_walk walk(table);
-  std::span<const std::byte> entries;
-  for (tv_stats_flow_adv record; walk.take(record, entries);) {
-    pids.push_back(record.sfa_pid);
-  }
-}
-
 }  // namespace lab

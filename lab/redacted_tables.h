@@ -3,23 +3,16 @@
 #ifndef TARVELCTL_LAB_REDACTED_TABLES_H
 #define TARVELCTL_LAB_REDACTED_TABLES_H
 
-#include <cstddef>
-#include <cstdint>
-#include <span>
-#include <string_view>
-
+#include "common/tables/tables.h"
 #include "lab/substitutes.h"
 #include "lab/table_file.h"
 
 namespace lab {
 
-enum class redaction : std::uint8_t { whole, cut, unknown };
-
 // Writes the bytes of a table with what its records may show: numbers and UUIDs that reports read, and
-// substitutes for addresses and names; all else is zero. A table that ends inside a record is cut before it;
-// of one that is not known, nothing is written.
-redaction redact_table(std::string_view node, std::span<const std::byte> table, substitutes &by,
-                       table_file &file);
+// substitutes for addresses and names; all else is zero. Returns false where the table ends inside a record,
+// or holds more than anyone reads: all from there on is left out.
+bool redact_table(const table_description &table, record_bytes bytes, substitutes &by, table_file &file);
 
 }  // namespace lab
 

@@ -45,7 +45,7 @@ bool remove_name(const own_directory &processes, const std::string &pid) {
 
 bool root_directory::prepare() {
   for (const table &row : tables) {
-    if (!folder_of(row.node, top_, &own_directory::make_below).is_open()) return false;
+    if (!folder_of(row.what->node, top_, &own_directory::make_below).is_open()) return false;
   }
   return true;
 }
@@ -74,7 +74,7 @@ bool root_directory::publish(const world &state) {
     if (!put_process(source.pid, programs[source.program].name)) return false;
   }
   for (const table &row : tables) {
-    table_file file = new_table(row.node);
+    table_file file = new_table(row.what->node);
     row.write(state, file);
     if (!file.commit()) return false;
   }

@@ -1,33 +1,27 @@
 #include "lab/tables.h"
 
-#include "common/tables/arena.h"
-#include "common/tables/channel.h"
-#include "common/tables/counters.h"
-#include "common/tables/flow.h"
-#include "common/tables/netns.h"
-#include "common/tables/provider.h"
-
 namespace lab {
 
 namespace {
 
-constexpr table all_tables[] = {
-    {provider_list_node, write_providers, nullptr},
-    {arena_node, write_arenas, pids_of_arenas},
-    {ring_stat_enable_node, write_ring_stat_enable, nullptr},
-    {channel_list_node, write_channels, pids_of_channels},
-    {flow_adv_node, write_advisories, pids_of_advisories},
-    {flow_owner_node, write_owners, pids_of_array<tv_stats_flow_owner, &tv_stats_flow_owner::sfo_pid>},
-    {flow_route_node, write_routes, nullptr},
-    {net_if_node, write_net_ifs, nullptr},
-    {flow_switch_node, write_flow_switches, nullptr},
-    {userstack_node, write_userstacks, pids_of_array<tv_stats_userstack, &tv_stats_userstack::pid>},
-    {netns_node, write_namespaces, nullptr},
-    {flow_node, write_flows, pids_of_array<tv_stats_flow, &tv_stats_flow::sf_pid>},
+constexpr table rows[] = {
+    {&table_of(provider_list_node), write_providers},
+    {&table_of(arena_node), write_arenas},
+    {&table_of(ring_stat_enable_node), write_ring_stat_enable},
+    {&table_of(channel_list_node), write_channels},
+    {&table_of(flow_adv_node), write_advisories},
+    {&table_of(flow_owner_node), write_owners},
+    {&table_of(flow_route_node), write_routes},
+    {&table_of(net_if_node), write_net_ifs},
+    {&table_of(flow_switch_node), write_flow_switches},
+    {&table_of(userstack_node), write_userstacks},
+    {&table_of(netns_node), write_namespaces},
+    {&table_of(flow_node), write_flows},
 };
+static_assert(std::size(rows) == std::size(all_tables));
 
 }  // namespace
 
-const std::span<const table> tables = all_tables;
+const std::span<const table> tables = rows;
 
 }  // namespace lab

@@ -1,4 +1,4 @@
-// Every table of the kernel: how the world looks in it, and whom it mentions.
+// Every table of the kernel: how the world looks in it.
 
 #ifndef TARVELCTL_LAB_TABLES_H
 #define TARVELCTL_LAB_TABLES_H
@@ -10,7 +10,7 @@
 #include <string_view>
 #include <vector>
 
-#include "common/tables/record_walk.h"
+#include "common/tables/tables.h"
 #include "common/text/text.h"
 #include "lab/table_file.h"
 #include "lab/world.h"
@@ -18,14 +18,10 @@
 namespace lab {
 
 struct table {
-  const char *node;
+  const table_description *what;
 
   // Writes the table's bytes.
   void (*write)(const world &, table_file &);
-
-  // Adds the ids of the processes that the bytes of such a table mention, whatever they are: the table may be
-  // cut or wrong. Null where a table mentions none.
-  void (*mentioned)(std::span<const std::byte>, std::vector<std::int32_t> &);
 };
 
 // In the order in which they are published: what others refer to comes first.
@@ -44,16 +40,6 @@ void write_flow_switches(const world &, table_file &);
 void write_userstacks(const world &, table_file &);
 void write_arenas(const world &, table_file &);
 void write_namespaces(const world &, table_file &);
-void pids_of_channels(std::span<const std::byte>, std::vector<std::int32_t> &);
-void pids_of_advisories(std::span<const std::byte>, std::vector<std::int32_t> &);
-void pids_of_arenas(std::span<const std::byte>, std::vector<std::int32_t> &);
-
-// The ids in a field of an array of records.
-template <class Record, std::int32_t Record::*Pid>
-void pids_of_array(std::span<const std::byte> table, std::vector<std::int32_t> &pids) {
-  Record record;
-  for (record_walk walk(table); walk.take(record);) pids.push_back(record.*Pid);
-}
 
 // Fills a text field: cut to its width, the rest NUL.
 template <std::size_t Width>

@@ -19,9 +19,9 @@ record_bytes of(std::string_view table) {
 std::string visited(const record_description &what, const std::string &table) {
   std::string text;
   const bool is_whole = walk_table(what, of(table), [&](const found_record &found) {
-    text += std::string(found.what->noun);
-    for (const record_bytes &each : found.followers) text += " " + std::to_string(each.size());
-    text += ", ";
+    text.append(found.what->noun);
+    for (const record_bytes &each : found.followers) text.append(1, ' ').append(std::to_string(each.size()));
+    text.append(", ");
   });
   return text + (is_whole ? "whole" : "cut");
 }
@@ -56,7 +56,8 @@ TEST(description, NumbersAreReadAsTheyLie) {
 }
 
 TEST(description, AFieldHoldsWhereOthersSaySo) {
-  const auto holds = [](const auto &rows, std::string_view part, std::string_view field, const std::string &record) {
+  const auto holds = [](const auto &rows, std::string_view part, std::string_view field,
+                        const std::string &record) {
     for (const row &each : rows) {
       if (each.part == part && each.field == field) return each.holds(of(record));
     }

@@ -4,6 +4,13 @@
 
 #include <cstring>
 
+std::size_t row::count_in(record_bytes record) const {
+  if (!holds(record)) return 0;
+  std::size_t found = 0;
+  while (found < count && !(ends_at_none && at(found).in(record) == none)) ++found;
+  return found;
+}
+
 std::int64_t number_at::in(record_bytes record) const {
   const auto read = [&]<class Number>(Number value) {
     std::memcpy(&value, record.data() + offset, sizeof value);

@@ -94,7 +94,13 @@ struct row {
   std::optional<std::uint32_t> none = {};  // the number that means that there is none
   bool ends_at_none = false;               // elements from the first `none` on say nothing
 
-  constexpr number_at at() const { return {offset, type}; }
+  constexpr number_at at(std::size_t element = 0) const {
+    return {static_cast<std::uint16_t>(offset + element * size), type};
+  }
+
+  // How many of its elements say anything.
+  std::size_t count_in(record_bytes record) const;
+
   bool holds(record_bytes record) const { return condition.holds(record) && of_part.holds(record); }
 
   template <class Member>
@@ -148,7 +154,7 @@ struct follower {
   std::string_view name;  // what programs call them
   number_at count;
   const record_description *each;
-  std::uint64_t most = UINT64_MAX;  // where there are more, none of them says anything
+  std::int64_t most = INT64_MAX;  // where there are more, none of them says anything
 };
 
 struct record_description {

@@ -71,10 +71,10 @@ inline constexpr auto provider_rows = [] {
   using record = nexus_provider_record;
   using enum field_kind;
   constexpr row length = ROW(parameters.name_length).is(number, "name_length", "bytes of the name, up to 64");
-  constexpr row type = ROW(parameters.type).is(enumeration, "type", "kind of nexus").of(nexus_types);
   return join(
       ROW(provider_uuid).is(identifier, "provider", "the provider"), ROW(reserved_16),
-      ROW(parameters.name).is(name, "name", "cut to name_length").cut_to(length), length, type,
+      ROW(parameters.name).is(name, "name", "cut to name_length").cut_to(length), length,
+      ROW(parameters.type).is(enumeration, "type", "kind of nexus").of(nexus_types),
       ROW(parameters.reserved_72),
       ROW(parameters.flags).is(flags, "flags", "see below").of(provider_flag_names),
       ROW(parameters.format).is(number, "format", "as the kernel keeps it"),
@@ -85,10 +85,7 @@ inline constexpr auto provider_rows = [] {
       ROW(parameters.buf_size).is(number, "buf_size", "of a buffer").in("bytes"),
       ROW(parameters.meta_size).is(number, "meta_size", "of a buffer's metadata").in("bytes"),
       ROW(parameters.reserved_112), ROW(parameters.pipes).is(number, "pipes", "as the kernel keeps it"),
-      ROW(parameters.subtype)
-          .is(enumeration, "subtype", "kind of flow switch")
-          .of(flow_switch_subtypes)
-          .where(type, nexus_types.number("flow-switch")),
+      ROW(parameters.subtype).is(enumeration, "subtype", "kind of flow switch").of(flow_switch_subtypes),
       ROW(parameters.mhints).is(number, "mhints", "memory hints"),
       ROW(parameters.ifindex).is(number, "ifindex", "index of the interface"), ROW(parameters.reserved_132),
       ROW(instance_count).is(number, "instances", "instances that follow"), ROW(reserved_260));
