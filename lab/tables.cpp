@@ -2,6 +2,20 @@
 
 namespace lab {
 
+// Each in the file of its name.
+void write_providers(const world &, table_file &);
+void write_channels(const world &, table_file &);
+void write_ring_stat_enable(const world &, table_file &);
+void write_flows(const world &, table_file &);
+void write_advisories(const world &, table_file &);
+void write_owners(const world &, table_file &);
+void write_routes(const world &, table_file &);
+void write_net_ifs(const world &, table_file &);
+void write_flow_switches(const world &, table_file &);
+void write_userstacks(const world &, table_file &);
+void write_arenas(const world &, table_file &);
+void write_namespaces(const world &, table_file &);
+
 namespace {
 
 constexpr table rows[] = {
