@@ -3,6 +3,7 @@
 #include "common/tables/arena.h"
 
 #include <algorithm>
+#include <cctype>
 
 #include "lab/tables.h"
 
@@ -22,7 +23,6 @@ constexpr std::uint32_t mirrored = region_mode_names.bit("MIRRORED");
 enum scope : std::uint8_t { channel_scope, nexus_scope, machine_scope, scopes };
 
 struct region_shape {
-  const char *name;
   scope shared;
   std::uint32_t mode;
   std::uint32_t object_size;  // as asked for
@@ -34,19 +34,18 @@ struct region_shape {
 
 // By region type.
 constexpr region_shape shapes[tv_stats_arena::region_slots] = {
-    {"schema", channel_scope, no_redirect | map_ok | read_only | monolithic, 2904, 1, 64, 16384, false},
-    {"ring", channel_scope, map_ok, 12'440, 4, 64, 32768, false},
-    {"buf", nexus_scope, map_ok | persistent, 2048, 2000, 128, 65536, true},
-    {"mdu", nexus_scope, map_ok | persistent, 480, 2000, 64, 32768, false},
-    {"usd", channel_scope, map_ok, 16, 1500, 16, 16384, false},
-    {"ustats", channel_scope, map_ok | monolithic, 9800, 1, 64, 16384, false},
-    {"flowadv", nexus_scope, map_ok | read_only | monolithic, 20, 512, 4, 16384, false},
-    {"nexusadv", nexus_scope, map_ok | read_only | monolithic, 64, 1, 64, 16384, false},
-    {"sysctls", machine_scope, no_redirect | map_ok | read_only | monolithic | mirrored, 1100, 1, 64, 16384,
-     false},
-    {"mdk", nexus_scope, persistent, 600, 2000, 64, 32768, true},
-    {"ksd", channel_scope, no_cache, 24, 1500, 8, 16384, false},
-    {"kstats", nexus_scope, no_cache | monolithic, 5200, 1, 64, 16384, true},
+    {channel_scope, no_redirect | map_ok | read_only | monolithic, 2904, 1, 64, 16384, false},
+    {channel_scope, map_ok, 12'440, 4, 64, 32768, false},
+    {nexus_scope, map_ok | persistent, 2048, 2000, 128, 65536, true},
+    {nexus_scope, map_ok | persistent, 480, 2000, 64, 32768, false},
+    {channel_scope, map_ok, 16, 1500, 16, 16384, false},
+    {channel_scope, map_ok | monolithic, 9800, 1, 64, 16384, false},
+    {nexus_scope, map_ok | read_only | monolithic, 20, 512, 4, 16384, false},
+    {nexus_scope, map_ok | read_only | monolithic, 64, 1, 64, 16384, false},
+    {machine_scope, no_redirect | map_ok | read_only | monolithic | mirrored, 1100, 1, 64, 16384, false},
+    {nexus_scope, persistent, 600, 2000, 64, 32768, true},
+    {channel_scope, no_cache, 24, 1500, 8, 16384, false},
+    {nexus_scope, no_cache | monolithic, 5200, 1, 64, 16384, true},
 };
 
 constexpr char machine_name[] = "com.example.machine";
@@ -75,7 +74,9 @@ tv_stats_region region_of(const world &state, std::size_t type, const uuid &owne
   std::memcpy(&key, owner.bytes, sizeof key);
   random_source random(state.seed, 16 + type, key);
   tv_stats_region made{};
-  set_text(made.name, std::string(owner_name).append(1, '.').append(shape.name));
+  std::string name = owner_name + ".";
+  for (const char c : region_types.rows[type].name.view()) name += static_cast<char>(std::tolower(c));
+  set_text(made.name, name);
   made.region_uuid = random.identity();
   made.type = static_cast<std::int32_t>(type);
   made.mode = shape.mode;

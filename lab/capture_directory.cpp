@@ -13,6 +13,7 @@
 #include <cstdlib>
 #include <string_view>
 
+#include "common/tables/tables.h"
 #include "common/text/output.h"
 #include "common/text/text.h"
 #include "lab/table_file.h"
@@ -26,7 +27,16 @@ constexpr char moments_name[] = "moments";
 constexpr char unfinished[] = ".new";
 constexpr std::string_view format_version = "1";
 constexpr std::size_t note_size = 4096;  // what is read of a note: far more than one has
-constexpr int deepest = 7;               // folders above moments/1.000/proc/sys/kern/tarvel/stats/flow
+
+// How many folders are above the tables of a later moment: moments/1.000/proc/sys and those of their nodes.
+constexpr int deepest = 4 + [] {
+  std::ptrdiff_t most = 0;
+  for (const table_description &table : all_tables) {
+    const std::string_view node = table.node;
+    most = std::max(most, std::count(node.begin(), node.end(), '.'));
+  }
+  return static_cast<int>(most);
+}();
 
 // Reads the note in a directory from whoever made it: no link, no pipe, no more than its beginning. Returns 0
 // or an error number.
