@@ -126,6 +126,10 @@ class Run(LabTest):
             os.close(0)  # the loader needs one
             resource.setrlimit(resource.RLIMIT_NOFILE, (3, 3))
         self.assertRegex(run("nope", preexec_fn=leave_no_descriptor).stderr, "^usage:\n")
+    def test_ACommandGetsItsDescriptorsAsTheyWere(self):
+        seen = run("run", "--", "sh", "-c", "[ ! -e /proc/$$/fd/0 ]", preexec_fn=lambda: os.close(0))
+        self.assertEqual((seen.returncode, seen.stderr), (0, ""))
+
     def test_AProgramThatCannotTellItsPlaceHasNoneBesideIt(self):
         script = "import os, sys\nfor _ in range(20): os.mkdir('x' * 250); os.chdir('x' * 250)\n" \
                  "os.link(sys.argv[1], 'lab'); open('tarvelctl', 'w').write('#!/bin/sh\\necho seen'); os.chmod('tarvelctl', 0o700)\n" \

@@ -30,6 +30,8 @@ def cut_off(out, err, last):
 
 
 def cases(torture):
+    expanding = "write error: No space left on device\nError expanding tv_region_set-> capacity 1024\n"
+    yield "memory", [("r", 1, 1, 1)], exactly("", expanding, NO_MEMORY), {"to": "/dev/full"}
     started = torture.clean("").calls.count("m")  # by the start of the C++ library, which can do without
     for line in tool_model.lines(torture):
         clean = torture.clean(line)

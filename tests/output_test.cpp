@@ -6,6 +6,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <limits.h>
+#include <signal.h>
 #include <sys/resource.h>
 
 #include <thread>
@@ -126,6 +127,31 @@ TEST_F(output_test, AbandonedOutputEndsWithItsLastWholeLineOrSaysWhyNot) {
   EXPECT_EQ(out.abandon(), 0);
   out.attach(open("/dev/full", O_WRONLY | O_CLOEXEC));
   EXPECT_EQ(out.abandon(), ENOSPC);
+}
+
+// In the middle of a flush that reaches beyond the last whole line, there is nothing to add.
+TEST_F(output_test, AbandonedInAFlushOfHalfALineWritesNothing) {
+  int ends[2];
+  ASSERT_EQ(pipe2(ends, O_CLOEXEC | O_NONBLOCK), 0);
+  fcntl(ends[1], F_SETPIPE_SZ, PIPE_BUF);
+  static const output *flushed;
+  static int reader;
+  static ssize_t before, after;
+  flushed = &out;
+  reader = ends[0];
+  signal(SIGALRM, [](int) {
+    char buffer[3 * PIPE_BUF];
+    before = read(reader, buffer, sizeof buffer);
+    flushed->abandon();
+    after = read(reader, buffer, sizeof buffer);
+  });
+  out.attach(ends[1]);
+  format::print_to<"%s">(out, std::string(2 * PIPE_BUF, 'x'));
+  ualarm(20'000, 0);
+  out.flush();
+  EXPECT_EQ(before, PIPE_BUF);
+  EXPECT_EQ(after, -1);
+  close(ends[0]);
 }
 
 TEST_F(output_test, RedirectionLeavesBehindWhatWasPrintedBefore) {
