@@ -61,6 +61,7 @@ struct tally {
   std::uint32_t tables = 0;
   std::uint32_t names = 0;
   std::uint64_t bytes = 0;
+  bool is_whole = true;  // nothing that was to be saved is missing
   bool kernel_was_gone = false;
 };
 
@@ -80,6 +81,7 @@ bool kernel_is_there(tally &saved) {
   const int error = kernel_error();
   if (error && !saved.kernel_was_gone) complain<"tarvellab: no table can be read: %s\n">(strerror(error));
   saved.kernel_was_gone |= error != 0;
+  saved.is_whole &= error == 0;
   return !error;
 }
 
@@ -89,7 +91,9 @@ snapshot fetch(tally &saved) {
   if (!kernel_is_there(saved)) return taken;
   for (const table &row : tables) {
     fetched_table fetched{&row, {}};
-    if (fetched.content.fetch(row.what->node) == 0) {
+    if (is_mostly_holes(row.what->node)) {
+      complain<"tarvellab: %s is left out: mostly holes\n">(row.what->node);
+    } else if (fetched.content.fetch(row.what->node) == 0) {
       taken.tables.push_back(std::move(fetched));
     } else if (kernel_is_there(saved)) {
       complain<"tarvellab: %s is left out\n">(row.what->node);
@@ -116,6 +120,7 @@ bool save(const snapshot &taken, own_directory top, substitutes *by, tally &save
     if (!by) file.put(fetched.content.bytes());
     if (by && !redact_table(*fetched.source->what, fetched.content.bytes(), *by, file)) {
       complain<"tarvellab: %s is cut: the rest of it cannot be redacted\n">(fetched.source->what->node);
+      with.is_whole = false;
     }
     if (!file.commit()) return false;
     ++with.tables;
@@ -128,21 +133,20 @@ bool save(const snapshot &taken, own_directory top, substitutes *by, tally &save
 
 // Takes the moments behind the first, which was taken at `began`, each at its time on the clock, so that none
 // drifts. Those that the machine is too slow for come later, in time with the rest.
-bool capture_later_moments(const options &asked, const own_directory &top, std::int64_t began,
+void capture_later_moments(const options &asked, const own_directory &top, std::int64_t began,
                            substitutes *by, const sigset_t &stop, tally &saved) {
   std::int64_t due = began;
   for (std::uint32_t taken = 1; taken < asked.count; ++taken) {
     const std::int64_t late = std::max<std::int64_t>(monotonic_milliseconds() - due, 0);
     due += (1 + late / asked.every) * asked.every;
-    if (stopped_before(due, stop)) return true;
+    if (stopped_before(due, stop)) return;
     const std::int64_t offset = monotonic_milliseconds() - began;
     const snapshot next = fetch(saved);
     if (next.tables.empty()) continue;
     if (save(next, moment_in_progress(top), by, saved) && finish_moment(top, offset)) continue;
     drop_moment(top);
-    return false;
+    return;
   }
-  return true;
 }
 
 }  // namespace
@@ -158,24 +162,28 @@ int capture(const options &asked) {
   substitutes redaction;
   substitutes *const by = asked.redact ? &redaction : nullptr;
   own_directory top;
+  bool goes_on = false;
   {
     const snapshot first = fetch(saved);
     if (first.tables.empty()) return EXIT_FAILURE;
     top = make_vacant(asked.directory);
-    if (!top.is_open() || !save(first, top.enter("."), by, saved)) return EXIT_FAILURE;
+    if (!top.is_open()) return EXIT_FAILURE;
+    goes_on = save(first, top.enter("."), by, saved) && write_note(top, taken, redacted);
   }
-  if (!write_note(top, taken, redacted)) return EXIT_FAILURE;
-  if (!redacted) {
+  if (!goes_on) top.remove("proc");
+  if (goes_on && !redacted) {
     complain<"tarvellab: %s holds addresses and process names; --redact replaces them\n">(
         foreign_text{asked.directory});
   }
-  const bool done = capture_later_moments(asked, top, began, by, stop, saved);
+  if (goes_on) capture_later_moments(asked, top, began, by, stop, saved);
+  const std::uint32_t moments = std::max(asked.count, 1U);
   const std::uint64_t expected = saved.moments * tables.size();
   print<"saved in %s: moments %u of %u, tables %u of %llu, names %u, bytes %llu\n">(
-      foreign_text{asked.directory}, saved.moments, std::max(asked.count, 1U), saved.tables, expected,
-      saved.names, saved.bytes);
+      foreign_text{asked.directory}, saved.moments, moments, saved.tables, expected, saved.names,
+      saved.bytes);
   report.flush();
-  return done && !saved.kernel_was_gone && saved.tables == expected ? EXIT_SUCCESS : EXIT_FAILURE;
+  const bool is_all = saved.is_whole && saved.moments == moments && saved.tables == expected;
+  return is_all ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
 }  // namespace lab

@@ -11,6 +11,7 @@
 #include <charconv>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <string_view>
 
 #include "common/tables/tables.h"
@@ -41,11 +42,14 @@ constexpr int deepest = 4 + [] {
 // Reads the note in a directory from whoever made it: no link, no pipe, no more than its beginning. Returns 0
 // or an error number.
 int read_note(int directory, std::string &text) {
+  const int found = openat(directory, note_name, O_PATH | O_CLOEXEC | O_NOFOLLOW);
+  if (found < 0) return errno;
   struct stat status {};
-  if (fstatat(directory, note_name, &status, AT_SYMLINK_NOFOLLOW) < 0) return errno;
-  if (!S_ISREG(status.st_mode)) return EINVAL;
-  const int fd = openat(directory, note_name, O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY);
-  if (fd < 0) return errno;
+  fstat(found, &status);
+  const std::string itself = "/proc/self/fd/" + std::to_string(found);
+  const int fd = S_ISREG(status.st_mode) ? open(itself.c_str(), O_RDONLY | O_CLOEXEC) : -1;
+  close(found);
+  if (fd < 0) return EINVAL;
   text.resize(note_size);
   const ssize_t got = read(fd, text.data(), text.size());
   const int error = got < 0 ? errno : 0;
@@ -173,16 +177,31 @@ void drop_moment(const own_directory &top) {
 bool shows_redacted_capture() {
   const char *given = secure_getenv("TARVEL_ROOT");
   if (!given || !*given) return false;
-  // A moment lies two directories below the note.
-  for (const char *top : {"", "/../.."}) {
-    const int fd = open((given + std::string(top)).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
-    if (fd < 0) return false;
-    std::string note;
-    const bool is_redacted = read_note(fd, note) == 0 && value_of(note, "redacted: ") == "yes";
-    close(fd);
-    if (is_redacted) return true;
-  }
-  return false;
+  std::error_code error;
+  std::filesystem::path top = std::filesystem::canonical(given, error);
+  if (error) return false;
+  // A later moment lies two directories below the note.
+  std::int64_t offset = 0;
+  const bool is_moment =
+      top.parent_path().filename() == moments_name && parse_offset(top.filename().native(), offset);
+  if (is_moment) top = top.parent_path().parent_path();
+  const int fd = open(top.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
+  if (fd < 0) return false;
+  struct stat status {};
+  std::string note;
+  const bool is_ours = fstat(fd, &status) == 0 && status.st_uid == geteuid();
+  const bool is_redacted = is_ours && read_note(fd, note) == 0 && value_of(note, "redacted: ") == "yes";
+  close(fd);
+  return is_redacted;
+}
+
+bool is_mostly_holes(std::string_view node) {
+  const char *given = secure_getenv("TARVEL_ROOT");
+  if (!given || !*given) return false;
+  std::string path = std::string(given) + "/proc/sys/";
+  for (const char c : node) path += c == '.' ? '/' : c;
+  struct stat status {};
+  return lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode) && is_hollow(status);
 }
 
 bool look_into(const own_directory &top, captured &found) {
@@ -196,8 +215,12 @@ bool look_into(const own_directory &top, captured &found) {
   if (error) return complain_about(path, error);
   if (!understands(path, note) || !holds_only_files(top, 0)) return false;
   found.is_capture = true;
-  found.host = value_of(note, "host: ");
-  found.time = value_of(note, "time: ");
+  const auto said = [&](std::string_view key) {
+    const std::string_view value = value_of(note, key);
+    return std::string(value.empty() ? "unknown" : value);
+  };
+  found.host = said("host: ");
+  found.time = said("time: ");
   if (faccessat(top.fd(), moments_name, F_OK, 0) != 0) return true;
   const own_directory moments = top.enter(moments_name);
   const bool listed = moments.for_each([&](const std::string &name) {

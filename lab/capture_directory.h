@@ -13,6 +13,7 @@
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "lab/own_directory.h"
@@ -45,8 +46,12 @@ own_directory moment_in_progress(const own_directory &top);
 bool finish_moment(const own_directory &top, std::int64_t offset);
 void drop_moment(const own_directory &top);
 
-// Whether the kernel in sight is that of a redacted capture.
+// Whether the kernel in sight is that of a redacted capture, as a note says that the caller owns.
 bool shows_redacted_capture();
+
+// Whether the file of this node is large but for holes, below a root that was given: it would fill the
+// memory.
+bool is_mostly_holes(std::string_view node);
 
 // Finds what there is of a capture; what is no moment does not count. False where the capture is one of a
 // format that this program does not know. False also where someone else might change what a reader sees, or

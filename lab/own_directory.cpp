@@ -8,9 +8,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
-#include <filesystem>
 #include <string_view>
-#include <system_error>
 
 #include "common/text/output.h"
 #include "common/text/text.h"
@@ -83,9 +81,10 @@ own_directory own_directory::open(const std::string &path) {
 }
 
 own_directory own_directory::make(const std::string &path) {
-  const std::size_t slash = path.rfind('/', path.find_last_not_of('/'));
-  std::error_code ignored;  // making the last one tells
-  if (slash != path.npos) std::filesystem::create_directories(path.substr(0, slash), ignored);
+  // Those above it, too, as far as they are missing; making the last one tells what went wrong.
+  for (std::size_t slash = path.find('/', 1); slash != path.npos; slash = path.find('/', slash + 1)) {
+    mkdir(path.substr(0, slash).c_str(), private_mode);
+  }
   if (mkdir(path.c_str(), private_mode) != 0 && errno != EEXIST) return {path, -1};
   return open(path);
 }

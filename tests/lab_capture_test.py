@@ -170,7 +170,7 @@ class Moments(CaptureTest):
                                 stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL, env={**os.environ, "TARVEL_ROOT": str(self.directory / "made")})
         self.wait_for(lambda: len(list(self.directory.glob("long/moments/[0-9]*"))) > 2)
         long.send_signal(signal.SIGINT)
-        self.assertEqual(long.wait(5), 0)
+        self.assertEqual(long.wait(5), 1)
         self.assertEqual([p for p in files(self.directory / "long") if "/." in p], [])
         process.kill()
 
@@ -215,6 +215,8 @@ class Moments(CaptureTest):
         for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
             self.assertEqual(self.capture(root, name=f"again {root.name}"), "")
             self.assertRegex((self.directory / f"again {root.name}/capture.txt").read_text(), "host: redacted\nredacted: yes\n$")
+        inside = self.generate(name="saved/a/kernel").root
+        self.assertIn("addresses", self.capture(inside, name="of another"))
 
     def test_PathsDoNotDriveTheTerminal(self):
         (self.directory / "named").symlink_to("\x1b[2Jthere")
@@ -257,6 +259,7 @@ class Moments(CaptureTest):
         self.assertIn("No such file or directory", self.replay("sh", "-c", f"sleep 0.2; {tarvelctl} provider").stderr)
         os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
         self.assertRegex(self.replay("true").stderr, "/stats/flow: mostly holes\n$")
+        self.assertIn("flow is left out: mostly holes\n", self.capture(self.directory / "made", status=1))
 
     def test_OnlyFilesAreReplayed(self):
         kernel = self.make()
