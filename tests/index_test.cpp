@@ -12,6 +12,8 @@ TEST(key_index, FindsWhatWasAddedFirst) {
   constexpr unsigned count = 1000;
   key_index index;
   EXPECT_EQ(index.find(0U), key_index::none);
+  index.reserve(100);
+  index.reserve(10);  // there is room
   for (unsigned i = 0; i < count; ++i) EXPECT_TRUE(index.add(i, i));
   for (unsigned i = 0; i < count; ++i) EXPECT_FALSE(index.add(i, i + 1));
   for (unsigned i = 0; i < count; ++i) EXPECT_EQ(index.find(i), i);

@@ -128,6 +128,9 @@ class Capture(CaptureTest):
         self.assertRegex(printed, "^saved in .*: moments (\\d+) of 1000, tables \\1 of \\d+, names 0, bytes \\1\n$")
         self.assertEqual(capture.returncode, 1)
         self.assertEqual([name for name in files(saved) if "/." in name], [])
+        errors = self.capture(self.generate().root, name="first", status=1, preexec_fn=lambda: limit_files(1000))
+        self.assertEqual((errors.count("File too large"), files(self.directory / "first")), (1, {}))
+        self.assertIn("moments 0 of 1, tables 0 of 0, names 0, bytes 0\n", self.printed)
 
     def test_WrongArgumentsShowTheUsage(self):
         for words in ("", "a b", "--redact", "--every 1 a", "--count 2 a", "--seed 1 a", "--every 1 --count 0 a", "--every 1 --count a",
@@ -259,6 +262,11 @@ class Moments(CaptureTest):
         self.assertIn("No such file or directory", self.replay("sh", "-c", f"sleep 0.2; {tarvelctl} provider").stderr)
         os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
         self.assertRegex(self.replay("true").stderr, "/stats/flow: mostly holes\n$")
+        (kernel.root / node_dir / "stats/flow").unlink()
+        (kernel.root / "capture.txt").write_text("format: 1\n")
+        self.assertIn("this is unknown at unknown\n", self.replay("true").stderr)
+        os.mknod(kernel.root / node_dir / "stats/flow")
+        os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
         self.assertIn("flow is left out: mostly holes\n", self.capture(self.directory / "made", status=1))
 
     def test_OnlyFilesAreReplayed(self):
