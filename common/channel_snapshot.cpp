@@ -13,22 +13,10 @@ bool channel_snapshot_fetch(channel_snapshot &snapshot) {
 
 // Finds the groups and their channels. False where the table ends too early.
 bool channel_snapshot::frame() {
-  record_walk walk(table_.bytes());
-  while (!walk.at_end()) {
-    const std::byte *const header_at = walk.position();
-    nexus_channel_header header;
-    if (!walk.take(header)) return false;
-    ++nexus_count_;
-    if (header.channel_count == 0) append({header_at, nullptr, 0});
-    for (std::uint32_t i = 0; i < header.channel_count; ++i) {
-      const std::byte *const entry_at = walk.position();
-      channel_entry entry;
-      std::span<const std::byte> rings;
-      if (!walk.take(entry, rings)) return false;
-      append({header_at, entry_at, sizeof entry + rings.size()});
-    }
-  }
-  return true;
+  return walk_channels(table_.bytes(), [&](const channel_ref &ref) {
+    if (!ref.entry) ++nexus_count_;
+    if (ref.entry || ref.nexus().channel_count == 0) append(ref);
+  });
 }
 
 void channel_snapshot::append(const channel_ref &ref) {

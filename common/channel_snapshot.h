@@ -1,4 +1,4 @@
-// One snapshot of the channel table, framed.
+// Walking the channel table, and one snapshot of it, framed.
 
 #ifndef TARVELCTL_COMMON_CHANNEL_SNAPSHOT_H
 #define TARVELCTL_COMMON_CHANNEL_SNAPSHOT_H
@@ -30,6 +30,28 @@ struct channel_ref {
     return {entry + sizeof(channel_entry), entry_size - sizeof(channel_entry)};
   }
 };
+
+// Steps through a channel table. Calls `visit` with a ref for each nexus, which has no entry, and behind it
+// with one for each of its channels. Returns false where the table ends before all that it claims; what is
+// whole has been visited then.
+template <class Visit>
+bool walk_channels(std::span<const std::byte> table, Visit visit) {
+  record_walk walk(table);
+  while (!walk.at_end()) {
+    const std::byte *const header_at = walk.position();
+    nexus_channel_header header;
+    if (!walk.take(header)) return false;
+    visit(channel_ref{header_at, nullptr, 0});
+    for (std::uint32_t i = 0; i < header.channel_count; ++i) {
+      const std::byte *const entry_at = walk.position();
+      channel_entry entry;
+      std::span<const std::byte> rings;
+      if (!walk.take(entry, rings)) return false;
+      visit(channel_ref{header_at, entry_at, sizeof entry + rings.size()});
+    }
+  }
+  return true;
+}
 
 // A fetched table with a ref for each of its channels and one for each nexus without any, in table order. It
 // is either complete or empty.

@@ -2,20 +2,27 @@
 
 #include <algorithm>
 
-#include "common/tables/channel.h"
+#include "common/channel_snapshot.h"
 #include "common/tables/flow.h"
 #include "common/tables/provider.h"
 #include "common/text/invariant.h"
 #include "common/text/memory.h"
 #include "common/text/output.h"
 
-namespace {
-
 // A channel's record in the table, with its sort key.
 struct channel_position {
   std::uint32_t port;
   const std::byte *at;
 };
+
+// A group of the channel table, as far as it has been read; of a nexus that the tree lacks, nothing.
+struct channel_group {
+  object_id nexus = no_object;
+  std::uint32_t claimed_count = 0;
+  std::vector<channel_position> channels{};
+};
+
+namespace {
 
 // How the channels of a nexus are ordered: by the difference of their ports in 32 bits, below 0 where `a`
 // comes first.
@@ -70,41 +77,32 @@ int object_tree::scrape_providers() {
 
 void object_tree::scrape_channels() {
   if (channels_.fetch(channel_list_node) != 0) return;
-  record_walk walk(channels_.bytes());
-  while (!walk.at_end()) {
-    nexus_channel_header header;
-    if (walk.take(header)) {
-      if (header.channel_count == 0) continue;
-      if (scrape_group(walk, find_object(header.nexus_uuid), header.channel_count)) continue;
+  channel_group group;
+  const bool is_whole = walk_channels(channels_.bytes(), [&](const channel_ref &ref) {
+    if (ref.entry) {
+      if (group.nexus != no_object) group.channels.push_back({ref.channel().port, ref.entry});
+      return;
     }
-    complain<"Buffer too short\n">();
-    return;
-  }
+    append_group(group);
+    const nexus_channel_header header = ref.nexus();
+    group = {find_object(header.nexus_uuid), header.channel_count, {}};
+  });
+  append_group(group);
+  if (!is_whole) complain<"Buffer too short\n">();
 }
 
-// Hangs the channels of a group under its nexus, in place of all that the node had, or steps over them where
-// there is no such node. A table that ends inside the group leaves the node with the channels before that, as
-// they come; the result is false then.
-bool object_tree::scrape_group(record_walk &walk, object_id nexus, std::uint32_t channel_count) {
-  std::vector<channel_position> channels;
-  bool whole = true;
-  for (std::uint32_t i = 0; i < channel_count && whole; ++i) {
-    const std::byte *const at = walk.position();
-    channel_entry channel;
-    std::span<const std::byte> rings;
-    whole = walk.take(channel, rings);
-    if (whole && nexus != no_object) channels.push_back({channel.port, at});
-  }
-  if (nexus == no_object) return whole;
-  if (whole) sort_by_port(channels);
-  release_children(nexus);
-  for (const channel_position &channel : channels) {
+// Hangs the channels of a group under its nexus, in place of all that the node had. Where the table ends
+// inside the group, they are those before that, as they come.
+void object_tree::append_group(channel_group &group) {
+  if (group.nexus == no_object || group.claimed_count == 0) return;
+  if (group.channels.size() == group.claimed_count) sort_by_port(group.channels);
+  release_children(group.nexus);
+  for (const channel_position &channel : group.channels) {
     uuid channel_uuid;
     std::memcpy(&channel_uuid, channel.at, sizeof channel_uuid);
-    make_findable(
-        append_child(nexus, {.uuid = channel_uuid, .type = object_type::channel, .payload = channel.at}));
+    make_findable(append_child(group.nexus,
+                               {.uuid = channel_uuid, .type = object_type::channel, .payload = channel.at}));
   }
-  return whole;
 }
 
 void object_tree::index_ports() {

@@ -54,6 +54,8 @@ struct object_node {
   }
 };
 
+struct channel_group;
+
 // The tree, as three snapshots taken one after the other give it. It owns the three tables, whose records it
 // points at. However deep a table makes the tree, walking and releasing it takes no more stack.
 //
@@ -115,7 +117,7 @@ class object_tree {
 
   int scrape_providers();
   void scrape_channels();
-  bool scrape_group(record_walk &walk, object_id nexus, std::uint32_t channel_count);
+  void append_group(channel_group &group);
   void index_ports();
   int scrape_flows();
   std::vector<sort_key> find_channels();
