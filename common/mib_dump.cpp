@@ -56,22 +56,15 @@ void print_channel_payload(const object_node &node, const indent_text &indent, p
   print<"%s\"n_rx_rings\":%d,\n">(indent, static_cast<int>(channel.n_rx_rings));
 }
 
-template <class Address>
-void print_endpoints(const tv_stats_flow &flow, const indent_text &indent, Address socket_address::*address) {
-  print<"%s\"local_addr\":\"%s\",\n">(indent, flow.sf_local.*address);
-  print<"%s\"local_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_local.port)));
-  print<"%s\"remote_addr\":\"%s\",\n">(indent, flow.sf_remote.*address);
-  print<"%s\"remote_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_remote.port)));
-}
-
 void print_flow_payload(const tv_stats_flow &flow, const indent_text &indent) {
   const tv_flow_endpoint_stats &in = flow.sf_rstats;
   const tv_flow_endpoint_stats &out = flow.sf_lstats;
-  if (flow.sf_local.family == address_family::ipv6) {
-    print_endpoints(flow, indent, &socket_address::ipv6);
-  } else if (flow.sf_local.family == address_family::ipv4) {
-    print_endpoints(flow, indent, &socket_address::ipv4);
-  }
+  flow.visit_addresses([&](const auto &local, const auto &remote) {
+    print<"%s\"local_addr\":\"%s\",\n">(indent, local);
+    print<"%s\"local_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_local.port)));
+    print<"%s\"remote_addr\":\"%s\",\n">(indent, remote);
+    print<"%s\"remote_port\":%d,\n">(indent, static_cast<int>(ntohs(flow.sf_remote.port)));
+  });
   print<"%s\"protocol\":\"%s\",\n">(indent, proto_name(flow.sf_protocol));
   print<"%s\"in_bytes\":%llu,\n">(indent, in.bytes);
   print<"%s\"out_bytes\":%llu,\n">(indent, out.bytes);

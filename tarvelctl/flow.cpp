@@ -2,6 +2,7 @@
 
 #include "common/tables/flow.h"
 
+#include <concepts>
 #include <string_view>
 #include <vector>
 
@@ -38,17 +39,17 @@ format::small_text<32> rtt_text(std::uint32_t microseconds) {
 
 void print_endpoints(const tv_stats_flow &flow, const char *protocol) {
   const bool numerical = netstat_options.numerical;
-  const auto name = [&](auto naming, auto address) {
-    return std::pair{naming(flow.sf_local.*address, flow.sf_local.port, protocol, numerical),
-                     naming(flow.sf_remote.*address, flow.sf_remote.port, protocol, numerical)};
-  };
-  if (flow.sf_local.family == address_family::ipv6) {
-    const auto [local, remote] = name(ipv6_endpoint_name, &socket_address::ipv6);
-    print<"%c %-43.43s %-43.43s ">('6', local, remote);
-  } else if (flow.sf_local.family == address_family::ipv4) {
-    const auto [local, remote] = name(ipv4_endpoint_name, &socket_address::ipv4);
-    print<"%c %-43s %-43s ">('4', local, remote);
-  }
+  flow.visit_addresses([&]<class Address>(const Address &local, const Address &remote) {
+    if constexpr (std::same_as<Address, ipv6_address>) {
+      const endpoint_text from = ipv6_endpoint_name(local, flow.sf_local.port, protocol, numerical);
+      const endpoint_text to = ipv6_endpoint_name(remote, flow.sf_remote.port, protocol, numerical);
+      print<"6 %-43.43s %-43.43s ">(from, to);
+    } else {
+      const endpoint_text from = ipv4_endpoint_name(local, flow.sf_local.port, protocol, numerical);
+      const endpoint_text to = ipv4_endpoint_name(remote, flow.sf_remote.port, protocol, numerical);
+      print<"4 %-43s %-43s ">(from, to);
+    }
+  });
 }
 
 void print_flow(const tv_stats_flow &flow) {

@@ -26,21 +26,12 @@ void for_each_child(const object_tree &tree, const object_node &node, object_typ
   }
 }
 
-template <class Address>
-void print_endpoints(const tv_stats_flow &flow, Address socket_address::*address) {
-  print<"\t\t %s.%d <-> %s.%d\n">(flow.sf_local.*address, static_cast<int>(ntohs(flow.sf_local.port)),
-                                  flow.sf_remote.*address, static_cast<int>(ntohs(flow.sf_remote.port)));
-}
-
 void print_flow(const tv_stats_flow &flow) {
-  const std::uint8_t family = flow.sf_local.family;
-  require(family == address_family::ipv6 || family == address_family::ipv4,
-          {"cmd_show", "tarvelctl/tarvelctl", 2030, "0"});
-  if (family == address_family::ipv6) {
-    print_endpoints(flow, &socket_address::ipv6);
-  } else {
-    print_endpoints(flow, &socket_address::ipv4);
-  }
+  const bool has_family = flow.visit_addresses([&](const auto &local, const auto &remote) {
+    print<"\t\t %s.%d <-> %s.%d\n">(local, static_cast<int>(ntohs(flow.sf_local.port)), remote,
+                                    static_cast<int>(ntohs(flow.sf_remote.port)));
+  });
+  require(has_family, {"cmd_show", "tarvelctl/tarvelctl", 2030, "0"});
 }
 
 void print_port(const object_tree &tree, const object_node &node, process_names &owners) {

@@ -107,6 +107,21 @@ struct tv_stats_flow {
   tv_flow_endpoint_stats sf_lstats;
   tv_flow_endpoint_stats sf_rstats;
   std::uint8_t reserved_280[40];
+
+  // Calls `visit` with the addresses of the local and the remote end, both of the local one's family. False
+  // where that is neither IPv6 nor IPv4.
+  template <class Visit>
+  bool visit_addresses(Visit visit) const {
+    if (sf_local.family == address_family::ipv6) {
+      visit(sf_local.ipv6, sf_remote.ipv6);
+      return true;
+    }
+    if (sf_local.family == address_family::ipv4) {
+      visit(sf_local.ipv4, sf_remote.ipv4);
+      return true;
+    }
+    return false;
+  }
 };
 
 static_assert(sizeof(tv_stats_flow) == 320);
