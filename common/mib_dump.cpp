@@ -78,15 +78,6 @@ void print_flow_payload(const tv_stats_flow &flow, const indent_text &indent) {
   print<"%s\"pid\":%d,\n">(indent, flow.sf_pid);
 }
 
-void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
-  print<"%s{\n">(indent);
-  print<"%s\"uuid\":\"00000000-0000-0000-0000-000000000000\",\n">(indent);
-  print<"%s\"type\":\"flow\",\n">(indent);
-  print_flow_payload(flow, indent);
-  print<"%s\"children\": []\n">(indent);
-  print<"%s}">(indent);
-}
-
 // What the nodes of a type differ in.
 struct node_ops {
   object_type type;
@@ -94,7 +85,7 @@ struct node_ops {
   void (*print_payload)(const object_node &node, const indent_text &indent, process_names &owners);
 };
 
-// By type. Flows, which are no nodes, are printed by print_flow.
+// By type. Flows, which are no nodes, have a payload of their own.
 constexpr node_ops types[] = {
     {object_type::root, "root", nullptr},
     {object_type::nexus_provider, "nexus_provider", print_provider_payload},
@@ -107,18 +98,39 @@ static_assert(std::ranges::all_of(types, [](const node_ops &row) {
   return static_cast<std::ptrdiff_t>(row.type) == &row - types;
 }));
 
-// Everything of a node before its children.
-void open_node(const object_node &node, const indent_text &indent, process_names &owners) {
-  print<"%s{\n">(indent);
-  print<"%s\"uuid\":\"%s\",\n">(indent, node.uuid);
-  print<"%s\"type\":\"%s\",\n">(indent, object_type_name(node.type));
-  const node_ops &ops = types[static_cast<std::size_t>(node.type)];
-  if (ops.print_payload) ops.print_payload(node, indent, owners);
-  if (node.has_children()) {
+// An object up to its children.
+template <class Uuid, class Payload>
+void open_object(const Uuid &uuid, object_type type, const indent_text &indent, bool has_children,
+                 Payload print_payload) {
+  print<"%s{\n%s\"uuid\":\"%s\",\n%s\"type\":\"%s\",\n">(indent, indent, uuid, indent,
+                                                         types[static_cast<std::size_t>(type)].name);
+  print_payload();
+  if (has_children) {
     print<"%s\"children\": [\n">(indent);
   } else {
     print<"%s\"children\": []\n">(indent);
   }
+}
+
+void close_object(const indent_text &indent, bool has_children) {
+  if (has_children) {
+    print<" \n">();
+    print<"%s]\n">(indent);
+  }
+  print<"%s}">(indent);
+}
+
+void open_node(const object_node &node, const indent_text &indent, process_names &owners) {
+  open_object(node.uuid, node.type, indent, node.has_children(), [&] {
+    const node_ops &ops = types[static_cast<std::size_t>(node.type)];
+    if (ops.print_payload) ops.print_payload(node, indent, owners);
+  });
+}
+
+void print_flow(const tv_stats_flow &flow, const indent_text &indent) {
+  static constexpr format::small_text<40> no_uuid = "00000000-0000-0000-0000-000000000000";
+  open_object(no_uuid, object_type::flow, indent, false, [&] { print_flow_payload(flow, indent); });
+  close_object(indent, false);
 }
 
 }  // namespace
@@ -131,19 +143,14 @@ const format::name_text &object_type_name(object_type type) {
 
 // Everything of a node behind the children that are nodes: its flows, and what closes it.
 void object_tree::dump_end(const object_node &node, unsigned level) const {
-  const indent_text indent = indent_of(level);
-  if (node.has_children()) {
-    const indent_text inner = indent_of(level + 1);
-    bool is_first = node.first_child == no_object;
-    for_each_flow(node, [&](const tv_stats_flow &flow) {
-      if (!is_first) print<",\n">();
-      is_first = false;
-      print_flow(flow, inner);
-    });
-    print<" \n">();
-    print<"%s]\n">(indent);
-  }
-  print<"%s}">(indent);
+  const indent_text inner = indent_of(level + 1);
+  bool is_first = node.first_child == no_object;
+  for_each_flow(node, [&](const tv_stats_flow &flow) {
+    if (!is_first) print<",\n">();
+    is_first = false;
+    print_flow(flow, inner);
+  });
+  close_object(indent_of(level), node.has_children());
 }
 
 void object_tree::dump_object(object_id top) const {
