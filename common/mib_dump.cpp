@@ -8,7 +8,6 @@
 #include <iterator>
 
 #include "common/mib.h"
-#include "common/names/flow_naming.h"
 #include "common/names/process_names.h"
 #include "common/tables/channel.h"
 #include "common/tables/flow.h"

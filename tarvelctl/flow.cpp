@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "common/names/flow_naming.h"
+#include "common/names/host_naming.h"
 #include "common/tables/kernel_table.h"
 #include "common/tables/record_walk.h"
 #include "common/tables/sort_key.h"
@@ -37,25 +37,24 @@ format::small_text<32> rtt_text(std::uint32_t microseconds) {
   return format::text_of<"%7.2f ms", 32>(static_cast<float>(microseconds) / 1000);
 }
 
-void print_endpoints(const tv_stats_flow &flow, const char *protocol) {
-  const bool numerical = netstat_options.numerical;
+void print_endpoints(const tv_stats_flow &flow, const char *protocol, host_naming &hosts) {
   flow.visit_addresses([&]<class Address>(const Address &local, const Address &remote) {
     if constexpr (std::same_as<Address, ipv6_address>) {
-      const endpoint_text from = ipv6_endpoint_name(local, flow.sf_local.port, protocol, numerical);
-      const endpoint_text to = ipv6_endpoint_name(remote, flow.sf_remote.port, protocol, numerical);
+      const endpoint_text from = hosts.ipv6_endpoint_name(local, flow.sf_local.port, protocol);
+      const endpoint_text to = hosts.ipv6_endpoint_name(remote, flow.sf_remote.port, protocol);
       print<"6 %-43.43s %-43.43s ">(from, to);
     } else {
-      const endpoint_text from = ipv4_endpoint_name(local, flow.sf_local.port, protocol, numerical);
-      const endpoint_text to = ipv4_endpoint_name(remote, flow.sf_remote.port, protocol, numerical);
+      const endpoint_text from = hosts.ipv4_endpoint_name(local, flow.sf_local.port, protocol);
+      const endpoint_text to = hosts.ipv4_endpoint_name(remote, flow.sf_remote.port, protocol);
       print<"4 %-43s %-43s ">(from, to);
     }
   });
 }
 
-void print_flow(const tv_stats_flow &flow) {
+void print_flow(const tv_stats_flow &flow, host_naming &hosts) {
   const format::name_text &protocol = proto_name(flow.sf_protocol);
   print<"%4s">(protocol);
-  print_endpoints(flow, protocol.chars);
+  print_endpoints(flow, protocol.chars, hosts);
   const tv_flow_endpoint_stats &local = flow.sf_lstats;
   const tv_flow_endpoint_stats &remote = flow.sf_rstats;
   print<" %-12llu %-12llu %-10llu %-10llu %-3s %-8s %-4s %-3s %s %-12s %-12s%s  %s %-3s %s.%d\n">(
@@ -81,10 +80,11 @@ std::vector<sort_key> selected_flows(std::span<const std::byte> flows) {
 
 void print_flows(std::span<const std::byte> flows) {
   constexpr std::size_t ahead = 16;
+  host_naming hosts(netstat_options.numerical);
   const std::vector<sort_key> keys = selected_flows(flows);
   for (std::size_t i = 0; i < keys.size(); ++i) {
     if (i + ahead < keys.size()) prefetch_record<tv_stats_flow>(flows, position_of(keys[i + ahead]));
-    print_flow(record_at<tv_stats_flow>(flows, position_of(keys[i])));
+    print_flow(record_at<tv_stats_flow>(flows, position_of(keys[i])), hosts);
   }
 }
 
@@ -92,7 +92,6 @@ void print_flows(std::span<const std::byte> flows) {
 
 int list_flows() {
   if (!netstat_options.all_flows) netstat_options.numerical = 1;
-  forget_scopes();
   kernel_table table;
   if (const int error = table.fetch(flow_node)) return error;
   if (table.empty()) return 0;

@@ -3,7 +3,6 @@
 #include <arpa/inet.h>
 
 #include "common/mib.h"
-#include "common/names/flow_naming.h"
 #include "common/names/process_names.h"
 #include "common/tables/channel.h"
 #include "common/tables/flow.h"

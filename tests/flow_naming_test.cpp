@@ -10,7 +10,7 @@
 #include <map>
 #include <random>
 
-#include "common/names/flow_naming.h"
+#include "common/names/host_naming.h"
 
 namespace {
 
@@ -88,18 +88,22 @@ Address parsed(const char *text) {
   return address;
 }
 std::string host4(const char *address, bool numerical = false) {
-  return std::string(ipv4_host_name(parsed<ipv4_address>(address), numerical).view());
+  return std::string(host_naming(numerical).ipv4_host_name(parsed<ipv4_address>(address)).view());
+}
+std::string host6(const char *address, host_naming &naming) {
+  return std::string(naming.ipv6_host_name(parsed<ipv6_address>(address)).view());
 }
 std::string host6(const char *address, bool numerical = false) {
-  return std::string(ipv6_host_name(parsed<ipv6_address>(address), numerical).view());
+  host_naming naming(numerical);
+  return host6(address, naming);
 }
 std::string end4(const char *address, std::uint16_t port, const char *protocol, bool numerical = false) {
   return std::string(
-      ipv4_endpoint_name(parsed<ipv4_address>(address), htons(port), protocol, numerical).view());
+      host_naming(numerical).ipv4_endpoint_name(parsed<ipv4_address>(address), htons(port), protocol).view());
 }
 std::string end6(const char *address, std::uint16_t port, const char *protocol, bool numerical = false) {
   return std::string(
-      ipv6_endpoint_name(parsed<ipv6_address>(address), htons(port), protocol, numerical).view());
+      host_naming(numerical).ipv6_endpoint_name(parsed<ipv6_address>(address), htons(port), protocol).view());
 }
 
 TEST(flow_naming, Ipv4NetworksAreAskedForByClass) {
@@ -186,6 +190,7 @@ TEST(flow_naming, ScopesAreShownAsTheSystemHasThem) {
                          {0x105, whole.c_str()},
                          {0x106, "fe80::7%en0"},
                          {0x107, "fe80:0:1111:2222:3333:4444:5555:6666%interface-of-16c"}}};
+  host_naming naming(true);
   const std::pair<const char *, std::string> texts[] = {
       {"fe80:101::7", "?"},
       {"fe80:102::7", "fe80::7%interface-of-15"},
@@ -197,22 +202,21 @@ TEST(flow_naming, ScopesAreShownAsTheSystemHasThem) {
       {"fe80:107:1111:2222:3333:4444:5555:6666", "fe80:0:1111:2222:3333:4444:5555:6666%interface-of"},
       {"fe80:107::7", "fe80:0:1111:2222:3333:4444:5555:6666%interface-of"}};
   for (const auto &[address, text] : texts) {
-    for (int times = 0; times < 2; ++times) EXPECT_EQ(host6(address, true), text);
+    for (int times = 0; times < 2; ++times) EXPECT_EQ(host6(address, naming), text);
   }
   services.scoped.clear();
-  EXPECT_EQ(host6("fe80:106::7", true), "fe80::7%en0");
-  forget_scopes();
+  EXPECT_EQ(host6("fe80:106::7", naming), "fe80::7%en0");
   EXPECT_EQ(host6("fe80:106::7", true), "fe80::7%262");
 }
 
 TEST(flow_naming, ScopesOfManyInterfacesAreAskedForOnce) {
   services = {};
-  forget_scopes();
+  host_naming naming(true);
   for (int times = 0; times < 3; ++times) {
     for (std::uint32_t scope = 20'000; scope < 21'280; scope += 2) {  // of no interface here
       char address[32];
       snprintf(address, sizeof address, "fe80:%x::7", scope);
-      EXPECT_EQ(host6(address, true), "fe80::7%" + std::to_string(scope));
+      EXPECT_EQ(host6(address, naming), "fe80::7%" + std::to_string(scope));
     }
   }
   EXPECT_EQ(services.scopes_asked, 640);
@@ -238,6 +242,7 @@ std::string numeric_form(const ipv6_address &address) {
 TEST(flow_naming, NumericIpv6IsTheSystemsForm) {
   constexpr std::uint16_t special[] = {0, 1, 0xFE80, 0xFEBF, 0xFEC0, 0xFF01, 0xFF02, 0xFF12, 0xFF05, 0xFFFF};
   std::mt19937_64 random(1);
+  host_naming naming(true);
   for (unsigned i = 0; i < 1000000; ++i) {
     ipv6_address address{};
     for (unsigned group = 0; group < 8; ++group) {
@@ -251,7 +256,7 @@ TEST(flow_naming, NumericIpv6IsTheSystemsForm) {
       address.bytes[2 * group + 1] = static_cast<std::uint8_t>(value);
     }
     const std::string expected = numeric_form(address);
-    ASSERT_EQ(ipv6_host_name(address, true).view(), expected == "::" ? "*" : expected);
+    ASSERT_EQ(naming.ipv6_host_name(address).view(), expected == "::" ? "*" : expected);
   }
 }
 

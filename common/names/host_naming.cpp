@@ -1,4 +1,4 @@
-// Names of hosts and services, by the system's databases or as numbers.
+#include "common/names/host_naming.h"
 
 #include <arpa/inet.h>
 #include <netdb.h>
@@ -10,9 +10,6 @@
 #include <cstring>
 #include <iterator>
 #include <string_view>
-#include <unordered_map>
-
-#include "common/names/flow_naming.h"
 
 namespace {
 
@@ -76,14 +73,6 @@ bool may_embed_scope(const ipv6_address &address) {
   return bytes[0] == 0xff && (scope == 1 || scope == 2);
 }
 
-// How getnameinfo renders the scopes of addresses: "%" and an interface or a number behind it. Asking for an
-// interface's name takes longer than all else in a row of a listing, so that answers are kept, for one
-// listing.
-std::unordered_map<std::uint32_t, format::name_text> &known_scopes() {
-  static std::unordered_map<std::uint32_t, format::name_text> scopes;
-  return scopes;
-}
-
 // What the rendering depends on: the scope, and which kind of address carries it.
 std::uint32_t scope_key(const ipv6_address &address, unsigned scope) {
   const bool is_multicast = address.bytes[0] == 0xff;
@@ -100,37 +89,6 @@ ipv6_host_text ask_for_number(const ipv6_address &address, unsigned scope) {
   const int error = getnameinfo(reinterpret_cast<const sockaddr *>(&socket_address), sizeof socket_address,
                                 host, sizeof host, nullptr, 0, NI_NUMERICHOST);
   return named<sizeof(ipv6_host_text::chars)>(error ? "?" : host);
-}
-
-ipv6_host_text numeric(const ipv6_address &address) {
-  unsigned scope = 0;
-  ipv6_address plain = address;
-  if (may_embed_scope(address)) {
-    scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
-    plain.bytes[2] = plain.bytes[3] = 0;
-  }
-  ipv6_host_text text;
-  text.end_at(plain.append_to(text.chars));
-  if (scope == 0) return text;
-
-  const std::uint32_t key = scope_key(address, scope);
-  auto known = known_scopes().find(key);
-  if (known == known_scopes().end()) {
-    const ipv6_host_text whole = ask_for_number(plain, scope);
-    const std::string_view rendered = whole.view();
-    const bool may_be_cut = rendered.size() == sizeof whole.chars - 1;
-    format::name_text answer;
-    if (may_be_cut || !rendered.starts_with(text.view()) ||
-        rendered.size() - text.size > sizeof answer.chars) {
-      return whole;
-    }
-    answer.end_at(std::copy(rendered.begin() + text.size, rendered.end(), answer.chars));
-    known = known_scopes().emplace(key, answer).first;
-  }
-  text.foreign = true;
-  const std::size_t room = sizeof text.chars - 1 - text.size;
-  text.end_at(std::copy_n(known->second.chars, std::min(room, known->second.size), text.chars + text.size));
-  return text;
 }
 
 constexpr std::size_t named_host_limit = 33;
@@ -172,50 +130,77 @@ bool is_unspecified(const Address &address) {
 
 }  // namespace
 
-void forget_scopes() {
-  known_scopes().clear();
+ipv6_host_text host_naming::numeric(const ipv6_address &address) {
+  unsigned scope = 0;
+  ipv6_address plain = address;
+  if (may_embed_scope(address)) {
+    scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
+    plain.bytes[2] = plain.bytes[3] = 0;
+  }
+  ipv6_host_text text;
+  text.end_at(plain.append_to(text.chars));
+  if (scope == 0) return text;
+
+  const std::uint32_t key = scope_key(address, scope);
+  auto known = known_scopes_.find(key);
+  if (known == known_scopes_.end()) {
+    const ipv6_host_text whole = ask_for_number(plain, scope);
+    const std::string_view rendered = whole.view();
+    const bool may_be_cut = rendered.size() == sizeof whole.chars - 1;
+    format::name_text answer;
+    if (may_be_cut || !rendered.starts_with(text.view()) ||
+        rendered.size() - text.size > sizeof answer.chars) {
+      return whole;
+    }
+    answer.end_at(std::copy(rendered.begin() + text.size, rendered.end(), answer.chars));
+    known = known_scopes_.emplace(key, answer).first;
+  }
+  text.foreign = true;
+  const std::size_t room = sizeof text.chars - 1 - text.size;
+  text.end_at(std::copy_n(known->second.chars, std::min(room, known->second.size), text.chars + text.size));
+  return text;
 }
 
-ipv4_host_text ipv4_host_name(const ipv4_address &address, bool numerical) {
+ipv4_host_text host_naming::ipv4_host_name(const ipv4_address &address) const {
   constexpr std::size_t size = sizeof(ipv4_host_text::chars);
   if (is_unspecified(address)) return named<size>(unspecified);
-  const char *name = numerical ? nullptr : look_up_ipv4(address);
+  const char *name = numerical_ ? nullptr : look_up_ipv4(address);
   if (name) return named<size>(name);
   ipv4_host_text text;
   text.end_at(address.append_to(text.chars));
   return text;
 }
 
-ipv6_host_text ipv6_host_name(const ipv6_address &address, bool numerical) {
+ipv6_host_text host_naming::ipv6_host_name(const ipv6_address &address) {
   constexpr std::size_t size = sizeof(ipv6_host_text::chars);
-  if (!numerical) local_domain();
+  if (!numerical_) local_domain();
   if (is_unspecified(address)) return named<size>(unspecified);
-  const char *name = numerical ? nullptr : look_up_host(address.bytes, sizeof address.bytes, AF_INET6);
+  const char *name = numerical_ ? nullptr : look_up_host(address.bytes, sizeof address.bytes, AF_INET6);
   return name ? named<size>(short_name(name)) : numeric(address);
 }
 
 // The common case, a number, is written in place.
 
-endpoint_text ipv4_endpoint_name(const ipv4_address &address, std::uint16_t port, const char *protocol,
-                                 bool numerical) {
+endpoint_text host_naming::ipv4_endpoint_name(const ipv4_address &address, std::uint16_t port,
+                                              const char *protocol) const {
   endpoint_text text;
-  char *const end = numerical && !is_unspecified(address)
+  char *const end = numerical_ && !is_unspecified(address)
                         ? address.append_to(text.chars)
-                        : put_host(text, ipv4_host_name(address, numerical), numerical);
-  put_service(text, end, port, protocol, numerical);
+                        : put_host(text, ipv4_host_name(address), numerical_);
+  put_service(text, end, port, protocol, numerical_);
   text.chars[text.size++] = ' ';
   return text;
 }
 
-endpoint_text ipv6_endpoint_name(const ipv6_address &address, std::uint16_t port, const char *protocol,
-                                 bool numerical) {
+endpoint_text host_naming::ipv6_endpoint_name(const ipv6_address &address, std::uint16_t port,
+                                              const char *protocol) {
   const std::string_view name = protocol;
   if (name == "tcp6") protocol = "tcp";
   if (name == "udp6") protocol = "udp";
   endpoint_text text;
-  char *const end = numerical && !is_unspecified(address) && !may_embed_scope(address)
+  char *const end = numerical_ && !is_unspecified(address) && !may_embed_scope(address)
                         ? std::min(address.append_to(text.chars), text.chars + numerical_host_limit)
-                        : put_host(text, ipv6_host_name(address, numerical), numerical);
-  put_service(text, end, port, protocol, numerical);
+                        : put_host(text, ipv6_host_name(address), numerical_);
+  put_service(text, end, port, protocol, numerical_);
   return text;
 }

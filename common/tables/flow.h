@@ -36,6 +36,11 @@ inline constexpr value_names flow_states{"UNKNOWN",
                                           {21, "SINGLE"},
                                           {22, "MULTIPLE"}}};
 
+// The name of an endpoint's state, or "UNKNOWN".
+inline const format::name_text &flow_state_name(std::uint32_t state) {
+  return flow_states.of(state);
+}
+
 inline constexpr value_names service_classes{"UNK",
                                              {{0x000000, "BE"},
                                               {0x080090, "BKS"},
@@ -47,6 +52,11 @@ inline constexpr value_names service_classes{"UNK",
                                               {0x380100, "VI"},
                                               {0x400180, "VO"},
                                               {0x480190, "CTL"}}};
+
+// The label of a service class, or "UNK".
+inline const format::name_text &svc_class_name(std::int32_t service_class) {
+  return service_classes.of(service_class);
+}
 
 inline constexpr bit_names flow_flag_names =
     "\20"
@@ -63,6 +73,16 @@ inline constexpr bit_names flow_flag_names =
     "\34o"
     "\37x"
     "\40r";
+
+// The thirteen letters of a flow's flags and a blank.
+inline format::name_text flow_flags_text(std::uint32_t flags) {
+  static_assert(flow_flag_names.count < sizeof format::name_text::chars);
+  format::name_text text;
+  char *end = flags_text{flags, flow_flag_names}.append_to(text.chars);
+  *end++ = ' ';
+  text.end_at(end);
+  return text;
+}
 
 inline constexpr bit_names route_flag_names =
     "\20"

@@ -92,3 +92,9 @@ char *ipv6_address::append_to(char *to) const {
   }
   return to;
 }
+
+format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6]) {
+  const auto byte = [&address](std::size_t i) { return static_cast<unsigned>(address[i]); };
+  return format::text_of<"%02x:%02x:%02x:%02x:%02x:%02x", 18>(byte(0), byte(1), byte(2), byte(3), byte(4),
+                                                              byte(5));
+}

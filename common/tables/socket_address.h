@@ -30,6 +30,9 @@ struct ipv6_address {
   char *append_to(char *to) const;
 };
 
+// The six bytes of a link layer's address as "02:00:5e:10:00:01".
+format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6]);
+
 // The family says which of the two addresses is meant.
 struct socket_address {
   std::uint8_t length;

@@ -63,4 +63,9 @@ using counter_name = format::column_text<16, 24>;
 // Protocols above IP.
 inline constexpr value_names ip_protocols{"unk.", {{6, "tcp"}, {17, "udp"}}};
 
+// "tcp", "udp" or "unk." for an IP protocol number.
+inline const format::name_text &proto_name(std::uint8_t protocol) {
+  return ip_protocols.of(protocol);
+}
+
 #endif

@@ -62,6 +62,21 @@ struct bit_names {
 // in the order of the string that they were written in.
 void print_flags(const char *label, std::uint32_t value, const bit_names &names);
 
+// The letter of each bit that is set, the first of its name, and "-" for each that is clear, in the order of
+// the names.
+struct flags_text {
+  std::uint32_t flags;
+  const bit_names &letters;
+
+  static constexpr std::size_t text_size = 32;
+  char *append_to(char *to) const {
+    for (std::size_t i = 0; i < letters.count; ++i) {
+      *to++ = flags & letters.entries[i].bit ? letters.entries[i].name.chars[0] : '-';
+    }
+    return to;
+  }
+};
+
 // Stores the short name of process `pid` in `buffer`, cut to `size` - 1 bytes and terminated, and returns it.
 // `with_pid` appends "." and the id where there is room behind the full name. A process that cannot be
 // queried is "<unknown>." and the id, whatever `with_pid` says.
