@@ -7,11 +7,13 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstring>
 #include <iterator>
 #include <string_view>
 
 #include "common/tables/kernel_table.h"
 #include "common/tables/record_walk.h"
+#include "common/tables/socket_address.h"
 #include "common/text/output.h"
 #include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
@@ -90,12 +92,21 @@ void print_range(const tv_stats_netns_range &range) {
   print<"%11s %10d %10d %10d\n">(ports, range.subsystem, range.bsd, range.listeners);
 }
 
+template <class Address>
+format::small_text<48> address_text(const tv_stats_netns &netns) {
+  Address address;
+  std::memcpy(address.bytes, netns.address, sizeof address.bytes);
+  format::small_text<48> text;
+  text.end_at(address.append_to(text.chars));
+  return text;
+}
+
 void __tv_stats_netns_print(const tv_stats_netns &netns, record_walk ranges) {
-  char text[INET6_ADDRSTRLEN];
-  const char *address = "global namespace";
-  if (netns.address_length == 4) address = inet_ntop(AF_INET, netns.address, text, sizeof text);
-  if (netns.address_length == 16) address = inet_ntop(AF_INET6, netns.address, text, sizeof text);
-  print<"%s port reservations for %s\n">(netns.protocol == ip_protocols.number("udp") ? "udp" : "tcp", address);
+  format::small_text<48> address = "global namespace";
+  if (netns.address_length == 4) address = address_text<ipv4_address>(netns);
+  if (netns.address_length == 16) address = address_text<ipv6_address>(netns);
+  print<"%s port reservations for %s\n">(netns.protocol == ip_protocols.number("udp") ? "udp" : "tcp",
+                                         address);
   print<"%11s %10s %10s %10s\n">("PORT(S)", "TARVEL", "BSD", "LISTENER");
   for (tv_stats_netns_range range; ranges.take(range);) print_range(range);
   print<"--------------------------------------------\n">();
