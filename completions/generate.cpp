@@ -8,8 +8,9 @@
 #include <string_view>
 #include <vector>
 
+#include "common/tables/values.h"
 #include "tarvelctl/command.h"
-#include "tarvelctl/protocol_words.h"
+#include "tarvelctl/netstat_options.h"
 
 namespace {
 
@@ -29,7 +30,7 @@ constexpr struct {
 template <class Words>
 std::string names_of(const Words &words) {
   std::string names;
-  for (const auto &word : words) names.append(names.empty() ? "" : " ").append(word.name);
+  for (const auto &word : words) names.append(names.empty() ? "" : " ").append(word.name.view());
   return names;
 }
 
@@ -41,7 +42,7 @@ const struct {
   std::string values;
 } known_values[] = {
     {cmd_netns, "ip", "global"},
-    {cmd_netns, "proto", names_of(netns_protocols)},
+    {cmd_netns, "proto", names_of(ip_protocols.rows)},
     {cmd_netstat, "per-protocol", names_of(netstat_protocols)},
     {cmd_netstat, "uuid", "@nexuses"},
     {cmd_tree, "", "@objects"},

@@ -17,7 +17,6 @@
 #include "common/text/output.h"
 #include "common/text/output_helpers.h"
 #include "tarvelctl/command.h"
-#include "tarvelctl/protocol_words.h"
 
 const option netns_options[] = {
     {"all", no_argument, nullptr, 'a'},
@@ -59,8 +58,8 @@ void take_address(netns_request &request, const char *text) {
 }
 
 void take_protocol(netns_request &request, std::string_view name) {
-  for (const netns_protocol_word &known : netns_protocols) {
-    if (known.name == name) request.protocol = known.number;
+  for (const named_value &known : ip_protocols.rows) {
+    if (known.name.view() == name) request.protocol = static_cast<std::uint8_t>(known.number);
   }
 }
 

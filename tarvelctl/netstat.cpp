@@ -8,7 +8,6 @@
 #include "common/text/output.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
-#include "tarvelctl/protocol_words.h"
 #include "tarvelctl/reports.h"
 
 netstat_settings netstat_options;
@@ -47,7 +46,7 @@ constexpr struct {
 // Turns on the setting that `word` names. False where none has that name.
 bool turn_on(std::span<const named_setting> settings, std::string_view word) {
   for (const named_setting &each : settings) {
-    if (each.name != word) continue;
+    if (each.name.view() != word) continue;
     netstat_options.*each.turned_on = 1;
     return true;
   }

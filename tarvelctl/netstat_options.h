@@ -6,6 +6,7 @@
 #include <cstdint>
 
 #include "common/tables/uuid.h"
+#include "common/text/print.h"
 
 // One record for the process, all zero at its start and then only ever set: by the netstat command from its
 // options, and `numerical` by the flow listings too. Reports that run as commands of their own see no filter.
@@ -37,5 +38,19 @@ struct netstat_settings {
 };
 
 extern netstat_settings netstat_options;
+
+// A word of the command line and the setting that it turns on.
+struct named_setting {
+  format::name_text name;
+  int netstat_settings::*turned_on;
+};
+
+// Of `netstat -p`, for completions too.
+inline constexpr named_setting netstat_protocols[] = {
+    {"ip", &netstat_settings::proto_ip},
+    {"ip6", &netstat_settings::proto_ip6},
+    {"tcp", &netstat_settings::proto_tcp},
+    {"udp", &netstat_settings::proto_udp},
+};
 
 #endif
