@@ -6,40 +6,39 @@
 #include "common/text/text.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
-#include "lab/root_directory.h"
 #include "lab/simulation.h"
 
 namespace lab {
 
-int generate(const options &asked) {
-  hold_file_size_signal();
-  root_directory root(own_directory::make(asked.directory));
-  const bool made =
-      root.prepare() && root.remove_processes() && root.publish(make_world(asked.size, asked.seed));
-  return made ? EXIT_SUCCESS : EXIT_FAILURE;
+bool simulation::start() {
+  return root_.prepare() && root_.remove_processes() && root_.publish(state_);
 }
 
-bool keep_moving(world &state, root_directory &root, std::uint32_t interval, const sigset_t &stop) {
-  std::int64_t due = monotonic_milliseconds() + interval;
+bool simulation::keep_moving(const sigset_t &stop) {
+  std::int64_t due = monotonic_milliseconds() + interval_;
   for (;;) {
     if (stopped_before(due, stop)) return true;
     // A world too large for the interval skips some, so that its rates stay true.
-    const auto late = static_cast<std::uint32_t>((monotonic_milliseconds() - due) / interval);
-    advance(state, (1 + late) * interval);
-    due += std::int64_t{1 + late} * interval;
-    if (!root.publish(state)) return false;
+    const auto late = static_cast<std::uint32_t>((monotonic_milliseconds() - due) / interval_);
+    advance(state_, (1 + late) * interval_);
+    due += std::int64_t{1 + late} * interval_;
+    if (!root_.publish(state_)) return false;
   }
+}
+
+int generate(const options &asked) {
+  hold_file_size_signal();
+  return simulation(asked, own_directory::make(asked.directory)).start() ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
 int simulate(const options &asked) {
   const sigset_t stop = block_stop_signals();
   hold_file_size_signal();
-  root_directory root(own_directory::make(asked.directory));
-  world state = make_world(asked.size, asked.seed);
-  if (!root.prepare() || !root.remove_processes() || !root.publish(state)) return EXIT_FAILURE;
+  simulation kernel(asked, own_directory::make(asked.directory));
+  if (!kernel.start()) return EXIT_FAILURE;
   print<"simulating in %s\n">(foreign_text{asked.directory});
   report.flush();
-  return keep_moving(state, root, asked.interval, stop) ? EXIT_SUCCESS : EXIT_FAILURE;
+  return kernel.keep_moving(stop) ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
 }  // namespace lab

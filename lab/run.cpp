@@ -24,7 +24,6 @@
 #include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
-#include "lab/root_directory.h"
 #include "lab/simulation.h"
 
 namespace lab {
@@ -109,11 +108,8 @@ class mover {
 
 // Makes a world in the directory and keeps it moving.
 bool start_simulation(const options &asked, const temporary_directory &directory, mover &kernel) {
-  root_directory root(directory.opened().enter("."));
-  world state = make_world(asked.size, asked.seed);
-  if (!root.prepare() || !root.publish(state)) return false;
-  return kernel.start(directory,
-                      [&](const sigset_t &stop) { keep_moving(state, root, asked.interval, stop); });
+  simulation moving(asked, directory.opened().enter("."));
+  return moving.start() && kernel.start(directory, [&](const sigset_t &stop) { moving.keep_moving(stop); });
 }
 
 // The link to the moment that is shown: a reader follows one to the root, and none below it.

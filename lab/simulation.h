@@ -1,17 +1,33 @@
-// A world that moves.
+// A world in a directory, which may move.
 
 #ifndef TARVELCTL_LAB_SIMULATION_H
 #define TARVELCTL_LAB_SIMULATION_H
 
 #include <signal.h>
 
+#include "lab/command_line.h"
 #include "lab/root_directory.h"
 
 namespace lab {
 
-// Publishes what happens every `interval` milliseconds, until one of the signals in `stop`, which must be
-// blocked, arrives. Returns false when publishing fails.
-bool keep_moving(world &state, root_directory &root, std::uint32_t interval, const sigset_t &stop);
+class simulation {
+ public:
+  simulation(const options &asked, own_directory directory)
+      : root_(std::move(directory)), state_(make_world(asked.size, asked.seed)), interval_(asked.interval) {}
+
+  // Publishes the world, in place of any other that the directory shows. Like all here, returns false after a
+  // message on standard error.
+  bool start();
+
+  // Publishes what happens every interval, until one of the signals in `stop`, which must be blocked,
+  // arrives.
+  bool keep_moving(const sigset_t &stop);
+
+ private:
+  root_directory root_;
+  world state_;
+  std::uint32_t interval_;
+};
 
 }  // namespace lab
 
