@@ -58,8 +58,12 @@ class record_walk {
   std::span<const std::byte> rest_;
 };
 
-// The record at `index` of an array of records, which has one there, by value. It is copied in blocks,
-// because the compilers' one instruction for copies of this size takes longer to start than to copy.
+// What follows reads arrays of records and checks nothing. The caller guarantees that the record at `index`
+// lies in `records` with all its bytes: it has divided their size by that of a record, or a walk has stepped
+// over them.
+
+// The record at `index`, which may lie at any address, by value. It is copied in blocks, because the
+// compilers' one instruction for copies of this size takes longer to start than to copy.
 template <class Record>
 Record record_at(std::span<const std::byte> records, std::size_t index) {
   static_assert(std::is_trivially_copyable_v<Record>);
@@ -72,7 +76,7 @@ Record record_at(std::span<const std::byte> records, std::size_t index) {
   return record;
 }
 
-// A member of the record at `index`, which the array has: `offset` and type as in the record.
+// A member of the record at `index`: `offset` and type as in the record, within which it lies.
 template <class Record, class Member>
 Member member_at(std::span<const std::byte> records, std::size_t index, std::size_t offset) {
   Member value;
