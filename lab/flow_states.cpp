@@ -27,6 +27,10 @@ constexpr tcp_behaviour tcp_behaviours[] = {
 };
 static_assert(std::size(tcp_behaviours) == tcp::gone);
 
+// Of ends without connection state, by the packets that they have sent.
+constexpr std::uint32_t datagram_states[] = {flow_states.number("NO_TRAFFIC"), flow_states.number("SINGLE"),
+                                             flow_states.number("MULTIPLE")};
+
 }  // namespace
 
 const tcp_behaviour &behaviour_of(std::uint8_t state) {
@@ -36,7 +40,7 @@ const tcp_behaviour &behaviour_of(std::uint8_t state) {
 two_way<std::uint32_t> states_of(const flow &source) {
   if (source.use->protocol == tcp_protocol) return {source.state, behaviour_of(source.state).remote};
   const auto by_packets = [](const traffic &sent) {
-    return datagram::no_traffic + static_cast<std::uint32_t>(std::min<std::uint64_t>(sent.packets, 2));
+    return datagram_states[std::min<std::uint64_t>(sent.packets, 2)];
   };
   return {by_packets(source.moved.out), by_packets(source.moved.in)};
 }

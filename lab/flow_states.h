@@ -26,13 +26,6 @@ enum state : std::uint8_t {
 };
 }  // namespace tcp
 
-// Ends without connection state: by how many packets they have sent.
-namespace datagram {
-inline constexpr std::uint32_t no_traffic = flow_states.number("NO_TRAFFIC");
-inline constexpr std::uint32_t single = flow_states.number("SINGLE");
-inline constexpr std::uint32_t multiple = flow_states.number("MULTIPLE");
-}  // namespace datagram
-
 struct tcp_behaviour {
   tcp::state remote;  // the other end's state
   bool sends;

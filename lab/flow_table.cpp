@@ -18,7 +18,7 @@ constexpr std::uint32_t tells_close = flow_flag_names.bit("e");
 
 std::uint32_t flags_of(const flow &source) {
   std::uint32_t flags = 0;
-  if (source.use->urgency != best_effort) flags |= marked;
+  if (source.use->service_class != service_classes.number("BE")) flags |= marked;
   if (source.route == none) return flags | listener;
   flags |= connected;
   if (source.use->protocol != tcp_protocol) return flags;
@@ -64,7 +64,7 @@ void write_flows(const world &state, table_file &file) {
     set_port(record.sf_local, source.local_port);
     set_port(record.sf_remote, source.remote_port);
     record.sf_protocol = source.use->protocol;
-    record.sf_svc = source.use->urgency;
+    record.sf_svc = source.use->service_class;
     record.sf_adv_idx = source.advisory;
     const two_way<std::uint32_t> ends = states_of(source);
     record.sf_lstats = end_of(source.moved.out, ends.out, round_trip_time(state, source, 1));

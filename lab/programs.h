@@ -15,24 +15,10 @@ namespace lab {
 inline constexpr std::uint8_t tcp_protocol = ip_protocols.number("tcp");
 inline constexpr std::uint8_t udp_protocol = ip_protocols.number("udp");
 
-// What a service asks for, by the label that reports give it.
-enum service_class : std::int32_t {
-  best_effort = service_classes.number("BE"),
-  background_system = service_classes.number("BKS"),
-  background = service_classes.number("BK"),
-  responsive = service_classes.number("RD"),
-  management = service_classes.number("OAM"),
-  audio_video = service_classes.number("AV"),
-  responsive_video = service_classes.number("RV"),
-  video = service_classes.number("VI"),
-  voice = service_classes.number("VO"),
-  control = service_classes.number("CTL"),
-};
-
 struct service {
   std::uint8_t protocol;
   std::uint16_t port;
-  service_class urgency;
+  std::int32_t service_class;
   bool inbound;  // others connect to it
   two_way<std::uint32_t> packet_size;
   std::uint32_t packets_per_second;  // at most, of the busier direction

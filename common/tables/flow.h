@@ -179,6 +179,11 @@ inline constexpr auto flow_rows = [] {
 inline constexpr record_description flow_description =
     describe<tv_stats_flow>("tv_stats_flow", "flow", flow_rows);
 
+struct tv_stats_flow_adv_entry {
+  uuid sfae_flow_uuid;
+  std::uint32_t sfae_flags;
+};
+
 // The advisories of a flow switch. Its entries, `sfa_entries`, follow, then the next record.
 struct tv_stats_flow_adv {
   static constexpr std::uint32_t max_entries = 512;
@@ -189,17 +194,10 @@ struct tv_stats_flow_adv {
   std::uint32_t sfa_entries_count;
 
   // Bytes of `sfa_entries` behind the header.
-  std::uint64_t trailing_size() const;
+  std::uint64_t trailing_size() const {
+    return std::uint64_t{sfa_entries_count} * sizeof(tv_stats_flow_adv_entry);
+  }
 };
-
-struct tv_stats_flow_adv_entry {
-  uuid sfae_flow_uuid;
-  std::uint32_t sfae_flags;
-};
-
-inline std::uint64_t tv_stats_flow_adv::trailing_size() const {
-  return std::uint64_t{sfa_entries_count} * sizeof(tv_stats_flow_adv_entry);
-}
 
 static_assert(sizeof(tv_stats_flow_adv) == 40);
 static_assert(sizeof(tv_stats_flow_adv_entry) == 20);

@@ -10,18 +10,6 @@
 
 inline constexpr char netns_node[] = "kern.tarvel.stats.netns";
 
-// The head of a namespace. `entry_count` ranges follow, then the next record.
-struct tv_stats_netns {
-  std::uint8_t address[16];
-  std::uint8_t address_length;
-  std::uint8_t protocol;
-  std::uint8_t entry_count;
-  std::uint8_t reserved_19[13];
-
-  // Bytes of the ranges behind the head.
-  std::uint64_t trailing_size() const;
-};
-
 struct tv_stats_netns_range {
   std::uint16_t first_port;
   std::uint16_t last_port;
@@ -32,9 +20,17 @@ struct tv_stats_netns_range {
   std::uint8_t reserved_20[12];
 };
 
-inline std::uint64_t tv_stats_netns::trailing_size() const {
-  return std::uint64_t{entry_count} * sizeof(tv_stats_netns_range);
-}
+// The head of a namespace. `entry_count` ranges follow, then the next record.
+struct tv_stats_netns {
+  std::uint8_t address[16];
+  std::uint8_t address_length;
+  std::uint8_t protocol;
+  std::uint8_t entry_count;
+  std::uint8_t reserved_19[13];
+
+  // Bytes of the ranges behind the head.
+  std::uint64_t trailing_size() const { return std::uint64_t{entry_count} * sizeof(tv_stats_netns_range); }
+};
 
 static_assert(sizeof(tv_stats_netns) == 32);
 static_assert(sizeof(tv_stats_netns_range) == 32);
