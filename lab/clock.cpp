@@ -10,19 +10,21 @@ std::int64_t monotonic_milliseconds() {
   return now.tv_sec * std::int64_t{1000} + now.tv_nsec / 1'000'000;
 }
 
+sigset_t set_of(std::initializer_list<int> signals) {
+  sigset_t set;
+  sigemptyset(&set);
+  for (const int signal : signals) sigaddset(&set, signal);
+  return set;
+}
+
 sigset_t block_stop_signals() {
-  sigset_t stop;
-  sigemptyset(&stop);
-  sigaddset(&stop, SIGINT);
-  sigaddset(&stop, SIGTERM);
+  const sigset_t stop = set_of({SIGINT, SIGTERM});
   sigprocmask(SIG_BLOCK, &stop, nullptr);
   return stop;
 }
 
 void hold_file_size_signal() {
-  sigset_t file_size;
-  sigemptyset(&file_size);
-  sigaddset(&file_size, SIGXFSZ);
+  const sigset_t file_size = set_of({SIGXFSZ});
   sigprocmask(SIG_BLOCK, &file_size, nullptr);
 }
 

@@ -6,11 +6,14 @@
 #include <signal.h>
 
 #include <cstdint>
+#include <initializer_list>
 
 namespace lab {
 
 // Milliseconds on a clock that no one sets.
 std::int64_t monotonic_milliseconds();
+
+sigset_t set_of(std::initializer_list<int> signals);
 
 // The signals that end what goes on by itself, SIGINT and SIGTERM, which it blocks.
 sigset_t block_stop_signals();

@@ -30,7 +30,6 @@ namespace lab {
 
 namespace {
 
-constexpr int passed_on[] = {SIGINT, SIGTERM, SIGHUP, SIGQUIT};
 constexpr int not_found = 127;
 constexpr int not_executable = 126;
 
@@ -93,10 +92,7 @@ class mover {
     if (pid_ > 0) return true;
     setpgid(0, 0);
     prctl(PR_SET_PDEATHSIG, SIGTERM);
-    sigset_t stop;
-    sigemptyset(&stop);
-    sigaddset(&stop, SIGTERM);
-    if (getppid() == owner) move(stop);
+    if (getppid() == owner) move(set_of({SIGTERM}));
     // The owner stops its child in a harder way: here it is gone, and its directory left behind.
     if (getppid() != owner) directory.remove();
     _exit(EXIT_SUCCESS);
@@ -190,9 +186,7 @@ int end_like(int status) {
   const rlimit no_core{};
   setrlimit(RLIMIT_CORE, &no_core);  // the command's own core is the one that tells
   ::signal(signal, SIG_DFL);
-  sigset_t set;
-  sigemptyset(&set);
-  sigaddset(&set, signal);
+  const sigset_t set = set_of({signal});
   sigprocmask(SIG_UNBLOCK, &set, nullptr);
   raise(signal);
   return 128 + signal;
@@ -237,11 +231,8 @@ bool open_given(const std::string &name, std::string &root, captured &found) {
 }  // namespace
 
 int run(const options &asked) {
-  sigset_t signals;
+  const sigset_t signals = set_of({SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGCHLD});
   sigset_t before;
-  sigemptyset(&signals);
-  for (const int signal : passed_on) sigaddset(&signals, signal);
-  sigaddset(&signals, SIGCHLD);
   sigprocmask(SIG_BLOCK, &signals, &before);
   hold_file_size_signal();
   signal(SIGCHLD, SIG_DFL);  // a caller that ignores it would take the command's status with it
