@@ -18,6 +18,7 @@ import time
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
+from records import RECORDS, TABLES  # noqa: E402
 from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run  # noqa: E402
 
 commands = ("channel", "flow -n", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a",
@@ -167,7 +168,7 @@ class Moments(CaptureTest):
         self.assertEqual(len(offsets), 3)
         self.assertLess(sorted(offset % .25 for offset in offsets)[1], .1)  # a machine under load is late now and then
         for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
-            self.assertGreater(len(list(Kernel(root).channels())), 10)
+            self.assertGreater(len(Kernel(root).channels()), 10)
             self.assertGreater(len(list(root.glob("proc/*/comm"))), 5)
         long = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", self.directory / "long"],
                                 stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL, env={**os.environ, "TARVEL_ROOT": str(self.directory / "made")})
@@ -289,24 +290,17 @@ class Moments(CaptureTest):
 
 
 docs = pathlib.Path(__file__).parents[1] / "docs"
-# Of each record the fields that survive redaction, and all fields as (offset, size, type, name): as the manual has them.
-surviving = {record: set(re.split(r"[\s,;]+", names)) for records, names in
+# Of each record the fields, and the parts with all that is read of them, that survive redaction.
+surviving = {record: set(re.findall(r"[\w.]+", names)) for records, names in
              re.findall(r"^\.It Vt (.*)\n((?:[^.].*\n)+)", (docs / "tarvellab.1").read_text(), flags=re.M) for record in records.split(" , ")}
-rows = {record: [(int(at), int(size), *names) for at, size, *names in re.findall(r"^\.It (\d+) Ta (\d+) Ta (\S+) Ta (\S+)", columns, flags=re.M)]
-        for record, columns in re.findall(r"^\.Vt (\w+) ,\n\d+ bytes:\n(.*?)\.El", (docs / "tarvel-tables.5").read_text(), flags=re.M | re.S)}
-rows["uuid"], surviving["uuid"] = [(0, 16, "uuid", "uuid")], {"uuid"}
-nested = {56: "ring_activity", 64: "tv_flow_endpoint_stats", 28: "socket_address", 32: "tv_stats_nexus_head", 12 * 208: "tv_stats_region"}
 
 
-def survives(record, names=()):
+def survives(record):
     """For each byte of a record whether it survives."""
     result = []
-    for _, size, kind, field in rows[record]:
-        if kind.startswith("record"):
-            part = survives(nested[size], {name[len(field) + 1:] for name in surviving[record] if name.startswith(field + ".")})
-            result += part * (size // len(part))
-        else:
-            result += [field in names or field in surviving.get(record, ())] * size
+    for field, row in RECORDS[record]["fields"].items():
+        listed = row["kind"] != "unread" and bool({field, row["part"]} & surviving[record])
+        result += (survives(row["nested"]) if row["nested"] else [listed] * row["size"]) * row["count"]
     return result
 
 
@@ -359,6 +353,7 @@ class Redact(CaptureTest):
         "nexus_provider_list": [("nexus_provider_record", [(64, b"com.Browser.10.0.0.7\0", b"provider1"), (128, b"\x14\0\0\0", b"\x09"), (256, b"\1\0\0\0")], []),
                                 ("uuid", [], []),
                                 ("nexus_provider_record", [(64, b"en0\0", b"provider2"), (128, b"\0\0\0\0", b""), (256, b"\0\0\0\0")], [])],
+        "ring_stat_enable": [("ring_stat_enable", [], [])],
         "nexus_channel_list": [("nexus_channel_header", [(16, b"\1\0\0\0")], []), ("channel_entry", [(32, b"\1\0\0\0\0\0\0\0")], []), ("ring_stats", [], [])],
         "stats/arena": [("tv_stats_arena", [(0, b"host.example\0", b"arena1"), *((80 + 208 * i, b"r%d\0" % (i // 2), b"region%d" % (i // 2 + 1)) for i in range(11)),
                                             (80 + 208 * 11 + 104, bytes(8)), (2584, bytes(4))], [(2368 + 84, 68), (2368 + 168, 40), (2588, 20)])],
@@ -366,6 +361,7 @@ class Redact(CaptureTest):
 
     def test_OnlyWhatTheManualListsSurvives(self):
         noise = random.Random(1)
+        self.assertEqual({name for records in self.formats.values() for name, *_ in records} | {"tv_stats_region"}, RECORDS.keys())
         for name, records in self.formats.items():
             before = after = b""
             for record, fields, gone in records:
@@ -410,11 +406,10 @@ class Redact(CaptureTest):
         made = self.generate("--flows", 300, "--seed", 3)
         self.assertEqual(self.capture(made.root, "--redact", "--every", "0.05", "--count", 3), "")
         originals, saved = set(), files(self.directory / "saved")
-        for record in made.flows():
-            originals |= {record[at + 8:at + 24] if record[81] == 30 else record[at + 4:at + 8] for at in (80, 108)}
-        for record in made.records("stats/flow_route", 256):
-            originals |= {record[at + 16:at + 24] if record[101] == 30 else record[at + 4:at + 8] for at in (72, 100, 128)} | {record[192:198]}
-        originals |= {head[:head[16]] for head, _ in made.chains("stats/netns", 32, 18, 32) if head[16]}
+        for records in map(made.records, TABLES):
+            for row, at in (place for record in records for kind in ("address", "mac") for place in record.find("kind", kind)):
+                held = records[0].table[at:at + row["size"]].rstrip(b"\0")  # an IPv4 address of 16 bytes is the first 4
+                originals |= {held, held[-8:]}
         originals = {original for original in originals if any(original[:-1])}  # all but unspecified, and the 1 of fe80::1
         names = {path.read_bytes().strip() for path in made.root.glob("proc/*/comm")} | {b"com.example"}  # of arenas, ...
         self.assertGreater(len(originals), 100)

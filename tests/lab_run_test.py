@@ -15,7 +15,7 @@ import time
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run, u32, u64  # noqa: E402
+from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run  # noqa: E402
 
 
 class Simulate(LabTest):
@@ -29,15 +29,15 @@ class Simulate(LabTest):
         sizes, inodes, end = set(), set(), time.monotonic() + 2
         while time.monotonic() < end:
             inodes.add((kernel.root / node_dir / "stats/flow").stat().st_ino)
-            sizes.add(len(kernel.flows()))
-            kernel.providers(), list(kernel.channels()), list(kernel.chains("stats/flow_adv", 40, 36, 20))
+            sizes.add(len(kernel.records("stats/flow")))
+            [kernel.records(name) for name in ("nexus_provider_list", "nexus_channel_list", "stats/flow_adv")]
         process.send_signal(signal.SIGINT)
         self.assertEqual(process.wait(5), 0)
         self.assertGreater(min(len(sizes), len(inodes)), 10)
         self.assertTrue(all(1000 < size < 3000 for size in sizes))
         self.assertEqual([name for name in files(self.directory) if "/." in name], [])
         running = {int(p.parent.name) for p in self.directory.glob("proc/*/comm")}
-        self.assertLessEqual(set(kernel.pids()) - {0}, running)
+        self.assertLessEqual(kernel.pids() - {0}, running)
 
     def test_RatesAreTheDifferencesOfSnapshots(self):
         process, kernel = self.simulate("--interval", "200")
@@ -46,15 +46,15 @@ class Simulate(LabTest):
         def next_snapshot(last=[None]):
             self.wait_for(lambda: path.stat().st_ino != last[0])
             last[0] = path.stat().st_ino
-            return {entry[:16]: rings for _, entry, rings in kernel.channels() if entry}
+            return {channel["channel_uuid"]: channel["tx"] + channel["rx"] for channel in kernel.channels()}
 
         before, compared = next_snapshot(), 0
         for _ in range(8):
             after = next_snapshot()
             for old, new in ((old, new) for c in before.keys() & after for old, new in zip(before[c], after[c])):
-                moved = u64(new, 16) - u64(old, 16)
+                moved = new["xfer.bytes"] - old["xfer.bytes"]
                 self.assertGreaterEqual(moved, 0)
-                compared += moved > 0 and abs(u64(new, 48) - 5 * moved) < 5
+                compared += moved > 0 and abs(new["xfer.bytes_per_sec"] - 5 * moved) < 5
             before = after
         process.terminate()
         self.assertEqual(process.wait(5), 0)

@@ -12,7 +12,7 @@ import sys
 import unittest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from lab_kernel import LabTest, files, limit_files, node_dir, none, run, text, u32, u64  # noqa: E402
+from lab_kernel import LabTest, files, limit_files, node_dir, none, run  # noqa: E402
 
 
 class Generate(LabTest):
@@ -26,84 +26,80 @@ class Generate(LabTest):
             self.check_references(self.generate(*options))
         for size in "providers", "nexuses", "channels", "processes":  # nothing stands on nothing
             kernel = self.generate("--" + size, 0)
-            self.assertEqual(kernel.flows(), [], size)
+            self.assertEqual(kernel.table("stats/flow"), b"", size)
             self.check_references(kernel)
 
     def check_references(self, kernel):
-        instances = [i for _, items in kernel.providers() for i in items]
-        ports = {(nexus, u32(e, 28)): e for nexus, e, _ in kernel.channels() if e}
-        self.assertEqual(instances, list(dict.fromkeys(nexus for nexus, _, _ in kernel.channels())))
-        lists = {head[:16]: items for head, items in kernel.chains("stats/flow_adv", 40, 36, 20)}
+        groups, lists = kernel.records("nexus_channel_list"), kernel.records("stats/flow_adv")
+        instances = [instance["uuid"] for provider in kernel.records("nexus_provider_list") for instance in provider["instances"]]
+        ports = {(group["nexus_uuid"], channel["port"]): channel for group in groups for channel in group["channels"]}
+        self.assertEqual(instances, [group["nexus_uuid"] for group in groups])
+        advisories = {(each["sfa_nx_uuid"], index): entry for each in lists for index, entry in enumerate(each["entries"])}
         taken, moved = set(), collections.Counter()
-        for flow in kernel.flows():
-            nexus, port, advisory = flow[:16], u32(flow, 76), u32(flow, 144)
-            self.assertEqual(u32(ports[nexus, port], 20), u32(flow, 68))
+        for flow in kernel.records("stats/flow"):
+            nexus, port, advisory = flow["sf_nx_uuid"], flow["sf_nx_port"], flow["sf_adv_idx"]
+            self.assertEqual(ports[nexus, port]["pid"], flow["sf_pid"])
             self.assertGreaterEqual(port, 2)
-            moved[nexus, port] += u64(flow, 152)
+            moved[nexus, port] += flow["sf_lstats.bytes"]
             if advisory != none:
                 self.assertNotIn((nexus, advisory), taken)
-                self.assertEqual(u32(lists[nexus][advisory], 16) & 1, 1)
+                self.assertEqual(advisories[nexus, advisory]["sfae_flags"] & 1, 1)
                 taken.add((nexus, advisory))
-        for nexus, entry, rings in kernel.channels():
-            if entry:
-                sent = sum(u64(ring, 16) for ring in rings[:u32(entry, 32)])
-                self.assertGreaterEqual(sent, moved[nexus, u32(entry, 28)])
-        for owner in kernel.records("stats/flow_owner", 128):
-            self.assertEqual(u32(ports[owner[:16], u32(owner, 72)], 20), u32(owner, 68))
+        for place, channel in ports.items():
+            self.assertGreaterEqual(sum(ring["xfer.bytes"] for ring in channel["tx"]), moved[place])
+        for owner in kernel.records("stats/flow_owner"):
+            self.assertEqual(ports[owner["sfo_nx_uuid"], owner["sfo_nx_port"]]["pid"], owner["sfo_pid"])
         for pid in kernel.pids():
             self.assertTrue(pid == 0 or (kernel.root / f"proc/{pid}/comm").is_file(), pid)
 
     def test_EveryStateClassAndFamilyAppears(self):
         for seed in range(1, 6):
-            flows = self.generate("--seed", seed).flows()
-            self.assertEqual({u32(f, 168) for f in flows}, {*range(11), 20, 21, 22}, seed)
-            self.assertEqual(len({u32(f, 140) for f in flows}), 10, seed)
-            self.assertEqual({(f[81], f[136]) for f in flows}, {(2, 6), (2, 17), (30, 6), (30, 17)}, seed)
-            local = [f for f in flows if f[81] == 30 and f[88:90] == b"\xfe\x80"]
-            self.assertTrue(local and all(f[90:92] != b"\0\0" and f[90:92] == f[118:120] for f in local), seed)
-            self.assertTrue(all(u32(f, 172) == 0 for f in flows if f[136] == 17))
+            flows = self.generate("--seed", seed).records("stats/flow")
+            self.assertEqual({f["sf_lstats.state"] for f in flows}, {*range(11), 20, 21, 22}, seed)
+            self.assertEqual(len({f["sf_svc"] for f in flows}), 10, seed)
+            self.assertEqual({(f["sf_local.family"], f["sf_protocol"]) for f in flows}, {(2, 6), (2, 17), (30, 6), (30, 17)}, seed)
+            scopes = [(f["sf_local.ipv6"][2:4], f["sf_remote.ipv6"][2:4]) for f in flows if f["sf_local.ipv6"][:2] == b"\xfe\x80"]
+            self.assertTrue(scopes and all(local == remote != b"\0\0" for local, remote in scopes), seed)
+            self.assertTrue(all(f["sf_lstats.rtt"] == 0 for f in flows if f["sf_protocol"] == 17))
 
-    def test_FieldsStandWhereTheFormatsHaveThem(self):
+    def test_FieldsHoldWhatBelongsThere(self):
         kernel = self.generate("--rings", 3)
-        head, items = kernel.providers()[0]
-        self.assertEqual((text(head, 64, 64), u32(head, 128)), ("com.example.multistack.en0", 26))
-        self.assertEqual([u32(head, at) for at in (132, 184, 256, 152, 156, 168)], [3, 1, len(items), 2, 1, 2048])
-        self.assertEqual({u32(h, 132) for h, _ in kernel.providers()}, {0, 1, 2, 3})
-        self.assertIn(1, {u32(h, 144) for h, _ in kernel.providers()})
+        providers = kernel.records("nexus_provider_list")
+        fields = "name", "name_length", "type", "subtype", "tx_rings", "rx_rings", "buf_size"
+        self.assertEqual([providers[0][field] for field in fields], ["com.example.multistack.en0", 26, 3, 1, 2, 1, 2048])
+        self.assertEqual({provider["type"] for provider in providers}, {0, 1, 2, 3})
+        self.assertIn(1, {provider["flags"] for provider in providers})
         self.assertEqual(kernel.table("ring_stat_enable"), b"\1")
-        _, _, rings = next(kernel.channels())
-        self.assertEqual([u32(ring, 0) for ring in rings], [0, 1, 0])
-        flow = kernel.flows()[0]
-        self.assertEqual((text(flow, 16, 16), text(flow, 36, 32)), ("en0", "browser"))
-        self.assertEqual({text(r, 16, 16) for r in kernel.records("stats/net_if", 320)}, {"en0", "en1", "en2"})
-        self.assertEqual({text(r, 16, 16) for r in kernel.records("stats/flow_switch", 448)}, {"en0", "en1", "bridge0"})
-        for stack in kernel.records("stats/userstack", 2496):  # IP and IPv6 carry what TCP and UDP deliver
-            self.assertEqual(u64(stack, 48 + 8 * 15) + u64(stack, 400 + 8 * 11), u64(stack, 688 + 8 * 15) + u64(stack, 2320 + 8 * 9))
-        for route in kernel.records("stats/flow_route", 256):
-            self.assertEqual(route[73], route[101])
-        namespaces = [tuple(head[16:18]) for head, _ in kernel.chains("stats/netns", 32, 18, 32)]
+        self.assertEqual([[ring["ring_id"] for ring in kernel.channels()[0][way]] for way in ("tx", "rx")], [[0, 1], [0]])
+        flow = kernel.records("stats/flow")[0]
+        self.assertEqual((flow["sf_if_name"], flow["sf_proc_name"]), ("en0", "browser"))
+        self.assertEqual({r["name"] for r in kernel.records("stats/net_if")}, {"en0", "en1", "en2"})
+        self.assertEqual({r["name"] for r in kernel.records("stats/flow_switch")}, {"en0", "en1", "bridge0"})
+        for stack in kernel.records("stats/userstack"):  # IP and IPv6 carry what TCP and UDP deliver
+            self.assertEqual(stack["ip"][15] + stack["ip6"][11], stack["tcp"][15] + stack["udp"][9])
+        for route in kernel.records("stats/flow_route"):
+            self.assertEqual(route["sfr_local.family"], route["sfr_remote.family"])
+        namespaces = [(each["address_length"], each["protocol"]) for each in kernel.records("stats/netns")]
         self.assertEqual(namespaces[:4], [(0, 6), (0, 17), (4, 6), (4, 17)])
 
     def test_SharedRegionsAreTheSameInAllArenas(self):
         regions, shared = {}, 0
-        for arena in self.generate().records("stats/arena", 2608):
-            for region in (arena[80 + 208 * i:288 + 208 * i] for i in range(12)):
-                if u64(region, 104):
-                    shared += region[64:80] in regions
-                    self.assertEqual(regions.setdefault(region[64:80], region), region)
-                    self.assertLessEqual(u64(region, 176), u64(region, 104))
-                    self.assertEqual(u64(region, 152), u64(region, 104) * u64(region, 96))
-                    self.assertLessEqual(u64(region, 120), u64(region, 136))
+        for region in (region for arena in self.generate().records("stats/arena") for region in arena["regions"]):
+            if region["seg_count"]:
+                shared += region["region_uuid"] in regions
+                self.assertEqual(regions.setdefault(region["region_uuid"], region.bytes), region.bytes)
+                self.assertLessEqual(region["seg_in_use"], region["seg_count"])
+                self.assertEqual(region["mem_total"], region["seg_count"] * region["seg_size"])
+                self.assertLessEqual(region["obj_count_req"], region["obj_count"])
         self.assertGreater(shared, 5)
 
     def test_SizesAreKeptToTheLastRecord(self):
         kernel = self.generate("--providers", 30, "--nexuses", 77, "--channels", 500, "--flows", 4000, "--stacks", 90,
                                "--arenas", 41, "--namespaces", 25, "--rings", 0)
-        self.assertEqual((len(kernel.providers()), sum(len(items) for _, items in kernel.providers())), (30, 77))
-        self.assertEqual(sum(entry is not None for _, entry, _ in kernel.channels()), 500)
-        self.assertEqual(len(kernel.flows()), 4000)
-        self.assertEqual([len(kernel.records("stats/" + n, size)) for n, size in (("userstack", 2496), ("arena", 2608))], [90, 41])
-        self.assertEqual(len(list(kernel.chains("stats/netns", 32, 18, 32))), 25)
+        self.assertEqual(sum(len(provider["instances"]) for provider in kernel.records("nexus_provider_list")), 77)
+        self.assertEqual(len(kernel.channels()), 500)
+        for table, count in ("nexus_provider_list", 30), ("stats/flow", 4000), ("stats/userstack", 90), ("stats/arena", 41), ("stats/netns", 25):
+            self.assertEqual(len(kernel.records(table)), count)
         for size, table in ("arenas", "arena"), ("stacks", "userstack"), ("namespaces", "netns"):
             self.assertEqual(self.generate("--" + size, 0).table("stats/" + table), b"")
 

@@ -17,13 +17,9 @@ import tty
 import unicodedata
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from torture import Torture, walk  # noqa: E402
+from records import TABLES, walk  # noqa: E402
+from torture import Torture  # noqa: E402
 
-# Where the texts of a record are, and their widths.
-TEXTS = {"nexus_provider_list": ((64, 64),), "stats/flow": ((16, 16), (36, 32)), "stats/flow_adv": ((16, 16),),
-         "stats/flow_owner": ((16, 16), (36, 32)), "stats/flow_route": ((32, 16),), "stats/userstack": ((16, 16),),
-         "stats/net_if": ((16, 16),), "stats/flow_switch": ((16, 16),),
-         "stats/arena": ((0, 64), *((80 + 208 * slot, 64) for slot in range(12)))}
 # With how many texts on a kernel of one provider, three channels and two flows, at least.
 COMMANDS = {"channel": 3, "flow": 4, "flow-adv": 2, "flow-owner": 2, "flow-route -n": 1, "flow-route": 3, "flow-switch": 1,
             "interface": 1, "memory": 4, "netstat -a": 8, "netstat -s": 2, "provider -D": 1, "show": 2, "tree": 6}
@@ -52,13 +48,13 @@ def texts(torture):
 
 def fill(kernel, tables, text):
     """Makes it the text of everything; one of 16 bytes goes on to the end of its field."""
-    for name, places in TEXTS.items():
-        table = bytearray(tables[name])
-        for start in walk(name, tables[name])[0][:-1]:
-            for at, width in places:
-                table[start + at:start + at + width] = (text * (width // 16) if len(text) == 16 else text).ljust(width, b"\0")
+    for name, records in tables.items():
+        table = bytearray(records[0].table)
+        for record in records:
+            for row, at in record.find("type", "text"):
+                table[at:at + row["size"]] = (text * (row["size"] // 16) if len(text) == 16 else text).ljust(row["size"], b"\0")
             if name == "nexus_provider_list":
-                struct.pack_into("<I", table, start + 128, 64)
+                struct.pack_into("<I", table, record.places("name_length")[0], 64)
         kernel.put(name, bytes(table))
     for name in kernel.root.glob("proc/*/comm"):
         name.write_bytes(text[:15] + b"\n")
@@ -110,7 +106,7 @@ def main():
     torture = Torture("terminal", __doc__)
     kernel = torture.make_kernel("--providers", 2, "--channels", 6, "--flows", 2, "--arenas", 1, "--processes", 2)
     kernel.environment.update(torture.name_services())
-    tables = {name: kernel.table(name) for name in TEXTS}
+    tables = {name: walk(name, kernel.table(name)) for name in TABLES}
     sinks = {on_terminal: hidden, on_utf8_terminal: functools.partial(hidden, charset="utf-8"), on_pipe: bytes,
              **({in_file: bytes} if torture.long else {})}
     harmless = {}

@@ -12,7 +12,8 @@ import struct
 import sys
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from torture import RECORDS, Result, Torture, walk  # noqa: E402
+from records import walk  # noqa: E402
+from torture import Result, Torture  # noqa: E402
 
 def broken(function, line, expression="scan == (buffer + length)", file="tarvelctl/tarvelctl"):
     return f"Assertion failed: ({expression}), function {function}, file {file}, line {line}.\n".encode(), -signal.SIGABRT
@@ -66,23 +67,25 @@ CASES = [(command, *case) for commands, *case in (
     (("netns -i global -p tcp", "netns -i 10.255.255.255 -p tcp"), "stats/netns", SHORT, whole, None)) for command in commands]
 
 
-def whole_part(name, table, cut):
+def ends_of(records):
+    """Where the records end; a group of channels ends with each of them."""
+    return [0, *(each.end for record in records for each in record.followers.get("channels") or [record])]
+
+
+def whole_part(records, table, cut):
     """The table of the whole records before `cut`. The group of channels that is cut counts those it still has."""
-    ends, groups = walk(name, table)
-    end = max(end for end in ends if end <= cut)
-    last = max((at for at, _ in groups if at + 24 <= cut), default=None)
-    if last is None:
-        return table[:end]
-    end = max(end, last + 24)
-    return table[:last + 16] + struct.pack("<I", sum(last + 24 < at <= end for at in ends)) + table[last + 20:end]
+    left = table[:max((record.end for record in records if record.end <= cut), default=0)]
+    for group in records:
+        if "channels" in group.followers and group.head_end <= cut < group.end:
+            whole, at = [each.end for each in group["channels"] if each.end <= cut], group.places("channel_count")[0]
+            left += table[group.at:at] + struct.pack("<I", len(whole)) + table[at + 4:max(whole, default=group.head_end)]
+    return left
 
 
-def orphans(kernel, providers):
+def orphans(kernel):
     """What the tree says of flows whose nexus no provider has."""
-    ends, _ = walk("nexus_provider_list", providers)
-    known = {providers[at:at + 16] for start, end in zip(ends, ends[1:]) for at in range(start + 264, end, 16)}
-    flows = kernel.table("stats/flow")
-    return b"orphan flow orphan nx_uuid" * sum(flows[at:at + 16] not in known for at in range(0, len(flows), 320))
+    known = {instance["uuid"] for provider in walk("nexus_provider_list", kernel.table("nexus_provider_list")) for instance in provider["instances"]}
+    return b"orphan flow orphan nx_uuid" * sum(flow["sf_nx_uuid"] not in known for flow in walk("stats/flow", kernel.table("stats/flow")))
 
 
 def rows(report):
@@ -94,8 +97,8 @@ def rows(report):
 def check_whole(torture, kernel, case, table, seen, uncut):
     """Whether the report of whole records has one block for each, and no rows but those of the uncut report."""
     command, name, _, _, start = case
-    records, uncut_rows = len(walk(name, table)[0]) - 1, iter(uncut)
-    said = orphans(kernel, kernel.table("nexus_provider_list")) if command in ("tree", "show", "channel-stats") else b""
+    records, uncut_rows = len(ends_of(walk(name, table))) - 1, iter(uncut)
+    said = orphans(kernel) if command in ("tree", "show", "channel-stats") else b""
     strange = [] if "--global" in command else [row for row in rows(seen.out) if row not in uncut_rows]
     blocks = len(re.findall(f"^{start}".encode(), seen.out, re.MULTILINE)) if start else records
     torture.expect(command, f"{records} whole records of {name}", (strange, blocks, seen[1:]), ([], records, (said, 0)))
@@ -124,6 +127,7 @@ def cuts(torture, ends):
 def torture_case(torture, kernel, case):
     command, name, (message, status), shown, start = case
     table = kernel.table(name)
+    records = walk(name, table)
     report = torture.run(kernel, command).out
     uncut, none = rows(report), of_none(command, start, report)
 
@@ -134,8 +138,8 @@ def torture_case(torture, kernel, case):
         check_whole(torture, kernel, case, contents, seen, uncut)
         return seen
 
-    for cut in cuts(torture, walk(name, table)[0]):
-        left = whole_part(name, table, cut)
+    for cut in cuts(torture, ends_of(records)):
+        left = whole_part(records, table, cut)
         expected = Result(none, b"", 0) if not left and none is not None else run_whole(left)
         kernel.put(name, table[:cut])
         if left != table[:cut] and not ("netns -i" in command and expected.out):

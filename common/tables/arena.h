@@ -86,23 +86,24 @@ inline constexpr auto region_rows = [] {
   constexpr row segments = ROW(seg_count).is(gauge, "seg_count", "segments, 0: no region here");
   // What the summary of the regions reads of an empty slot, too, is there without segments.
   const auto of_region = [&](const row &each) { return each.unless_zero(segments); };
-  return join(of_region(ROW(name).is(field_kind::name, "name", "of the region")),
-              ROW(region_uuid).is(identifier, "region", "the same in all its arenas"),
-              ROW(type).is(enumeration, "type", "see below").of(region_types),
-              of_region(ROW(mode).is(flags, "mode", "see below").of(region_mode_names)),
-              of_region(ROW(seg_size_req).is(gauge, "seg_size_req", "of a segment, asked for").in("bytes")),
-              of_region(ROW(seg_size).is(gauge, "seg_size", "of a segment, given").in("bytes")), segments,
-              of_region(ROW(obj_size_req).is(gauge, "obj_size_req", "of an object, asked for").in("bytes")),
-              of_region(ROW(obj_count_req).is(gauge, "obj_count_req", "objects, asked for")),
-              of_region(ROW(obj_size).is(gauge, "obj_size", "of an object, given").in("bytes")),
-              of_region(ROW(obj_count).is(gauge, "obj_count", "objects, given")),
-              of_region(ROW(objs_per_seg).is(gauge, "objs_per_seg", "objects in a segment")),
-              ROW(mem_total).is(gauge, "mem_total", "memory").in("bytes"),
-              ROW(mem_wired).is(gauge, "mem_wired", "wired memory, 0: not wired").in("bytes"),
-              ROW(reserved_168), of_region(ROW(seg_in_use).is(gauge, "seg_in_use", "segments in use")),
-              of_region(ROW(rescales).is(counter, "rescales", "so far")),
-              of_region(ROW(allocs).is(counter, "allocs", "so far")),
-              of_region(ROW(frees).is(counter, "frees", "so far")));
+  return join(
+      of_region(ROW(name).is(field_kind::name, "name", "name of the region")),
+      ROW(region_uuid).is(identifier, "region", "UUID of the region in all its arenas"),
+      ROW(type).is(enumeration, "type", "type of the region").of(region_types),
+      of_region(ROW(mode).is(flags, "mode", "mode of the region").of(region_mode_names)),
+      of_region(ROW(seg_size_req).is(gauge, "seg_size_req", "bytes of a segment, asked for").in("bytes")),
+      of_region(ROW(seg_size).is(gauge, "seg_size", "bytes of a segment, given").in("bytes")), segments,
+      of_region(ROW(obj_size_req).is(gauge, "obj_size_req", "bytes of an object, asked for").in("bytes")),
+      of_region(ROW(obj_count_req).is(gauge, "obj_count_req", "objects, asked for")),
+      of_region(ROW(obj_size).is(gauge, "obj_size", "bytes of an object, given").in("bytes")),
+      of_region(ROW(obj_count).is(gauge, "obj_count", "objects, given")),
+      of_region(ROW(objs_per_seg).is(gauge, "objs_per_seg", "objects in a segment")),
+      ROW(mem_total).is(gauge, "mem_total", "bytes of memory").in("bytes"),
+      ROW(mem_wired).is(gauge, "mem_wired", "bytes of wired memory, 0: not wired").in("bytes"),
+      ROW(reserved_168), of_region(ROW(seg_in_use).is(gauge, "seg_in_use", "segments in use")),
+      of_region(ROW(rescales).is(counter, "rescales", "rescales so far")),
+      of_region(ROW(allocs).is(counter, "allocs", "allocations so far")),
+      of_region(ROW(frees).is(counter, "frees", "frees so far")));
 }();
 inline constexpr record_description region_description =
     describe<tv_stats_region>("tv_stats_region", "region", region_rows);
@@ -110,10 +111,11 @@ inline constexpr record_description region_description =
 inline constexpr auto arena_rows = [] {
   using record = tv_stats_arena;
   using enum field_kind;
-  return join(ROW(name).is(field_kind::name, "name", "of the arena"),
-              ROW(type).is(enumeration, "type", "see below").of(arena_types), ROW(reserved_68),
-              ROW(regions).is(nested, "regions", "empty where seg_count is 0").of(region_description),
-              ROW(pids).is(pid, "pids", "users, up to the first 0").up_to(0));
+  return join(
+      ROW(name).is(field_kind::name, "name", "name of the arena"),
+      ROW(type).is(enumeration, "type", "type of the arena").of(arena_types), ROW(reserved_68),
+      ROW(regions).is(nested, "regions", "regions, empty where seg_count is 0").of(region_description),
+      ROW(pids).is(pid, "pids", "process ids of users, up to the first 0").up_to(0));
 }();
 inline constexpr record_description arena_description =
     describe<tv_stats_arena>("tv_stats_arena", "arena", arena_rows);

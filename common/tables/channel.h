@@ -91,22 +91,22 @@ constexpr auto activity_rows(const row &whole) {
       ROW(slots).is(counter, "slots", "slots moved so far").in("slots").part_of(whole),
       ROW(bytes).is(counter, "bytes", "bytes moved so far").in("bytes").part_of(whole),
       ROW(count).is(counter, "count", "transfers or syncs so far").part_of(whole),
-      ROW(min_slots).is(gauge, "min_slots", "fewest slots in one").in("slots").part_of(whole),
-      ROW(max_slots).is(gauge, "max_slots", "most slots in one").in("slots").part_of(whole),
-      ROW(slots_per_sec).is(gauge, "slots_per_sec", "current rate").in("slots/s").part_of(whole),
-      ROW(slots_per_sec_avg).is(gauge, "slots_per_sec_avg", "average rate").in("slots/s").part_of(whole),
-      ROW(bytes_per_sec).is(gauge, "bytes_per_sec", "current rate").in("bytes/s").part_of(whole),
-      ROW(bytes_per_sec_avg).is(gauge, "bytes_per_sec_avg", "average rate").in("bytes/s").part_of(whole));
+      ROW(min_slots).is(gauge, "min_slots", "fewest slots a transfer or sync").in("slots").part_of(whole),
+      ROW(max_slots).is(gauge, "max_slots", "most slots a transfer or sync").in("slots").part_of(whole),
+      ROW(slots_per_sec).is(gauge, "slots_per_sec", "slots/s now").in("slots/s").part_of(whole),
+      ROW(slots_per_sec_avg).is(gauge, "slots_per_sec_avg", "average slots/s").in("slots/s").part_of(whole),
+      ROW(bytes_per_sec).is(gauge, "bytes_per_sec", "bytes/s now").in("bytes/s").part_of(whole),
+      ROW(bytes_per_sec_avg).is(gauge, "bytes_per_sec_avg", "average bytes/s").in("bytes/s").part_of(whole));
 }
 
 inline constexpr auto ring_rows = [] {
   using record = ring_stats;
   using enum field_kind;
-  return join(ROW(ring_id).is(identifier, "ring", "the same in every snapshot"), ROW(reserved_4),
-              activity_rows(ROW(xfer).is(nested, "xfer", "transfers")), ROW(reserved_64),
-              ROW(mem_total).is(gauge, "memory_total", "memory of the ring").in("bytes"),
-              ROW(mem_used).is(gauge, "memory_used", "memory of it in use").in("bytes"),
-              activity_rows(ROW(sync).is(nested, "sync", "syncs")), ROW(reserved_144),
+  return join(ROW(ring_id).is(identifier, "ring", "number of the ring"), ROW(reserved_4),
+              activity_rows(ROW(xfer).is(nested, "xfer", "transfers of the ring")), ROW(reserved_64),
+              ROW(mem_total).is(gauge, "memory_total", "bytes of ring memory").in("bytes"),
+              ROW(mem_used).is(gauge, "memory_used", "bytes of ring memory in use").in("bytes"),
+              activity_rows(ROW(sync).is(nested, "sync", "syncs of the ring")), ROW(reserved_144),
               ROW(err_corrupted).is(counter, "corrupted", "corrupted data so far"),
               ROW(err_len_modified).is(counter, "length_modified", "modified lengths so far"),
               ROW(err_len_too_large).is(counter, "length_too_large", "too large lengths so far"),
@@ -117,13 +117,13 @@ inline constexpr record_description ring_description = describe<ring_stats>("rin
 inline constexpr auto channel_rows = [] {
   using record = channel_entry;
   using enum field_kind;
-  return join(ROW(channel_uuid).is(identifier, "channel", "the same in every snapshot"),
-              ROW(flags).is(field_kind::flags, "flags", "see below").of(channel_flag_names),
-              ROW(pid).is(field_kind::pid, "pid", "owner"),
+  return join(ROW(channel_uuid).is(identifier, "channel", "UUID of the channel"),
+              ROW(flags).is(field_kind::flags, "flags", "flags of the channel").of(channel_flag_names),
+              ROW(pid).is(field_kind::pid, "pid", "process id of the owner"),
               ROW(fd).is(number, "fd", "the owner's descriptor"),
               ROW(port).is(number, "port", "port of the nexus"),
               ROW(n_tx_rings).is(number, "tx", "transmit rings that follow"),
-              ROW(n_rx_rings).is(number, "rx", "receive rings behind them"), ROW(reserved_40));
+              ROW(n_rx_rings).is(number, "rx", "receive rings that follow"), ROW(reserved_40));
 }();
 inline constexpr follower channel_followers[] = {
     {"tx", row_at(channel_rows, "n_tx_rings"), &ring_description},
@@ -134,7 +134,7 @@ inline constexpr record_description channel_description =
 inline constexpr auto channel_header_rows = [] {
   using record = nexus_channel_header;
   using enum field_kind;
-  return join(ROW(nexus_uuid).is(identifier, "nexus", "the nexus instance"),
+  return join(ROW(nexus_uuid).is(identifier, "nexus", "UUID of the nexus instance"),
               ROW(channel_count).is(number, "channels", "channels that follow"), ROW(reserved_20));
 }();
 inline constexpr follower channel_header_followers[] = {
@@ -150,7 +150,7 @@ inline constexpr row ring_stat_enable_rows[] = {{.field = "enabled",
                                                  .type = field_type::u8,
                                                  .kind = field_kind::number,
                                                  .name = "enabled",
-                                                 .meaning = "not 0: statistics of rings are collected"}};
+                                                 .meaning = "not 0: ring statistics are collected"}};
 inline constexpr record_description ring_stat_enable_description =
     describe<std::uint8_t>("ring_stat_enable", "ring_stat_enable", ring_stat_enable_rows);
 

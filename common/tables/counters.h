@@ -70,9 +70,9 @@ template <class Nexus>
 constexpr auto nexus_rows(const counter_name *names) {
   using record = Nexus;
   using enum field_kind;
-  return join(ROW(head.nx_uuid).is(identifier, "nexus", "the nexus"),
-              ROW(head.name).is(interface, "interface", "its interface"),
-              ROW(counters).is(counter, "counters", "by position, see below").of(names));
+  return join(ROW(head.nx_uuid).is(identifier, "nexus", "UUID of the nexus"),
+              ROW(head.name).is(interface, "interface", "name of the interface"),
+              ROW(counters).is(counter, "counters", "counters, by position").of(names));
 }
 
 inline constexpr auto net_if_rows = join(nexus_rows<tv_stats_net_if>(net_if_counter_names), [] {
@@ -89,13 +89,14 @@ inline constexpr record_description flow_switch_description =
 inline constexpr auto userstack_rows = [] {
   using record = tv_stats_userstack;
   using enum field_kind;
-  return join(ROW(nx_uuid).is(identifier, "nexus", "the nexus"),
-              ROW(if_name).is(interface, "interface", "interface"),
-              ROW(pid).is(field_kind::pid, "pid", "process, 0: all ports now closed"), ROW(reserved_36),
-              ROW(ip).is(counter, "ip", "by position").of(ip_counter_names), ROW(reserved_392),
-              ROW(ip6).is(counter, "ip6", "by position").of(ip6_counter_names),
-              ROW(tcp).is(counter, "tcp", "by position").of(tcp_counter_names), ROW(reserved_2312),
-              ROW(udp).is(counter, "udp", "by position").of(udp_counter_names));
+  return join(
+      ROW(nx_uuid).is(identifier, "nexus", "UUID of the nexus"),
+      ROW(if_name).is(interface, "interface", "name of the interface"),
+      ROW(pid).is(field_kind::pid, "pid", "process id, 0: all ports now closed"), ROW(reserved_36),
+      ROW(ip).is(counter, "ip", "counters of IP, by position").of(ip_counter_names), ROW(reserved_392),
+      ROW(ip6).is(counter, "ip6", "counters of IPv6, by position").of(ip6_counter_names),
+      ROW(tcp).is(counter, "tcp", "counters of TCP, by position").of(tcp_counter_names), ROW(reserved_2312),
+      ROW(udp).is(counter, "udp", "counters of UDP, by position").of(udp_counter_names));
 }();
 inline constexpr record_description userstack_description =
     describe<tv_stats_userstack>("tv_stats_userstack", "userstack", userstack_rows);

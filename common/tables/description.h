@@ -82,8 +82,9 @@ struct row {
   std::string_view name = {};                // what programs call it
   std::string_view meaning = "not read";     // in a few words
   std::string_view unit = {};                // of a number
-  std::string_view part = {};                // of the record that it belongs to, as `field`
-  std::string_view part_name = {};           // and as `name`
+  std::string_view part = {};                // of the record that it belongs to, as `field`,
+  std::string_view part_name = {};           // as `name`
+  std::string_view part_meaning = {};        // and as `meaning`
   std::span<const named_value> values = {};  // of an enumeration
   const bit_names *flags = nullptr;          // of flags
   const counter_name *names = nullptr;       // of the elements
@@ -142,6 +143,7 @@ struct row {
     return with(&row::offset, static_cast<std::uint16_t>(offset + whole.offset))
         .with(&row::part, whole.field)
         .with(&row::part_name, whole.name)
+        .with(&row::part_meaning, whole.meaning)
         .with(&row::of_part, whole.condition);
   }
 

@@ -152,8 +152,8 @@ constexpr auto endpoint_rows(const row &whole) {
   return join(
       ROW(bytes).is(counter, "bytes", "bytes so far").in("bytes").part_of(whole),
       ROW(packets).is(counter, "packets", "packets so far").in("packets").part_of(whole),
-      ROW(state).is(enumeration, "state", "see below").of(flow_states).part_of(whole),
-      ROW(rtt).is(gauge, "rtt_us", "round-trip time, 0: not measured").in("us").or_none(0).part_of(whole),
+      ROW(state).is(enumeration, "state", "state of the end").of(flow_states).part_of(whole),
+      ROW(rtt).is(gauge, "rtt_us", "round trip in us, 0: not measured").in("us").or_none(0).part_of(whole),
       ROW(reserved_24).part_of(whole));
 }
 
@@ -161,20 +161,21 @@ inline constexpr auto flow_rows = [] {
   using record = tv_stats_flow;
   using enum field_kind;
   constexpr row family = ROW(sf_local.family);
-  return join(ROW(sf_nx_uuid).is(identifier, "nexus", "the flow switch"),
-              ROW(sf_if_name).is(interface, "interface", "interface"),
-              ROW(sf_bucket).is(number, "bucket", "bucket of the flow, or none").or_none(no_index),
-              ROW(sf_proc_name).is(process, "process", "owner"), ROW(sf_pid).is(pid, "pid", "owner"),
-              ROW(sf_flags).is(flags, "flags", "see below").of(flow_flag_names),
-              ROW(sf_nx_port).is(number, "port", "port of the nexus, or none").or_none(no_index),
-              address_rows(ROW(sf_local).is(nested, "local", "its family holds for both"), family, true),
-              address_rows(ROW(sf_remote).is(nested, "remote", "its family is not read"), family, true),
-              ROW(sf_protocol).is(enumeration, "protocol", "6 TCP, 17 UDP").of(ip_protocols),
-              ROW(reserved_137),
-              ROW(sf_svc).is(enumeration, "service_class", "see below").of(service_classes),
-              ROW(sf_adv_idx).is(number, "advisory", "index of its advisory, or none").or_none(no_index),
-              ROW(reserved_148), endpoint_rows(ROW(sf_lstats).is(nested, "tx", "local end: sent")),
-              endpoint_rows(ROW(sf_rstats).is(nested, "rx", "remote end: received")), ROW(reserved_280));
+  return join(
+      ROW(sf_nx_uuid).is(identifier, "nexus", "UUID of the flow switch"),
+      ROW(sf_if_name).is(interface, "interface", "name of the interface"),
+      ROW(sf_bucket).is(number, "bucket", "bucket of the flow, or none").or_none(no_index),
+      ROW(sf_proc_name).is(process, "process", "name of the owner"),
+      ROW(sf_pid).is(pid, "pid", "process id of the owner"),
+      ROW(sf_flags).is(flags, "flags", "flags of the flow").of(flow_flag_names),
+      ROW(sf_nx_port).is(number, "port", "port of the nexus, or none").or_none(no_index),
+      address_rows(ROW(sf_local).is(nested, "local", "local address and port"), family, true),
+      address_rows(ROW(sf_remote).is(nested, "remote", "remote address and port"), family, true),
+      ROW(sf_protocol).is(enumeration, "protocol", "transport protocol").of(ip_protocols), ROW(reserved_137),
+      ROW(sf_svc).is(enumeration, "service_class", "service class").of(service_classes),
+      ROW(sf_adv_idx).is(number, "advisory", "index of the advisory, or none").or_none(no_index),
+      ROW(reserved_148), endpoint_rows(ROW(sf_lstats).is(nested, "tx", "local end, and what was sent")),
+      endpoint_rows(ROW(sf_rstats).is(nested, "rx", "remote end, and what was received")), ROW(reserved_280));
 }();
 inline constexpr record_description flow_description =
     describe<tv_stats_flow>("tv_stats_flow", "flow", flow_rows);
@@ -205,8 +206,8 @@ static_assert(sizeof(tv_stats_flow_adv_entry) == 20);
 inline constexpr auto advisory_entry_rows = [] {
   using record = tv_stats_flow_adv_entry;
   using enum field_kind;
-  return join(ROW(sfae_flow_uuid).is(identifier, "flow", "the flow"),
-              ROW(sfae_flags).is(flags, "flags", "see below").of(advisory_flag_names));
+  return join(ROW(sfae_flow_uuid).is(identifier, "flow", "UUID of the flow"),
+              ROW(sfae_flags).is(flags, "flags", "flags of the advisory").of(advisory_flag_names));
 }();
 inline constexpr record_description advisory_entry_description =
     describe<tv_stats_flow_adv_entry>("tv_stats_flow_adv_entry", "entry", advisory_entry_rows);
@@ -214,9 +215,9 @@ inline constexpr record_description advisory_entry_description =
 inline constexpr auto advisory_rows = [] {
   using record = tv_stats_flow_adv;
   using enum field_kind;
-  return join(ROW(sfa_nx_uuid).is(identifier, "nexus", "the flow switch"),
-              ROW(sfa_if_name).is(interface, "interface", "interface"),
-              ROW(sfa_pid).is(pid, "pid", "process"),
+  return join(ROW(sfa_nx_uuid).is(identifier, "nexus", "UUID of the flow switch"),
+              ROW(sfa_if_name).is(interface, "interface", "name of the interface"),
+              ROW(sfa_pid).is(pid, "pid", "process id"),
               ROW(sfa_entries_count).is(number, "entries", "entries that follow, up to 512"));
 }();
 inline constexpr follower advisory_followers[] = {{"entries", row_at(advisory_rows, "sfa_entries_count"),
@@ -243,10 +244,11 @@ static_assert(sizeof(tv_stats_flow_owner) == 128);
 inline constexpr auto owner_rows = [] {
   using record = tv_stats_flow_owner;
   using enum field_kind;
-  return join(ROW(sfo_nx_uuid).is(identifier, "nexus", "the flow switch"),
-              ROW(sfo_if_name).is(interface, "interface", "interface"),
-              ROW(sfo_bucket).is(number, "bucket", "bucket of the owner"),
-              ROW(sfo_proc_name).is(process, "process", "owner"), ROW(sfo_pid).is(pid, "pid", "owner"),
+  return join(ROW(sfo_nx_uuid).is(identifier, "nexus", "UUID of the flow switch"),
+              ROW(sfo_if_name).is(interface, "interface", "name of the interface"),
+              ROW(sfo_bucket).is(number, "bucket", "bucket of the owner, or none").or_none(no_index),
+              ROW(sfo_proc_name).is(process, "process", "name of the owner"),
+              ROW(sfo_pid).is(pid, "pid", "process id of the owner"),
               ROW(sfo_nx_port).is(number, "port", "port of the nexus"),
               ROW(sfo_pid_bound).is(number, "pid_bound", "not 0: bound to the process id"),
               ROW(sfo_destroyed).is(number, "destroyed", "not 0: destroyed"), ROW(reserved_84));
@@ -280,16 +282,17 @@ inline constexpr auto route_rows = [] {
   using record = tv_stats_flow_route;
   using enum field_kind;
   constexpr row family = ROW(sfr_remote.family);
-  constexpr row bits = ROW(sfr_flags).is(flags, "flags", "see below").of(route_flag_names);
+  constexpr row bits = ROW(sfr_flags).is(flags, "flags", "flags of the route").of(route_flag_names);
   return join(
-      ROW(reserved_0), ROW(sfr_if_name).is(interface, "interface", "interface"),
-      ROW(sfr_bidx).is(number, "bidx", "bucket"), ROW(sfr_ibidx).is(number, "ibidx", "second bucket"), bits,
-      ROW(sfr_refs).is(gauge, "refs", "users of the route"),
+      ROW(reserved_0), ROW(sfr_if_name).is(interface, "interface", "name of the interface"),
+      ROW(sfr_bidx).is(number, "bidx", "bucket of the route"),
+      ROW(sfr_ibidx).is(number, "ibidx", "second bucket of the route"), bits,
+      ROW(sfr_refs).is(gauge, "refs", "reference count"),
       ROW(sfr_expire).is(gauge, "expire", "expiry, as the kernel keeps it"),
-      address_rows(ROW(sfr_local).is(nested, "local", "its port is not read"), family, false),
-      address_rows(ROW(sfr_remote).is(nested, "remote", "its family holds for all three"), family, false),
+      address_rows(ROW(sfr_local).is(nested, "local", "local address"), family, false),
+      address_rows(ROW(sfr_remote).is(nested, "remote", "remote address"), family, false),
       address_rows(ROW(sfr_gateway)
-                       .is(nested, "gateway", "where flag 0x20 is set")
+                       .is(nested, "gateway", "gateway, where flag 0x20 is set")
                        .where_bit(bits, record::has_gateway),
                    family, false),
       ROW(reserved_156),

@@ -64,7 +64,7 @@ inline constexpr row uuid_rows[] = {{.field = "uuid",
                                      .type = field_type::uuid,
                                      .kind = field_kind::identifier,
                                      .name = "nexus",
-                                     .meaning = "a nexus instance"}};
+                                     .meaning = "UUID of a nexus instance"}};
 inline constexpr record_description instance_description = describe<uuid>("uuid", "instance", uuid_rows);
 
 inline constexpr auto provider_rows = [] {
@@ -72,19 +72,20 @@ inline constexpr auto provider_rows = [] {
   using enum field_kind;
   constexpr row length = ROW(parameters.name_length).is(number, "name_length", "bytes of the name, up to 64");
   return join(
-      ROW(provider_uuid).is(identifier, "provider", "the provider"), ROW(reserved_16),
-      ROW(parameters.name).is(name, "name", "cut to name_length").cut_to(length), length,
+      ROW(provider_uuid).is(identifier, "provider", "UUID of the provider"), ROW(reserved_16),
+      ROW(parameters.name).is(name, "name", "name of the provider").cut_to(length), length,
       ROW(parameters.type).is(enumeration, "type", "kind of nexus").of(nexus_types),
       ROW(parameters.reserved_72),
-      ROW(parameters.flags).is(flags, "flags", "see below").of(provider_flag_names),
-      ROW(parameters.format).is(number, "format", "as the kernel keeps it"),
+      ROW(parameters.flags).is(flags, "anonymous", "flags of the provider").of(provider_flag_names),
+      ROW(parameters.format).is(number, "format", "format, as the kernel keeps it"),
       ROW(parameters.tx_rings).is(number, "tx_rings", "transmit rings of an instance"),
       ROW(parameters.rx_rings).is(number, "rx_rings", "receive rings of an instance"),
       ROW(parameters.tx_slots).is(number, "tx_slots", "slots of a transmit ring"),
       ROW(parameters.rx_slots).is(number, "rx_slots", "slots of a receive ring"),
-      ROW(parameters.buf_size).is(number, "buf_size", "of a buffer").in("bytes"),
-      ROW(parameters.meta_size).is(number, "meta_size", "of a buffer's metadata").in("bytes"),
-      ROW(parameters.reserved_112), ROW(parameters.pipes).is(number, "pipes", "as the kernel keeps it"),
+      ROW(parameters.buf_size).is(number, "buf_size", "bytes of a buffer").in("bytes"),
+      ROW(parameters.meta_size).is(number, "meta_size", "bytes of a buffer's metadata").in("bytes"),
+      ROW(parameters.reserved_112),
+      ROW(parameters.pipes).is(number, "pipes", "pipes, as the kernel keeps them"),
       ROW(parameters.subtype).is(enumeration, "subtype", "kind of flow switch").of(flow_switch_subtypes),
       ROW(parameters.mhints).is(number, "mhints", "memory hints"),
       ROW(parameters.ifindex).is(number, "ifindex", "index of the interface"), ROW(parameters.reserved_132),

@@ -51,24 +51,24 @@ constexpr auto address_rows(const row &whole, const row &family, bool has_port) 
   using enum field_kind;
   const row of_family = ROW(family).part_of(whole);
   const row of_port = ROW(port).as(field_type::net16).part_of(whole);
-  return join(ROW(length).part_of(whole),
-              of_family.offset == family.offset
-                  ? of_family.is(enumeration, "family", "2: IPv4, 30: IPv6").of(address_families)
-                  : of_family,
-              has_port ? of_port.is(number, "port", "network byte order")
-                             .where(family, address_family::ipv4, address_family::ipv6)
-                       : of_port,
-              ROW(ipv4)
-                  .as(field_type::bytes)
-                  .is(address, "address", "of an IPv6 address not read")
-                  .where(family, address_family::ipv4)
-                  .part_of(whole),
-              ROW(ipv6)
-                  .as(field_type::bytes)
-                  .is(address, "address", "of an IPv4 address not read")
-                  .where(family, address_family::ipv6)
-                  .part_of(whole),
-              ROW(scope_id).part_of(whole));
+  return join(
+      ROW(length).part_of(whole),
+      of_family.offset == family.offset
+          ? of_family.is(enumeration, "family", "address family").of(address_families)
+          : of_family,
+      has_port ? of_port.is(number, "port", "port").where(family, address_family::ipv4, address_family::ipv6)
+               : of_port,
+      ROW(ipv4)
+          .as(field_type::bytes)
+          .is(address, "address", "address, if it is IPv4")
+          .where(family, address_family::ipv4)
+          .part_of(whole),
+      ROW(ipv6)
+          .as(field_type::bytes)
+          .is(address, "address", "address, if it is IPv6")
+          .where(family, address_family::ipv6)
+          .part_of(whole),
+      ROW(scope_id).part_of(whole));
 }
 
 #endif

@@ -44,16 +44,17 @@ std::string names_of(const row &field) {
 }
 
 std::string described(const row &field) {
-  return list('{',
-              {"\"field\": " + quoted(field.field), "\"part\": " + quoted(field.part),
-               "\"offset\": " + std::to_string(field.offset), "\"size\": " + std::to_string(field.size),
-               "\"count\": " + std::to_string(field.count),
-               "\"type\": " + quoted(types[static_cast<int>(field.type)]),
-               "\"kind\": " + quoted(kinds[static_cast<int>(field.kind)]), "\"name\": " + quoted(field.name),
-               "\"meaning\": " + quoted(field.meaning), "\"unit\": " + quoted(field.unit),
-               "\"nested\": " + quoted(field.nested ? field.nested->name : ""),
-               "\"values\": " + values_of(field), "\"names\": " + names_of(field)},
-              '}');
+  return list(
+      '{',
+      {"\"field\": " + quoted(field.field), "\"part\": " + quoted(field.part),
+       "\"offset\": " + std::to_string(field.offset), "\"size\": " + std::to_string(field.size),
+       "\"count\": " + std::to_string(field.count),
+       "\"type\": " + quoted(types[static_cast<int>(field.type)]),
+       "\"kind\": " + quoted(kinds[static_cast<int>(field.kind)]), "\"name\": " + quoted(field.name),
+       "\"meaning\": " + quoted(field.meaning), "\"part_meaning\": " + quoted(field.part_meaning),
+       "\"unit\": " + quoted(field.unit), "\"nested\": " + quoted(field.nested ? field.nested->name : ""),
+       "\"values\": " + values_of(field), "\"names\": " + names_of(field)},
+      '}');
 }
 
 void describe(const record_description &what, std::map<std::string, std::string> &records) {
@@ -66,7 +67,6 @@ void describe(const record_description &what, std::map<std::string, std::string>
     followers.push_back(
         list('{',
              {"\"name\": " + quoted(each.name), "\"at\": " + std::to_string(each.count.offset),
-              "\"type\": " + quoted(types[static_cast<int>(each.count.type)]),
               "\"record\": " + quoted(each.each->name)},
              '}'));
     describe(*each.each, records);

@@ -1,16 +1,18 @@
-"""Reads the tables of a kernel directory by the offsets of their formats, and runs the lab."""
+"""Reads the tables of a kernel directory and runs the lab."""
 import os
 import pathlib
 import resource
 import shutil
-import struct
 import subprocess
 import sys
 import tempfile
 import time
 import unittest
 
+import records
+
 lab = sys.argv.pop(1)  # the program to test
+records.load(lab)
 node_dir = "proc/sys/kern/tarvel/"
 none = 0xFFFFFFFF  # in place of an index
 
@@ -25,18 +27,6 @@ def limit_files(size):
     resource.setrlimit(resource.RLIMIT_FSIZE, (size, resource.RLIM_INFINITY))
 
 
-def u32(record, at):
-    return struct.unpack_from("<I", record, at)[0]
-
-
-def u64(record, at):
-    return struct.unpack_from("<Q", record, at)[0]
-
-
-def text(record, at, width):
-    return record[at:at + width].split(b"\0")[0].decode()
-
-
 def files(root):
     return {str(p.relative_to(root)): p.read_bytes() for p in sorted(pathlib.Path(root).rglob("*")) if p.is_file()}
 
@@ -48,47 +38,14 @@ class Kernel:
     def table(self, name):
         return (self.root / node_dir / name).read_bytes()
 
-    def records(self, name, size):
-        table = self.table(name)
-        assert len(table) % size == 0, f"{name}: {len(table)} bytes"
-        return [table[i:i + size] for i in range(0, len(table), size)]
-
-    def chains(self, name, head_size, count_at, item_size):
-        """Records with so many items behind each, as (head, items)."""
-        table, at = self.table(name), 0
-        while at < len(table):
-            head, at = table[at:at + head_size], at + head_size
-            end = at + item_size * (head[count_at] if name == "stats/netns" else u32(head, count_at))
-            yield head, [table[i:i + item_size] for i in range(at, end, item_size)]
-            at = end
-        assert at == len(table)
-
-    def providers(self):
-        return list(self.chains("nexus_provider_list", 264, 256, 16))
+    def records(self, name):
+        return records.walk(name, self.table(name))
 
     def channels(self):
-        """(nexus, entry, rings) of each channel; a nexus without any is (nexus, None, [])."""
-        table, at = self.table("nexus_channel_list"), 0
-        while at < len(table):
-            nexus, count, at = table[at:at + 16], u32(table, at + 16), at + 24
-            if not count:
-                yield nexus, None, []
-            for _ in range(count):
-                entry, at = table[at:at + 48], at + 48
-                end = at + 184 * (u32(entry, 32) + u32(entry, 36))
-                yield nexus, entry, [table[i:i + 184] for i in range(at, end, 184)]
-                at = end
-        assert at == len(table)
-
-    def flows(self):
-        return self.records("stats/flow", 320)
+        return [channel for group in self.records("nexus_channel_list") for channel in group["channels"]]
 
     def pids(self):
-        yield from (u32(entry, 20) for _, entry, _ in self.channels() if entry)
-        for name, size, at, count in (("flow", 320, 68, 1), ("flow_owner", 128, 68, 1), ("userstack", 2496, 32, 1),
-                                      ("arena", 2608, 2576, 8)):
-            for record in self.records("stats/" + name, size):
-                yield from struct.unpack_from(f"<{count}I", record, at)
+        return {record.value(row, at) for name in records.TABLES for record in self.records(name) for row, at in record.find("kind", "pid")}
 
 
 class LabTest(unittest.TestCase):

@@ -5,38 +5,13 @@ import collections
 import os
 import pathlib
 import random
-import struct
 import subprocess
 import sys
 import tempfile
 
+import records
+
 Result = collections.namedtuple("Result", "out err status")
-
-# A table's record: the size of its head, where the head counts what follows it and how, and the size of that.
-RECORDS = {"nexus_provider_list": (264, 256, "<I", 16), "stats/flow_adv": (40, 36, "<I", 20), "stats/netns": (32, 18, "<B", 32),
-           "stats/flow": (320,), "stats/flow_owner": (128,), "stats/flow_route": (256,), "stats/userstack": (2496,),
-           "stats/net_if": (320,), "stats/flow_switch": (448,), "stats/arena": (2608,), "nexus_channel_list": None}
-
-
-def walk(name, table):
-    """Where the records end. A channel ends with its rings; one record of groups is a channel, or a group without any."""
-    ends, at, groups = [0], 0, []
-    while at < len(table):
-        if name == "nexus_channel_list":
-            groups.append((at, struct.unpack_from("<I", table, at + 16)[0]))
-            at += 24
-            for _ in range(groups[-1][1]):
-                at += 48 + 184 * sum(struct.unpack_from("<II", table, at + 32))
-                ends.append(at)
-            if groups[-1][1]:
-                continue
-        else:
-            head, *counted = RECORDS[name]
-            at += head + (struct.unpack_from(counted[1], table, at + counted[0])[0] * counted[2] if counted else 0)
-        ends.append(at)
-    assert at == len(table), name
-    return ends, groups
-
 
 class Kernel:
     """A kernel made of files."""
@@ -66,6 +41,7 @@ class Torture:
         for option, default in extra.items():
             parser.add_argument("--" + option, type=type(default), default=default)
         self.name, self.options = name, parser.parse_args()
+        records.load(self.options.tarvellab)
         self.long, self.random = self.options.long, random.Random(self.options.seed)
         self.runs = self.faults = self.findings = 0
         self.children = []
