@@ -9,8 +9,12 @@ import subprocess
 import sys
 import unittest
 
+sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
+from records import RECORDS, TABLES, load  # noqa: E402
+
 sources, generate_completions, tarvellab = pathlib.Path(sys.argv[1]), *sys.argv[2:4]
 del sys.argv[1:4]
+load(tarvellab)
 
 
 def sections(page, macro):
@@ -57,53 +61,49 @@ class Commands(unittest.TestCase):
 
 class Tables(unittest.TestCase):
     text = (sources / "docs/tarvel-tables.5").read_text()
-    headers = "".join(path.read_text() for path in sorted((sources / "common").rglob("*.h")))
 
     def rows(self, text):
-        return [[cell.replace("\\&", "") for cell in line.split(" Ta ")] for line in re.findall(r"^\.It (\d.*)", text, flags=re.M)]
+        return [[cell.replace("\\&", "").replace("\\-", "-") for cell in line.split(" Ta ")] for line in re.findall(r"^\.It (\d.*)", text, flags=re.M)]
 
     def records(self):
-        """(size, rows) of each record on the page; a row has offset, size, type, field and meaning."""
-        found = re.findall(r"^\.Vt (\w+) ,\n(\d+) bytes:\n(\.Bl -column.*?)\.El", self.text, flags=re.M | re.S)
-        return {name: (int(size), self.rows(rows)) for name, size, rows in found}
+        """The size and the rows of each record on the page. A row has offset, size, type, field, meaning, and the names of values or counters."""
+        found = re.findall(r"^\.Vt (\w+) ,\n(\d+) bytes:\n(.*?)\.El(.*?)(?=^\.Vt \w+ ,$|^\.S[hs] )", self.text, flags=re.M | re.S)
+        for record, size, rows, more in found:
+            names = {field: {int(number, 0): name for number, name in re.findall(r"\b(0x[\da-f]+|\d+)\s([\w-]+)", values)}
+                     for field, values in re.findall(r"^\.It Va (\w+)\n((?:[^.].*\n)+)", more, flags=re.M)}
+            for block, lines in re.findall(r"^\.Va (\w+) :\n(.*?)\.El", more, flags=re.M | re.S):
+                names[block] = {int(at) + i: name for at, *line in self.rows(lines) for i, name in enumerate(line) if name}
+            yield record, (int(size), [[int(at), int(width), *row, names.get(row[1], {})] for at, width, *row in self.rows(rows)])
 
-    def test_RecordsHaveTheirSizesWithoutGaps(self):
-        sizes = {name: sum(int(factor) * int(other or 1) for factor, other in re.findall(r"(\d+)(?: \* (\d+))?", value))
-                 for name, value in re.findall(r"static_assert\(sizeof\((\w+)\) == ([^)]*)\)", self.headers)}
-        records = self.records()
-        self.assertEqual(sizes.keys() - records.keys(), {"nexus_provider_parameters"})  # shown in its record
-        for name, (size, rows) in records.items():
-            with self.subTest(record=name):
-                self.assertEqual(size, sizes.get(name, size))
-                ends = [int(at) + int(width) for at, width, *_ in rows]
-                self.assertEqual([int(row[0]) for row in rows], [0, *ends[:-1]])
-                self.assertEqual(ends[-1], size)
-
-    def test_FieldsHaveTheirOffsets(self):
-        records = self.records()
-        asserted = re.findall(r"static_assert\(offsetof\((\w+), ([\w.]+)\) == (\d+)\)", self.headers)
-        self.assertGreater(len(asserted), 100)
-        parts = {f"{record} {field.split('.')[0]}" for record, field, _ in asserted if "." in field}
-        for record, field, offset in asserted:
-            if f"{record} {field}" not in parts:  # its fields stand on the page in its place
-                with self.subTest(record=record, field=field):
-                    self.assertEqual([row[0] for row in records[record][1] if row[3] == field.split(".")[-1]], [offset])
+    def test_RecordsAreWhatTheProgramReads(self):
+        page = dict(self.records())
+        parts = {size: rows for record, (size, rows) in page.items() if record not in RECORDS}
+        unread = re.findall(r"^\.Va (\w+\.\w+)", self.text, flags=re.M)
+        self.assertEqual(RECORDS.keys() - page.keys(), {"uuid", "ring_stat_enable"})  # shown by words alone
+        for record in RECORDS.keys() & page.keys():
+            shown, known = [], []
+            for at, width, kind, field, meaning, names in page[record][1]:
+                for part_at, *row in parts[width] if kind == "record" else ():
+                    row[2] = "-" if row[2] == "-" else f"{field}.{row[2]}"
+                    row[3:] = ["not read", {}] if row[2] in unread else row[3:]
+                    shown.append([at + part_at, *row, meaning])
+                if kind != "record":
+                    shown.append([at, width, kind, field, meaning, names, ""])
+            for field, row in RECORDS[record]["fields"].items():
+                kind = row["type"] + (f"[{row['count']}]" if row["count"] > 1 else "")
+                names = dict(enumerate(row["names"])) or {int(number): name for number, name in row["values"].items()}
+                known.append([row["offset"], row["size"] * row["count"], *(("bytes", "-") if "reserved" in field else (kind, field)),
+                              row["meaning"], names, row["part_meaning"]])
+            with self.subTest(record=record):
+                self.assertEqual((page[record][0], shown), (RECORDS[record]["size"], known))
 
     def test_EveryTableHasItsSection(self):
-        nodes = re.findall(r'_node\[\] = "kern\.tarvel\.([\w.]+)"', self.headers)
-        self.assertEqual(set(sections("tarvel-tables.5", "Ss")), {node.replace(".", "/") for node in nodes})
+        self.assertEqual(sections("tarvel-tables.5", "Ss").keys(), TABLES.keys())
 
-    def test_CountersHaveTheirPositions(self):
-        names = (sources / "common/tables/counters.cpp").read_text()
-        for block in "net_if", "flow_switch", "ip", "ip6", "tcp", "udp":
-            body = re.search(rf" {block}_counter_names\[\] = {{(.*?)}};", names, flags=re.S)[1]
-            place = rf"\.Ss stats/{block}\n" if block in ("net_if", "flow_switch") else rf"\.Va {block} :\n"
-            lists = re.search(place + r'.*?(\.Bl -column "200".*?)\.El', self.text, flags=re.S)[1]
-            shown = {}
-            for at, *row in self.rows(lists):
-                shown.update((int(at) + i, name) for i, name in enumerate(row) if name)
-            with self.subTest(block=block):
-                self.assertEqual(shown, dict(enumerate(re.findall(r'"([^"]+)"', body))))
+    def test_FlagsOfFlowsAndRoutesHaveTheirLetters(self):
+        for command, record, field in ("flow", "tv_stats_flow", "sf_flags"), ("flow-route", "tv_stats_flow_route", "sfr_flags"):
+            letters = re.findall(r"\b([a-z]) (0x\d+)", sections("tarvelctl.1", "Ss")[command])
+            self.assertEqual({str(int(bit, 0)): letter for letter, bit in letters}, RECORDS[record]["fields"][field]["values"])
 
 
 if __name__ == "__main__":
