@@ -69,8 +69,7 @@ double occupancy(const tv_stats_region &region) {
 }
 
 void print_region(const tv_stats_region &region) {
-  print<"%15s  %s\n">(format::text_of<"%.12s region:", 64>(region_types.of(region.type)),
-                      region.name);
+  print<"%15s  %s\n">(format::text_of<"%.12s region:", 64>(region_types.of(region.type)), region.name);
   print<"        allocs:  %llu\n">(region.allocs);
   print<"         frees:  %llu\n">(region.frees);
   print<"      rescales:  %llu\n">(region.rescales);
