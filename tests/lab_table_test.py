@@ -86,8 +86,8 @@ class Generate(LabTest):
         regions, shared = {}, 0
         for region in (region for arena in self.generate().records("stats/arena") for region in arena["regions"]):
             if region["seg_count"]:
-                shared += region["region_uuid"] in regions
-                self.assertEqual(regions.setdefault(region["region_uuid"], region.bytes), region.bytes)
+                held, shared = region.table[region.at:region.end], shared + (region["region_uuid"] in regions)
+                self.assertEqual(regions.setdefault(region["region_uuid"], held), held)
                 self.assertLessEqual(region["seg_in_use"], region["seg_count"])
                 self.assertEqual(region["mem_total"], region["seg_count"] * region["seg_size"])
                 self.assertLessEqual(region["obj_count_req"], region["obj_count"])

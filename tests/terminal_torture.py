@@ -17,7 +17,7 @@ import tty
 import unicodedata
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import TABLES, walk  # noqa: E402
+from records import TABLES  # noqa: E402
 from torture import Torture  # noqa: E402
 
 # With how many texts on a kernel of one provider, three channels and two flows, at least.
@@ -106,7 +106,7 @@ def main():
     torture = Torture("terminal", __doc__)
     kernel = torture.make_kernel("--providers", 2, "--channels", 6, "--flows", 2, "--arenas", 1, "--processes", 2)
     kernel.environment.update(torture.name_services())
-    tables = {name: walk(name, kernel.table(name)) for name in TABLES}
+    tables = {name: kernel.records(name) for name in TABLES}
     sinks = {on_terminal: hidden, on_utf8_terminal: functools.partial(hidden, charset="utf-8"), on_pipe: bytes,
              **({in_file: bytes} if torture.long else {})}
     harmless = {}

@@ -12,7 +12,7 @@ import struct
 import sys
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import walk  # noqa: E402
+from records import TABLES, walk  # noqa: E402
 from torture import Result, Torture  # noqa: E402
 
 def broken(function, line, expression="scan == (buffer + length)", file="tarvelctl/tarvelctl"):
@@ -84,8 +84,8 @@ def whole_part(records, table, cut):
 
 def orphans(kernel):
     """What the tree says of flows whose nexus no provider has."""
-    known = {instance["uuid"] for provider in walk("nexus_provider_list", kernel.table("nexus_provider_list")) for instance in provider["instances"]}
-    return b"orphan flow orphan nx_uuid" * sum(flow["sf_nx_uuid"] not in known for flow in walk("stats/flow", kernel.table("stats/flow")))
+    known = {instance["uuid"] for provider in kernel.records("nexus_provider_list") for instance in provider["instances"]}
+    return b"orphan flow orphan nx_uuid" * sum(flow["sf_nx_uuid"] not in known for flow in kernel.records("stats/flow"))
 
 
 def rows(report):
@@ -97,7 +97,7 @@ def rows(report):
 def check_whole(torture, kernel, case, table, seen, uncut):
     """Whether the report of whole records has one block for each, and no rows but those of the uncut report."""
     command, name, _, _, start = case
-    records, uncut_rows = len(ends_of(walk(name, table))) - 1, iter(uncut)
+    records, uncut_rows = len(ends_of(walk(TABLES[name], table))) - 1, iter(uncut)
     said = orphans(kernel) if command in ("tree", "show", "channel-stats") else b""
     strange = [] if "--global" in command else [row for row in rows(seen.out) if row not in uncut_rows]
     blocks = len(re.findall(f"^{start}".encode(), seen.out, re.MULTILINE)) if start else records
@@ -126,8 +126,7 @@ def cuts(torture, ends):
 
 def torture_case(torture, kernel, case):
     command, name, (message, status), shown, start = case
-    table = kernel.table(name)
-    records = walk(name, table)
+    table, records = kernel.table(name), kernel.records(name)
     report = torture.run(kernel, command).out
     uncut, none = rows(report), of_none(command, start, report)
 

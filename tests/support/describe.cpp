@@ -15,46 +15,49 @@ constexpr const char *kinds[] = {"unread", "identifier",  "number", "gauge",   "
                                  "flags",  "enumeration", "pid",    "process", "interface",
                                  "name",   "address",     "mac",    "nested"};
 
-std::string quoted(std::string_view text) {
+std::string said(std::string_view text) {
   return '"' + std::string(text) + '"';
 }
-
-std::string list(char open, const std::vector<std::string> &items, char close) {
-  std::string text(1, open);
-  for (const std::string &item : items) text += (text.size() > 1 ? ", " : "") + item;
-  return text + close;
+std::string said(std::size_t number) {
+  return std::to_string(number);
 }
 
-std::string values_of(const row &field) {
-  std::vector<std::string> found;
-  for (const named_value &each : field.values) {
-    found.push_back(quoted(std::to_string(each.number)) + ": " + quoted(each.name.view()));
-  }
-  for (std::size_t i = 0; field.flags && i < field.flags->count; ++i) {
-    const auto &each = field.flags->entries[i];
-    found.push_back(quoted(std::to_string(each.bit)) + ": " + quoted(each.name.view()));
-  }
-  return list('{', found, '}');
+std::string list(const std::vector<std::string> &items) {
+  std::string text;
+  for (const std::string &item : items) text += (text.empty() ? "" : ", ") + item;
+  return '[' + text + ']';
 }
 
-std::string names_of(const row &field) {
-  std::vector<std::string> found;
-  for (std::size_t i = 0; field.names && i < field.count; ++i) found.push_back(quoted(field.names[i].name()));
-  return list('[', found, ']');
+std::string object(const std::vector<std::pair<std::string, std::string>> &members) {
+  std::string text;
+  for (const auto &[key, value] : members) text += (text.empty() ? "" : ", ") + said(key) + ": " + value;
+  return '{' + text + '}';
 }
 
 std::string described(const row &field) {
-  return list(
-      '{',
-      {"\"field\": " + quoted(field.field), "\"part\": " + quoted(field.part),
-       "\"offset\": " + std::to_string(field.offset), "\"size\": " + std::to_string(field.size),
-       "\"count\": " + std::to_string(field.count),
-       "\"type\": " + quoted(types[static_cast<int>(field.type)]),
-       "\"kind\": " + quoted(kinds[static_cast<int>(field.kind)]), "\"name\": " + quoted(field.name),
-       "\"meaning\": " + quoted(field.meaning), "\"part_meaning\": " + quoted(field.part_meaning),
-       "\"unit\": " + quoted(field.unit), "\"nested\": " + quoted(field.nested ? field.nested->name : ""),
-       "\"values\": " + values_of(field), "\"names\": " + names_of(field)},
-      '}');
+  std::vector<std::pair<std::string, std::string>> values;
+  for (const auto &[number, name] : field.values)
+    values.emplace_back(std::to_string(number), said(name.view()));
+  for (std::size_t i = 0; field.flags && i < field.flags->count; ++i) {
+    const auto &[bit, name] = field.flags->entries[i];
+    values.emplace_back(std::to_string(bit), said(name.view()));
+  }
+  std::vector<std::string> names;
+  for (std::size_t i = 0; field.names && i < field.count; ++i) names.push_back(said(field.names[i].name()));
+  return object({{"field", said(field.field)},
+                 {"part", said(field.part)},
+                 {"offset", said(field.offset)},
+                 {"size", said(field.size)},
+                 {"count", said(field.count)},
+                 {"type", said(types[static_cast<int>(field.type)])},
+                 {"kind", said(kinds[static_cast<int>(field.kind)])},
+                 {"name", said(field.name)},
+                 {"meaning", said(field.meaning)},
+                 {"part_meaning", said(field.part_meaning)},
+                 {"unit", said(field.unit)},
+                 {"nested", said(field.nested ? field.nested->name : "")},
+                 {"values", object(values)},
+                 {"names", list(names)}});
 }
 
 void describe(const record_description &what, std::map<std::string, std::string> &records) {
@@ -64,30 +67,23 @@ void describe(const record_description &what, std::map<std::string, std::string>
     if (field.nested) describe(*field.nested, records);
   }
   for (const follower &each : what.followers) {
-    followers.push_back(
-        list('{',
-             {"\"name\": " + quoted(each.name), "\"at\": " + std::to_string(each.count.offset),
-              "\"record\": " + quoted(each.each->name)},
-             '}'));
+    followers.push_back(object(
+        {{"name", said(each.name)}, {"at", said(each.count.offset)}, {"record", said(each.each->name)}}));
     describe(*each.each, records);
   }
   records[std::string(what.name)] =
-      list('{',
-           {"\"size\": " + std::to_string(what.size), "\"rows\": " + list('[', rows, ']'),
-            "\"followers\": " + list('[', followers, ']')},
-           '}');
+      object({{"size", said(what.size)}, {"rows", list(rows)}, {"followers", list(followers)}});
 }
 
 }  // namespace
 
 int main() {
   std::map<std::string, std::string> records;
-  std::vector<std::string> tables, all;
+  std::vector<std::pair<std::string, std::string>> tables;
   for (const table_description &table : all_tables) {
-    tables.push_back(quoted(table.node) + ": " + quoted(table.record->name));
+    tables.emplace_back(table.node, said(table.record->name));
     describe(*table.record, records);
   }
-  for (const auto &[name, text] : records) all.push_back(quoted(name) + ": " + text);
-  std::printf("{\"tables\": %s,\n\"records\": %s}\n", list('{', tables, '}').c_str(),
-              list('{', all, '}').c_str());
+  std::printf("{\"tables\": %s,\n\"records\": %s}\n", object(tables).c_str(),
+              object({records.begin(), records.end()}).c_str());
 }

@@ -1,4 +1,4 @@
-"""Reads the tables of a kernel directory and runs the lab."""
+"""What tests of the lab share: running it, and the kernels that it makes."""
 import os
 import pathlib
 import resource
@@ -9,10 +9,10 @@ import tempfile
 import time
 import unittest
 
-import records
+from records import Kernel, load
 
 lab = sys.argv.pop(1)  # the program to test
-records.load(lab)
+load(lab)
 node_dir = "proc/sys/kern/tarvel/"
 none = 0xFFFFFFFF  # in place of an index
 
@@ -29,23 +29,6 @@ def limit_files(size):
 
 def files(root):
     return {str(p.relative_to(root)): p.read_bytes() for p in sorted(pathlib.Path(root).rglob("*")) if p.is_file()}
-
-
-class Kernel:
-    def __init__(self, root):
-        self.root = pathlib.Path(root)
-
-    def table(self, name):
-        return (self.root / node_dir / name).read_bytes()
-
-    def records(self, name):
-        return records.walk(name, self.table(name))
-
-    def channels(self):
-        return [channel for group in self.records("nexus_channel_list") for channel in group["channels"]]
-
-    def pids(self):
-        return {record.value(row, at) for name in records.TABLES for record in self.records(name) for row, at in record.find("kind", "pid")}
 
 
 class LabTest(unittest.TestCase):

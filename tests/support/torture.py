@@ -3,32 +3,14 @@ import argparse
 import atexit
 import collections
 import os
-import pathlib
 import random
 import subprocess
 import sys
 import tempfile
 
-import records
+from records import Kernel, load
 
 Result = collections.namedtuple("Result", "out err status")
-
-class Kernel:
-    """A kernel made of files."""
-
-    def __init__(self, root):
-        self.root = pathlib.Path(root)
-        self.environment = {**os.environ, "TARVEL_ROOT": str(root)}
-
-    def path(self, table):
-        return self.root / "proc/sys/kern/tarvel" / table
-
-    def table(self, name):
-        return self.path(name).read_bytes()
-
-    def put(self, name, contents):
-        self.path(name).write_bytes(contents)
-
 
 class Torture:
     def __init__(self, name, description, **extra):
@@ -41,7 +23,7 @@ class Torture:
         for option, default in extra.items():
             parser.add_argument("--" + option, type=type(default), default=default)
         self.name, self.options = name, parser.parse_args()
-        records.load(self.options.tarvellab)
+        load(self.options.tarvellab)
         self.long, self.random = self.options.long, random.Random(self.options.seed)
         self.runs = self.faults = self.findings = 0
         self.children = []
