@@ -35,7 +35,7 @@ OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
 # Where a fault says nothing of a decoder or a bound, or cannot be seen: a buffer larger than it needs to be, the ways up a
 # tree that only save time.
 LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|template|using|char \w+\[)|prefetch|reserve\(|static_assert|print<|complain<|\"|"
-                      r"netstat_options\.\S+ = 1|report\.flush|forget_scopes|jump")
+                      r"netstat_options\.\S+ = 1|report\.flush|jump")
 TESTS = ["unit_tests", "blocking_output_tests", "kernel_table_tests", "flow_naming_tests", "program_tests"]
 SHARDS = 4
 # What is asked where those notice nothing, because it takes longer.
