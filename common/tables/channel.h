@@ -77,7 +77,7 @@ struct channel_entry {
   std::uint8_t reserved_40[8];
 
   // Bytes of the ring blocks behind the fixed part.
-  std::uint64_t trailing_size() const {
+  constexpr std::uint64_t trailing_size() const {
     return (std::uint64_t{n_tx_rings} + std::uint64_t{n_rx_rings}) * sizeof(ring_stats);
   }
 };

@@ -9,6 +9,7 @@
 #define TARVELCTL_COMMON_TABLES_DESCRIPTION_H
 
 #include <array>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -159,6 +160,8 @@ struct follower {
   std::int64_t most = INT64_MAX;  // where there are more, none of them says anything
 };
 
+inline constexpr std::size_t most_followers = 2;  // kinds of them behind a record
+
 struct record_description {
   std::string_view name;  // of the struct
   std::string_view noun;  // what programs call one
@@ -167,9 +170,15 @@ struct record_description {
   std::span<const follower> followers;  // in their order
 };
 
-// How a member of this type lies in its record, and that of an array's elements.
+// How a member of this type lies in its record, and that of an array's elements. What is no struct and none
+// of those below does not compile.
 template <class Member>
-inline constexpr field_type type_of = field_type::record;
+consteval field_type type_of_part() {
+  static_assert(std::is_class_v<Member>);
+  return field_type::record;
+}
+template <class Member>
+inline constexpr field_type type_of = type_of_part<Member>();
 template <>
 inline constexpr field_type type_of<std::uint8_t> = field_type::u8;
 template <>
@@ -239,18 +248,47 @@ constexpr auto join(const Parts &...parts) {
   return all;
 }
 
-// Never defined: a call to it stops the compiler where a byte of a record has no row, or two.
-void rows_do_not_tile();
+// Never defined: a call to it stops the compiler, with the reason in the call.
+void bad_description(const char *reason);
+
+// Whether the struct's own trailing_size(), where it has one, counts what its followers say.
+template <class Record>
+consteval bool agrees_with(std::span<const follower> followers) {
+  if constexpr (requires(const Record &record) { record.trailing_size(); }) {
+    for (const follower &each : followers) {
+      std::array<std::byte, sizeof(Record)> bytes{};
+      bytes[each.count.offset] = std::byte{3};
+      if (std::bit_cast<Record>(bytes).trailing_size() != 3 * each.each->size) return false;
+    }
+  }
+  return true;
+}
 
 template <class Record>
 consteval record_description describe(std::string_view name, std::string_view noun, std::span<const row> rows,
                                       std::span<const follower> followers = {}) {
   std::size_t end = 0;
   for (const row &each : rows) {
-    if (each.offset != end) rows_do_not_tile();
+    if (each.offset != end) bad_description("rows do not tile the record");
     end += std::size_t{each.size} * each.count;
+    const bool says_so = each.field.starts_with("reserved") || !each.part.empty();
+    if (each.kind == field_kind::unread && !says_so) bad_description("nothing is said of a field");
+    if (each.type == field_type::text && each.length && each.length->type != field_type::u32) {
+      bad_description("the length of a text is no u32");
+    }
   }
-  if (end != sizeof(Record)) rows_do_not_tile();
+  if (end != sizeof(Record)) bad_description("rows do not tile the record");
+  if (followers.size() > most_followers) bad_description("too many kinds of followers");
+  for (std::size_t i = 0; i < followers.size(); ++i) {
+    const field_type type = followers[i].count.type;
+    if (type != field_type::u8 && type != field_type::u16 && type != field_type::u32) {
+      bad_description("a count may be negative, or more than 64 bits hold of bytes");
+    }
+    if (i && followers[i].each->followers.empty() && !followers[i - 1].each->followers.empty()) {
+      bad_description("followers with followers come last");
+    }
+  }
+  if (!agrees_with<Record>(followers)) bad_description("trailing_size() counts otherwise");
   return {name, noun, sizeof(Record), rows, followers};
 }
 

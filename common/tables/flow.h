@@ -195,7 +195,7 @@ struct tv_stats_flow_adv {
   std::uint32_t sfa_entries_count;
 
   // Bytes of `sfa_entries` behind the header.
-  std::uint64_t trailing_size() const {
+  constexpr std::uint64_t trailing_size() const {
     return std::uint64_t{sfa_entries_count} * sizeof(tv_stats_flow_adv_entry);
   }
 };

@@ -29,7 +29,9 @@ struct tv_stats_netns {
   std::uint8_t reserved_19[13];
 
   // Bytes of the ranges behind the head.
-  std::uint64_t trailing_size() const { return std::uint64_t{entry_count} * sizeof(tv_stats_netns_range); }
+  constexpr std::uint64_t trailing_size() const {
+    return std::uint64_t{entry_count} * sizeof(tv_stats_netns_range);
+  }
 };
 
 static_assert(sizeof(tv_stats_netns) == 32);

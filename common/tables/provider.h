@@ -53,7 +53,7 @@ struct nexus_provider_record {
   std::uint8_t reserved_260[4];
 
   // Bytes of the instance UUIDs behind the fixed part.
-  std::uint64_t trailing_size() const { return std::uint64_t{instance_count} * sizeof(uuid); }
+  constexpr std::uint64_t trailing_size() const { return std::uint64_t{instance_count} * sizeof(uuid); }
 };
 
 static_assert(sizeof(nexus_provider_record) == 16 + 48 + 192 + 8);

@@ -13,7 +13,7 @@
 struct found_record {
   const record_description *what;
   record_bytes bytes;
-  std::array<record_bytes, 2> followers;  // by what->followers, each kind back to back
+  std::array<record_bytes, most_followers> followers;  // by what->followers, each kind back to back
 };
 
 // Steps over a record and all that follows it. Calls `visit` with it, then with those behind it that have

@@ -8,4 +8,6 @@ add_link_options(--coverage)
 foreach(call abort _exit raise execv execvp)
   add_link_options(-Wl,--wrap=${call})
 endforeach()
+# Also where nothing calls it but what counts.
+add_link_options(-Wl,--undefined=__wrap_abort)
 link_libraries(coverage_dump)

@@ -15,6 +15,9 @@ constexpr const char *kinds[] = {"unread", "identifier",  "number", "gauge",   "
                                  "flags",  "enumeration", "pid",    "process", "interface",
                                  "name",   "address",     "mac",    "nested"};
 
+static_assert(std::size(types) == static_cast<std::size_t>(field_type::record) + 1);
+static_assert(std::size(kinds) == static_cast<std::size_t>(field_kind::nested) + 1);
+
 std::string said(std::string_view text) {
   return '"' + std::string(text) + '"';
 }
