@@ -133,6 +133,12 @@ class Capture(CaptureTest):
         self.assertEqual((errors.count("File too large"), files(self.directory / "first")), (1, {}))
         self.assertIn("moments 0 of 1, tables 0 of 0, names 0, bytes 0\n", self.printed)
 
+    @unittest.skipIf(os.path.exists("/proc/sys/kern/tarvel"), "there is a kernel")
+    def test_WithoutAKernelThereIsNothingToCapture(self):
+        seen = run("capture", self.directory / "live")
+        self.assertEqual((seen.returncode, seen.stderr), (1, "tarvellab: no table can be read: No such file or directory\n"))
+        self.assertFalse((self.directory / "live").exists())
+
     def test_WrongArgumentsShowTheUsage(self):
         for words in ("", "a b", "--redact", "--every 1 a", "--count 2 a", "--seed 1 a", "--every 1 --count 0 a", "--every 1 --count a",
                       *(f"--every {every} --count 2 a" for every in ("0", "0.009", "3601", "-1", "nan", "inf", "1e1", "1s", ""))):
@@ -269,6 +275,8 @@ class Moments(CaptureTest):
         os.mknod(kernel.root / node_dir / "stats/flow")
         os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
         self.assertIn("flow is left out: mostly holes\n", self.capture(self.directory / "made", status=1))
+        (kernel.root / node_dir / "stats/flow").write_bytes(bytes(17 << 20))  # large, and all there
+        self.assertNotIn("holes", self.replay("true").stderr)
 
     def test_OnlyFilesAreReplayed(self):
         kernel = self.make()

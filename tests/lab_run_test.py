@@ -139,6 +139,8 @@ class Run(LabTest):
         seen = subprocess.run([sys.executable, "-c", script, copied], env=self.env, cwd=self.directory, capture_output=True, text=True)
         self.assertEqual((seen.returncode, seen.stdout), (127, ""))
         self.assertIn("/proc/self/exe: File name too long", seen.stderr)
+        alone = subprocess.run([copied, "run", "--", "tarvelctl"], env={**self.env, "PATH": "/nowhere"}, capture_output=True, text=True)
+        self.assertEqual(alone.returncode, 127)
 
     def test_ASignalThatCameBeforeTheCommandIsItsEnd(self):
         def signalled():

@@ -50,10 +50,11 @@ class Strangers(LabTest):
             os.waitpid(child, 0)
 
     def run_on(self, place, *commands, kernel=None, seconds="20"):
-        """What is printed by commands that make or enter a place. What moves is ended."""
+        """What is printed by commands that make or enter a place. What moves is ended, without a SIGCONT too: the leak
+        check at its end would wait for the stop that this undoes."""
         for command in commands:
             words = [place if word == "DIR" else word for word in command.split()]
-            yield subprocess.run(["timeout", "-s", "INT", seconds, lab, *words], capture_output=True, text=True, timeout=60,
+            yield subprocess.run(["timeout", "--foreground", "-s", "INT", seconds, lab, *words], capture_output=True, text=True, timeout=60,
                                  env={**os.environ, "TARVEL_ROOT": str(kernel or self.kernel)}).stderr
 
     made, run_there = ("generate DIR", "simulate DIR"), "run DIR -- true"

@@ -276,6 +276,9 @@ consteval record_description describe(std::string_view name, std::string_view no
     if (each.type == field_type::text && each.length && each.length->type != field_type::u32) {
       bad_description("the length of a text is no u32");
     }
+    if (each.kind == field_kind::address && each.length && each.size != 16) {
+      bad_description("an address of any length needs room for the longest");
+    }
   }
   if (end != sizeof(Record)) bad_description("rows do not tile the record");
   if (followers.size() > most_followers) bad_description("too many kinds of followers");
