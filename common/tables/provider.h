@@ -97,6 +97,6 @@ inline constexpr record_description provider_description =
     describe<nexus_provider_record>("nexus_provider_record", "provider", provider_rows, provider_followers);
 
 // The name of a provider's type; `subtype` tells flow switches apart.
-format::small_text<32> provider_type_name(std::uint32_t type, std::uint32_t subtype);
+const format::small_text<32> &provider_type_name(std::uint32_t type, std::uint32_t subtype);
 
 #endif

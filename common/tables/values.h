@@ -44,10 +44,11 @@ struct value_names {
     return i;
   }
 
-  constexpr const format::name_text &of(std::int64_t number) const {
-    const std::size_t at = find(number);
-    return at < N ? rows[at].name : unknown;
+  constexpr const format::name_text &at(std::size_t position) const {
+    return position < N ? rows[position].name : unknown;
   }
+
+  constexpr const format::name_text &of(std::int64_t number) const { return at(find(number)); }
 
   // The number that has this name. A name that is none does not compile.
   consteval std::uint32_t number(std::string_view name) const {
