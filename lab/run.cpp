@@ -88,11 +88,11 @@ class mover {
   bool start(const temporary_directory &directory, Move move) {
     const pid_t owner = getpid();
     pid_ = fork();
-    if (pid_ < 0) return complain_about("fork", errno);
+    if (pid_ < 0) return complain_about("fork", errno);  // GCOVR_EXCL_BR_LINE: forks do not fail at will
     if (pid_ > 0) return true;
     setpgid(0, 0);
     prctl(PR_SET_PDEATHSIG, SIGTERM);
-    if (getppid() == owner) move(set_of({SIGTERM}));
+    if (getppid() == owner) move(set_of({SIGTERM}));  // GCOVR_EXCL_BR_LINE: who is gone already is rare
     // The owner stops its child in a harder way: here it is gone, and its directory left behind.
     if (getppid() != owner) directory.remove();
     _exit(EXIT_SUCCESS);
@@ -195,7 +195,7 @@ int end_like(int status) {
 // Runs the command on `root` and returns its wait status.
 int run_command(char **command, const std::string &root, const sigset_t &signals, const sigset_t &before) {
   const pid_t child = fork();
-  if (child < 0) {
+  if (child < 0) {  // GCOVR_EXCL_BR_LINE: forks do not fail at will
     complain_about("fork", errno);
     return W_EXITCODE(EXIT_FAILURE, 0);
   }
