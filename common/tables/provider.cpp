@@ -8,15 +8,15 @@ namespace {
 using type_text = format::small_text<32>;
 
 // A type and, where there is one, its subtype.
-constexpr type_text joined(const format::name_text &type, const format::name_text *subtype) {
+constexpr type_text joined(std::string_view type, std::string_view subtype = {}) {
   type_text text = "";
   const auto add = [&text](std::string_view part) {
     for (const char character : part) text.chars[text.size++] = character;
   };
-  add(type.view());
-  if (!subtype) return text;
+  add(type);
+  if (subtype.empty()) return text;
   add(" (");
-  add(subtype->view());
+  add(subtype);
   add(")");
   return text;
 }
@@ -26,11 +26,11 @@ constexpr std::size_t flow_switch = nexus_types.find(nexus_types.number("flow-sw
 // By position among the names, the one for all other numbers last. They are put together when the program is
 // compiled.
 constexpr auto type_texts = []<std::size_t... I>(std::index_sequence<I...>) {
-  return std::array{joined(nexus_types.at(I), nullptr)...};
+  return std::array{joined(nexus_types.at(I).view())...};
 }
 (std::make_index_sequence<std::size(nexus_types.rows) + 1>());
 constexpr auto flow_switch_texts = []<std::size_t... I>(std::index_sequence<I...>) {
-  return std::array{joined(nexus_types.at(flow_switch), &flow_switch_subtypes.at(I))...};
+  return std::array{joined(nexus_types.at(flow_switch).view(), flow_switch_subtypes.at(I).view())...};
 }
 (std::make_index_sequence<std::size(flow_switch_subtypes.rows) + 1>());
 
