@@ -14,7 +14,7 @@ from records import RECORDS, TABLES, load  # noqa: E402
 
 sources, generate_completions, tarvellab = pathlib.Path(sys.argv[1]), *sys.argv[2:4]
 del sys.argv[1:4]
-load(tarvellab)
+load(pathlib.Path(tarvellab).with_name("tests") / "describe")
 
 
 def sections(page, macro):

@@ -12,7 +12,7 @@ import unittest
 from records import Kernel, load
 
 lab = sys.argv.pop(1)  # the program to test
-load(lab)
+load(pathlib.Path(lab).with_name("tests") / "describe")
 node_dir = "proc/sys/kern/tarvel/"
 none = 0xFFFFFFFF  # in place of an index
 

@@ -1,15 +1,21 @@
-"""Kernels made of files, and the records of their tables as the rows say that describe them."""
+"""Kernels made of files, and the records of their tables, written and read by the names of their fields.
+
+The names, and where fields are, come from the rows that describe each record. The manual says both by hand, and a test of
+its own compares the two.
+"""
+import ipaddress
 import json
 import os
 import pathlib
 import subprocess
+import uuid
 
 TABLES, RECORDS = {}, {}  # by name: the record that a table is a sequence of, and what is known of a record
 
 
-def load(lab):
-    """Asks the program `describe`, which is built beside the lab."""
-    said = json.loads(subprocess.check_output([pathlib.Path(lab).with_name("tests") / "describe"]))
+def load(describe):
+    """Asks the program that prints the rows."""
+    said = json.loads(subprocess.check_output([describe]))
     TABLES.update((node.removeprefix("kern.tarvel.").replace(".", "/"), name) for node, name in said["tables"].items())
     RECORDS.update(said["records"])
     for record in RECORDS.values():
@@ -69,6 +75,40 @@ def walk(name, table, at=0, count=None):
     return found
 
 
+def encoded(row, value):
+    """A value as the bytes of one element: a number, a text, a UUID or an address as it is written, or bytes."""
+    if isinstance(value, int):
+        order = "big" if row["type"] == "net16" else "little"
+        return (value % (1 << 8 * row["size"])).to_bytes(row["size"], order)
+    if isinstance(value, str):
+        value = {"uuid": lambda: uuid.UUID(value).bytes, "text": value.encode,
+                 "bytes": lambda: ipaddress.ip_address(value).packed}[row["type"]]()
+    assert len(value) <= row["size"]
+    return value
+
+
+def make(name, **values):
+    """A record with what follows it, from values by name: one, a list from the first element on, elements by number, or
+    those of a part by name. What is not given is 0; what nobody reads is not, so that nobody takes it for that."""
+    record = RECORDS.get(name) or RECORDS["tv_stats_" + name]
+    fields, table, behind = record["fields"], bytearray(record["size"]), b""
+    for follower in record["followers"]:
+        each = values.pop(follower["name"], [])
+        values = {follower["count"]: len(each), **values}
+        behind += b"".join(each)
+    given = {field: b"\xEE" * row["size"] for field, row in fields.items() if row["kind"] == "unread"}
+    for field, value in values.items():
+        given |= {f"{field}.{key}": v for key, v in value.items()} if field not in fields else {field: value}
+    for field, value in given.items():
+        row = fields[field]
+        value = dict(enumerate(value)) if isinstance(value, list) else value
+        for number, each in value.items() if isinstance(value, dict) else [(0, value)]:
+            data = encoded(row, each)
+            at = row["offset"] + number * row["size"]
+            table[at:at + len(data)] = data
+    return bytes(table) + behind
+
+
 class Kernel:
     def __init__(self, root):
         self.root = pathlib.Path(root)
@@ -81,7 +121,17 @@ class Kernel:
         return self.path(name).read_bytes()
 
     def put(self, name, contents):
-        self.path(name).write_bytes(contents)
+        """Publishes a table: who reads along gets the old one or the new one. None takes it away."""
+        if contents is None:
+            return self.path(name).unlink(missing_ok=True)
+        self.path(name).parent.mkdir(parents=True, exist_ok=True)
+        (self.root / "unpublished").write_bytes(contents)
+        (self.root / "unpublished").rename(self.path(name))
+
+    def process(self, pid, name):
+        """Gives a process a name, which its file ends with a line end."""
+        (self.root / f"proc/{pid}").mkdir(parents=True, exist_ok=True)
+        (self.root / f"proc/{pid}/comm").write_text(name + "\n")
 
     def records(self, name):
         return walk(TABLES[name], self.table(name))

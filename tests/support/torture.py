@@ -23,7 +23,7 @@ class Torture:
         for option, default in extra.items():
             parser.add_argument("--" + option, type=type(default), default=default)
         self.name, self.options = name, parser.parse_args()
-        load(self.options.tarvellab)
+        load(os.path.join(os.path.dirname(self.options.tarvellab), "tests/describe"))
         self.long, self.random = self.options.long, random.Random(self.options.seed)
         self.runs = self.faults = self.findings = 0
         self.children = []
