@@ -3,11 +3,10 @@ import argparse
 import os
 import random
 import shutil
-import subprocess
 import sys
 import tempfile
 
-from runs import Result, generate, tarvelctl
+from runs import Run, generate, tarvelctl
 
 
 class Driver:
@@ -29,14 +28,9 @@ class Driver:
         return generate(tempfile.mkdtemp(dir=self.directory), *sizes)
 
     def run(self, kernel, line, program=tarvelctl, **options):
-        """Runs the tool, or another program in its place, to its end. The result holds bytes."""
+        """What the tool, or another program in its place, leaves behind at its end. Options are those of a Run."""
         self.runs += 1
-        try:
-            done = subprocess.run([program, *line.split()], env=kernel.environment, stdin=subprocess.DEVNULL,
-                                  capture_output=True, timeout=60, **options)
-        except subprocess.TimeoutExpired:
-            return Result(b"", b"", "does not end")
-        return Result(done.stdout, done.stderr, done.returncode)
+        return Run([program, *line.split()], kernel, **options).end()
 
     def expect(self, command, fault, seen, expected):
         """Reports what was seen where it is not what was expected."""

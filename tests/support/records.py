@@ -1,7 +1,7 @@
 """Kernels made of files, and the records of their tables, written and read by the names of their fields.
 
-The names, and where fields are, come from the rows that describe each record. The manual says both by hand, and a test of
-its own compares the two.
+The names, and where fields are, come from the rows that describe each record. The manual says both by hand, and a test
+compares the two.
 """
 import ipaddress
 import json
@@ -28,9 +28,10 @@ class Record:
     """A record where it lies in its table. By name it gives the values of its fields and lists of what follows it."""
 
     def __init__(self, name, table, at):
-        self.table, self.at, self.fields, self.followers = table, at, RECORDS[name]["fields"], {}
-        self.end = self.head_end = at + RECORDS[name]["size"]
-        for behind in RECORDS[name]["followers"]:
+        self.about, self.table, self.at, self.followers = RECORDS[name], table, at, {}
+        self.fields = self.about["fields"]
+        self.end = self.head_end = at + self.about["size"]
+        for behind in self.about["followers"]:
             self.followers[behind["name"]] = walk(behind["record"], table, self.end, self[behind["count"]])
             self.end = max((each.end for each in self.followers[behind["name"]]), default=self.end)
 
@@ -140,4 +141,5 @@ class Kernel:
         return [channel for group in self.records("nexus_channel_list") for channel in group["channels"]]
 
     def pids(self):
-        return {record.value(row, at) for name in TABLES for record in self.records(name) for row, at in record.find("kind", "pid")}
+        records = (record for name in TABLES for record in self.records(name))
+        return {record.value(row, at) for record in records for row, at in record.find("kind", "pid")}

@@ -29,7 +29,7 @@ MISSING = "sysctl for len failed, No such file or directory\n"
 SHORT = "Buffer too short\n"
 TIME = re.compile(r"\d{4}-\d\d-\d\d \d\d:\d\d:\d\d")
 
-# What a run left behind, its outputs as texts of UTF-8 with stray bytes as surrogates. Status -N is the end by signal N.
+# What a run left behind: outputs are texts, with stray bytes as surrogates; status -N is the end by signal N.
 Result = collections.namedtuple("Result", "out err status")
 
 
