@@ -136,7 +136,8 @@ def damage_case(driver, kernel, command, name, ending, shown):
 
 # Commands, with how many texts they show of the kernel below.
 SHOWING = {"channel": 3, "flow": 4, "flow-adv": 2, "flow-owner": 2, "flow-route -n": 1, "flow-route": 3,
-           "flow-switch": 1, "interface": 1, "memory": 4, "netstat -a": 8, "netstat -s": 2, "provider -D": 1, "show": 2, "tree": 6}
+           "flow-switch": 1, "interface": 1, "memory": 4, "netstat -a": 8, "netstat -s": 2, "provider -D": 1, "show": 2,
+           "tree": 6}
 # What UTF-8 is made of, and what comes near it.
 PIECES = (*(character.encode() for character in "a\u0085\u00e4\u20ac\u2027\u2028\u202e\u2066\u206a\U0001f9ed"),
           *(bytes([value]) for value in b"\x80\x9f\xa0\xbf\xc2\xe0\xe2\xed\xf0\xf4\xf8"))
