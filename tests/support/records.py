@@ -88,7 +88,7 @@ def encoded(row, value):
     return value
 
 
-def make(name, **values):
+def make(name, /, **values):
     """A record with what follows it, from values by name: one, a list from the first element on, elements by number, or
     those of a part by name. What is not given is 0; what nobody reads is not, so that nobody takes it for that."""
     record = RECORDS.get(name) or RECORDS["tv_stats_" + name]

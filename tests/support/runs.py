@@ -1,6 +1,7 @@
 """What tests of whole programs share: the programs of a build, which is their first argument, and runs of them."""
 import collections
 import contextlib
+import functools
 import os
 import pathlib
 import pty
@@ -122,10 +123,13 @@ def limit_files(size):
     resource.setrlimit(resource.RLIMIT_FSIZE, (size, resource.RLIM_INFINITY))
 
 
-def name_services(**answers):
-    """The environment of a program that asks name services of ours: see name_services.cpp for its variables."""
+def preloaded(module, **variables):
+    """The environment of a program that loads something of ours first: see MODULE.cpp for its variables."""
     sanitizer = os.environ.get("ASAN_OPTIONS", "") + ":verify_asan_link_order=0"
-    return {"LD_PRELOAD": str(build / "tests/libname_services.so"), "ASAN_OPTIONS": sanitizer, **answers}
+    return {"LD_PRELOAD": str(build / f"tests/lib{module}.so"), "ASAN_OPTIONS": sanitizer, **variables}
+
+
+name_services = functools.partial(preloaded, "name_services")
 
 
 def generate(root, *options):
@@ -157,10 +161,13 @@ class Case(unittest.TestCase):
         self.addCleanup(lambda: run.process.poll() is None and run.process.kill())
         return run
 
-    def run_on(self, tables, line, **options):
-        """The result of a run to its end, on a kernel that gets these tables first."""
+    def put(self, tables):
         for name, contents in tables.items():
             self.kernel.put(name, contents)
+
+    def run_on(self, tables, line, **options):
+        """The result of a run to its end, on a kernel that gets these tables first."""
+        self.put(tables)
         return self.start(line, **options).end()
 
     def expect(self, tables, line, out="", err="", status=0, **options):
@@ -170,3 +177,16 @@ class Case(unittest.TestCase):
             with self.subTest(line=each):
                 seen = self.run_on(tables, each, **options)
                 self.assertEqual(seen._replace(out=TIME.sub("<time>", seen.out)), expected)
+
+    def watch(self, line, *tables):
+        """What a watch leaves behind whose runs get these tables, one after the other, and which an interrupt ends. On
+        standard error it tells of its sleeps."""
+        self.put(tables[0])
+        run = self.start(line, environment=preloaded("own_clock"))
+        for number, each in enumerate(tables[1:], 1):
+            run.wait("sleep ", number)
+            self.put(each)
+            run.process.send_signal(signal.SIGALRM)
+        run.wait("sleep ", len(tables))
+        seen = run.end(signal.SIGINT)
+        return seen._replace(out=TIME.sub("<time>", seen.out))
