@@ -145,7 +145,7 @@ def aborted(function, line, expression, out="", file="tarvelctl/tarvelctl"):
 
 
 class Case(unittest.TestCase):
-    """Whole commands on `self.kernel`, which has no tables yet; everything below `self.directory` is removed."""
+    """Whole commands in the folder `self.directory`, on `self.kernel`, which has no tables yet, and curl as process 42."""
     maxDiff = None
 
     def setUp(self):
@@ -153,11 +153,12 @@ class Case(unittest.TestCase):
         self.addCleanup(shutil.rmtree, self.directory, ignore_errors=True)
         self.directory.chmod(0o755)  # for tests that give up their rights
         self.kernel = Kernel(self.directory / "kernel")
+        self.kernel.process(42, "curl")
 
     def start(self, line, program=tarvelctl, kernel=None, **options):
         """A program under way. The line is a text, as a shell splits it, or a list of words."""
         words = shlex.split(line) if isinstance(line, str) else [*map(str, line)]
-        run = Run([program, *words], kernel or self.kernel, **options)
+        run = Run([program, *words], kernel or self.kernel, **{"cwd": self.directory, **options})
         self.addCleanup(lambda: run.process.poll() is None and run.process.kill())
         return run
 
