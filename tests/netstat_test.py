@@ -46,22 +46,19 @@ TWINS = (("net_if", "netif:\n", "interface", "--netif", 28, "\t\tTxIRQ          
 
 
 class Netstat(Case):
-    def test_WithoutAReportItPrintsItsUsage(self):
+    def test_WithoutAReportItPrintsItsUsageAndNothingAfterWrongValues(self):
         for error, *options in (
-                ("", "", "-n", "--global", "--pid 5", "--show-zeros", "-p tcp", "--wait -s", "a -- -s", "--uuid " + A),
-                ("netstat: invalid option -- 'w'\nnetstat: invalid option -- '1'\n", "-w1"),
-                ("netstat: option requires an argument -- 'p'\n", "-p"),
-                ("netstat: option '--pid' requires an argument\n", "--pid"),
-                ("netstat: option '--netif' doesn't allow an argument\n", "--netif=1")):
-            self.expect(STACKS, [f"netstat {each}" for each in options], err=error + USAGE, name="tv")
-
-    def test_WrongValuesStopItBeforeAnyReport(self):
-        for option, error, *values in (("-p", 'Unsupported protocol "{}"\n', "icmp", "TCP", "tcp6", ""),
-                                       ("--uuid", "Bad UUID\n", A + "0", A[1:], "G" + A[1:], "")):
-            for value in values:
-                line = f"netstat -s -p tcp {option} '{value}' -x"
-                self.expect(STACKS, line, err=error.format(value))
-                self.expect(STACKS, f"{line} -w 60", "\n<time>\n", error.format(value))
+                (USAGE, "", "-n", "--global", "--pid 5", "--show-zeros", "-p tcp", "--wait -s", "a -- -s",
+                 f"--uuid {A}"),
+                ("netstat: invalid option -- 'w'\nnetstat: invalid option -- '1'\n" + USAGE, "-w1"),
+                ("netstat: option requires an argument -- 'p'\n" + USAGE, "-p"),
+                ("netstat: option '--pid' requires an argument\n" + USAGE, "--pid"),
+                ("netstat: option '--netif' doesn't allow an argument\n" + USAGE, "--netif=1"),
+                *((f'Unsupported protocol "{each}"\n', f"-s -p tcp -p '{each}'") for each in ("icmp", "TCP", "tcp6", "")),
+                *(("Bad UUID\n", f"-s --uuid '{each}' -x") for each in (A + "0", A[1:], "G" + A[1:], ""))):
+            self.expect(STACKS, [f"netstat {each}" for each in options], err=error, name="tv")
+            if USAGE not in error:
+                self.expect(STACKS, f"-w 60 netstat {options[0]}", "\n<time>\n", error)
 
     def test_ReportsRunOnceInAFixedOrderWhateverFails(self):
         letters = {"Proto Local": "f", "<Closed Port": "s", "netif:": "i", "FlowAdvIdx": "a", "NetIf     Port": "o",
