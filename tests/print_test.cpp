@@ -4,12 +4,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cfloat>
 #include <climits>
 #include <cmath>
-#include <cstdio>
-#include <limits>
 #include <random>
-#include <string>
 
 #include "common/text/text.h"
 
@@ -17,42 +15,29 @@ namespace {
 
 using format::guard;
 
-#if defined(__SANITIZE_ADDRESS__) || !defined(__OPTIMIZE__)
-constexpr int rounds = 20'000;
-#else
-constexpr int rounds = 1'000'000;
-#endif
-
-// A sink that watches the promise of its users to stay within the room they asked for.
+// Watches the promise of its users to stay within the room that they asked for.
 struct watched_sink {
   char *room(std::size_t size) {
-    fence_at = buffer + size + format::slack;
-    EXPECT_LE(fence_at, buffer + sizeof buffer - 1);
-    *fence_at = fence;
-    return buffer;
+    fence = chars + size + format::slack;
+    *fence = '\x55';
+    return chars;
   }
-  void commit(char *end, bool line_end) {
-    EXPECT_LE(end + format::slack, fence_at);
-    EXPECT_EQ(*fence_at, fence);
-    text = {buffer, static_cast<std::size_t>(end - buffer)};
-    ends_line = line_end;
+  void commit(char *to, bool) {
+    EXPECT_TRUE(to + format::slack <= fence && *fence == '\x55');
+    end = to;
   }
   guard reader_guard() const { return against; }
 
-  static constexpr char fence = '\x55';
-
-  guard against = guard::none;
-  bool ends_line = false;
-  char *fence_at = nullptr;
-  std::string_view text{};
-  char buffer[4096];
+  guard against;
+  char *fence = nullptr, *end = nullptr;
+  char chars[4096];
 };
 
 template <format::text F, class... Args>
 std::string shown(guard against, const Args &...args) {
   watched_sink sink{.against = against};
   format::print_to<F>(sink, args...);
-  return std::string(sink.text) + (sink.ends_line ? "$" : "");
+  return {sink.chars, sink.end};
 }
 
 // Compares what a format gives with what printf gives for the same format.
@@ -60,16 +45,14 @@ template <format::text F, class... Args>
 void agree(const Args &...args) {
   char expected[1024];
   const int size = std::snprintf(expected, sizeof expected, F.chars, args...);
-  watched_sink sink;
-  format::print_to<F>(sink, args...);
-  if (sink.text == std::string_view(expected, static_cast<std::size_t>(size))) return;
-  ADD_FAILURE() << F.chars << " gives '" << sink.text << "', not '" << expected << "'";
+  EXPECT_EQ(shown<F>(guard::none, args...), std::string_view(expected, static_cast<std::size_t>(size)))
+      << F.chars;
 }
 
 // Compares each format for a value that `make` makes anew in every round; stops at the first disagreement.
 template <format::text... F, class Make>
 void agree_on_random(Make make) {
-  for (int i = 0; i < rounds && !testing::Test::HasFailure(); ++i) {
+  for (int i = 0; i < ROUNDS && !testing::Test::HasFailure(); ++i) {
     const auto value = make();
     (agree<F>(value), ...);
   }
@@ -84,25 +67,20 @@ Number random_number() {
   return static_cast<Number>(random_bits() >> 63 ? magnitude : 0 - magnitude);
 }
 
-// By turns: any bits at all, sums of money, exact ties of the third decimal, rates.
+// Any bits at all, sums of money, exact ties of the third decimal, rates.
 double random_double() {
-  switch (random_bits() % 4) {
-    case 0:
-      return std::bit_cast<double>(random_bits());
-    case 1:
-      return static_cast<double>(random_number<long long>()) / 100;
-    case 2:
-      return static_cast<double>(random_number<long long>() >> 13) / 8;
-    default:
-      return std::ldexp(static_cast<double>(random_bits() >> 11), -static_cast<int>(random_bits() % 64));
-  }
+  const double kinds[] = {
+      std::bit_cast<double>(random_bits()), static_cast<double>(random_number<long long>()) / 100,
+      static_cast<double>(random_number<long long>() >> 13) / 8,
+      std::ldexp(static_cast<double>(random_bits() >> 11), -static_cast<int>(random_bits() % 64))};
+  return kinds[random_bits() % 4];
 }
 
 TEST(format, IntegersAgreeWithPrintf) {
-  agree_on_random<"%d", "%3d", "%4d", "%10d", "%-11d", "%64d">(random_number<int>);
-  agree_on_random<"%u", "%2u", "%5u", "%6u", "%-3u", "%-5u">(random_number<unsigned>);
+  agree_on_random<"%d", "%4d", "%-11d", "%64d">(random_number<int>);
+  agree_on_random<"%u", "%5u", "%-5u">(random_number<unsigned>);
   agree_on_random<"%lld", "%6lld", "%-40lld">(random_number<long long>);
-  agree_on_random<"%llu", "%9llu", "%-10llu", "%-12llu", "%4qu", "%12qu">(random_number<unsigned long long>);
+  agree_on_random<"%llu", "%9llu", "%-12llu", "%12qu">(random_number<unsigned long long>);
   agree_on_random<"%x", "%02x", "%8x", "%-8x", "%o", "%04o">(random_number<unsigned>);
   agree_on_random<"%llx", "%016llx">(random_number<unsigned long long>);
 }
@@ -110,8 +88,7 @@ TEST(format, IntegersAgreeWithPrintf) {
 TEST(format, CharactersAndTextsAgreeWithPrintf) {
   agree_on_random<"%c", "%4c", "%-4c">([] { return static_cast<char>(random_bits()); });
   std::string text;
-  agree_on_random<"%s", "%8s", "%15s", "%-3s", "%-12s", "%.15s", "%10.4s", "%-10.4s", "%.0s", "%-43s",
-                  "%-64s">([&] {
+  agree_on_random<"%s", "%8s", "%-12s", "%.15s", "%10.4s", "%-10.4s", "%.0s", "%-64s">([&] {
     text.assign(random_bits() % 20, '\0');
     for (char &letter : text) letter = static_cast<char>(1 + random_bits() % 255);
     return text.c_str();
@@ -119,42 +96,28 @@ TEST(format, CharactersAndTextsAgreeWithPrintf) {
 }
 
 TEST(format, DoublesAgreeWithPrintf) {
-  agree_on_random<"%.2f", "%5.2f", "%7.2f">(random_double);
-  agree_on_random<"%g", "%-12g", "%.3f">(random_double);
+  agree_on_random<"%.2f", "%7.2f", "%g", "%-12g", "%.3f">(random_double);
 }
 
 TEST(format, ExtremesAgreeWithPrintf) {
-  agree<"%d %d %u">(INT32_MIN, INT32_MAX, UINT32_MAX);
-  agree<"%lld %lld %llu">(LLONG_MIN, LLONG_MAX, ULLONG_MAX);
-  for (int byte = 0; byte < 256; ++byte)
+  agree<"%d %d %u %lld %lld %llu">(INT_MIN, INT_MAX, UINT_MAX, LLONG_MIN, LLONG_MAX, ULLONG_MAX);
+  for (unsigned byte = 0; byte < 256; ++byte) {
     agree<"%02x:%u">(static_cast<std::uint8_t>(byte), static_cast<std::uint8_t>(byte));
+  }
+  EXPECT_EQ(shown<"">(guard::none), "");
+  agree<"100%%\n\tPort[%2u] %-8s (fd %d)\t%%%c">(7U, "en0", -1, '!');
   unsigned long long power = 1;
-  for (int digits = 1; digits <= 20; ++digits, power *= 10)
+  for (int digits = 1; digits <= 20; ++digits, power *= 10) {
     agree<"%llu %llu %llu %lld">(power - 1, power, power + 1, -static_cast<long long>(power));
-  const auto agree_on_double = [](double value) {
+  }
+  for (const double value :
+       {0.0,     0.005,        0.015,       0.125,    0.375,       0.994999, 0.995,        1.005,
+        2.675,   9.995,        1e-5,        1e-4,     999999.5,    1e6,      1e22,         1e300,
+        0x1p52,  0x1p52 + 0.5, 0x1p53 - 1,  0x1p53,   0x1p53 + 2,  0x1p63,   1e15 + 0.125, DBL_MAX,
+        DBL_MIN, DBL_TRUE_MIN, DBL_EPSILON, HUGE_VAL, std::nan("")}) {
     agree<"%.2f %5.2f %7.2f %g">(value, value, value, value);
     agree<"%.2f %5.2f %7.2f %g">(-value, -value, -value, -value);
-  };
-  for (const double value : {0.0, 0.125, 0.375, 2.675, 1.005, 0.005, 0.015, 0.995, 0.994999, 9.995, 99.995,
-                             1e-3, 1e5, 999999.5, 1e6, 1e-4, 1e-5, 1e22, 1e300}) {
-    agree_on_double(value);
   }
-  using limits = std::numeric_limits<double>;
-  for (const double value : {0x1p52, 0x1p52 + 0.5, 0x1p53 - 1, 0x1p53, 0x1p53 + 2, 0x1p63, 1e15 + 0.125}) {
-    agree_on_double(value);
-  }
-  for (const double value : {limits::max(), limits::min(), limits::denorm_min(), limits::epsilon(),
-                             limits::infinity(), limits::quiet_NaN()}) {
-    agree_on_double(value);
-  }
-}
-
-TEST(format, LiteralsSurroundConversionsAndMayEndALine) {
-  EXPECT_EQ((shown<"">(guard::none)), "");
-  EXPECT_EQ((shown<"100%%\n">(guard::none)), "100%\n$");
-  EXPECT_EQ((shown<"a\nb">(guard::none)), "a\nb");
-  EXPECT_EQ((shown<"\tPort[%2u] %-8s (fd %d)\t%%%c">(guard::none, 7U, "en0", -1, '!')),
-            "\tPort[ 7] en0      (fd -1)\t%!");
 }
 
 TEST(format, ForeignTextsAreGuardedWhenTheyAreCut) {
@@ -164,15 +127,13 @@ TEST(format, ForeignTextsAreGuardedWhenTheyAreCut) {
   EXPECT_EQ((shown<"%9s|%-9.6s|%.5s">(guard::utf8, text, text, text)), "  ?[1m\u20ac|?[1m??   |?[1m?");
   EXPECT_EQ((shown<"%s">(guard::none, text)), text.text);
   EXPECT_EQ((shown<"%s">(guard::utf8, "\033[36mcyan\033[0m")), "\033[36mcyan\033[0m");
-  const foreign_text edges{"\x1f\x20\x7e\x7f\x80\x9f\xa0\xff"};
-  EXPECT_EQ((shown<"%s">(guard::bytes, edges)), "? ~???\xa0\xff");
+  EXPECT_EQ((shown<"%s">(guard::bytes, foreign_text{"\x1f\x20\x7e\x7f\x80\x9f\xa0\xff"})), "? ~???\xa0\xff");
 }
 
 TEST(format, Utf8HidesControlsAndWhatIsNoCharacter) {
-  for (const char *whole : {"\x20\x7e", "\xc2\xa0", "\u07ff", "\u0800", "\u2027", "\u202f", "\u2065",
-                            "\u206a", "\ud7ff", "\ue000", "\uffff", "\U00010000", "\U0010ffff"}) {
-    EXPECT_EQ((shown<"%s">(guard::utf8, foreign_text{whole})), whole);
-  }
+  const std::string_view whole =
+      "\x20\x7e\xc2\xa0\u07ff\u0800\u2027\u202f\u2065\u206a\ud7ff\ue000\uffff\U00010000\U0010ffff";
+  EXPECT_EQ((shown<"%s">(guard::utf8, foreign_text{whole})), whole);
   for (const char *hidden : {"\x1f\x7f", "\xc2\x80", "\xc2\x9f", "\u2028", "\u202e", "\u2066", "\u2069",
                              "\x80\xbf\xff", "\xc1\xbe", "\xe0\x9f\xbf", "\xf0\x8f\xbf\xbf", "\xed\xa0\x80",
                              "\xed\xbf\xbf", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80", "\xe2\x82"}) {

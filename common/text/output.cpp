@@ -90,8 +90,7 @@ constinit output report{report_storage, output::failure::fatal};
 constinit output diagnostics{diagnostics_storage, output::failure::ignored};
 
 void output::redirect(int fd) {
-  flush();
-  dup3(fd, fd_, fcntl(fd_, F_GETFD) == FD_CLOEXEC ? O_CLOEXEC : 0);
+  dup2(fd, fd_);
   ::close(fd);
   attach(fd_);
 }

@@ -43,7 +43,7 @@ class output {
   // Writes to `fd` from here on, and closes it by close(). Nothing may be buffered.
   void attach(int fd);
 
-  // Writes what is buffered, then lets the descriptor stand for the open file of `fd`, which it takes over.
+  // Lets the descriptor stand for the open file of `fd`, which it takes over. Nothing may be buffered.
   void redirect(int fd);
 
   // Whether the reader is a terminal.
