@@ -1,432 +1,372 @@
 #!/usr/bin/env python3
-"""Tests of captures: what they save, what they hide, and how they are shown again.
-
-usage: lab_capture_test.py TARVELLAB [unittest options]
-"""
+"""capture, and run on a capture: what is saved, shown again, refused and hidden."""
 import ipaddress
 import os
-import pathlib
-import pty
 import random
 import re
 import shutil
 import signal
-import struct
-import subprocess
 import sys
 import time
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import RECORDS, TABLES  # noqa: E402
-from lab_kernel import Kernel, LabTest, files, lab, limit_files, node_dir, run  # noqa: E402
+sys.path.insert(0, os.path.join(os.path.dirname(__file__), "support"))
+from records import RECORDS, TABLES, Kernel, encoded, make, walk  # noqa: E402
+from runs import LabCase, files, generate, limit_files, remove, tarvellab, top, wait_for  # noqa: E402
 
-commands = ("channel", "flow -n", "flow-adv", "flow-owner", "flow-route -n", "flow-switch", "interface", "memory", "netns -a",
-            "provider -D", "show -n", "tree", "channel-stats -n", "list-providers", "netstat -a -n")
-tarvelctl = pathlib.Path(lab).with_name("tarvelctl")
-
-
-class CaptureTest(LabTest):
-    def capture(self, root, *words, name="saved", status=0, **options):
-        saved = run("capture", *words, self.directory / name, env={**os.environ, "TARVEL_ROOT": str(root)}, **options)
-        self.assertEqual(saved.returncode, status, saved.stderr)
-        self.printed = saved.stdout
-        return saved.stderr
-
-    def saved(self, name="saved"):
-        return Kernel(self.directory / name)
-
-    def recapture(self, root, *options, **more):
-        shutil.rmtree(self.directory / "saved", ignore_errors=True)
-        return self.capture(root, *options, **more)
-
-    def write(self, path, content=b""):
-        (self.directory / path).parent.mkdir(parents=True, exist_ok=True)
-        (self.directory / path).write_bytes(content)
+NODES = "proc/sys/kern/tarvel/"
+FLOW, NAME = NODES + "stats/flow", "proc/94/comm"
+DATE = "%Y-%m-%dT%H:%M:%SZ"
+HOST = os.uname().nodename
+GONE = "tarvellab: no table can be read: No such file or directory\n"
+NOTE = "tarvellab: saved holds addresses and process names; --redact replaces them\n"
+COUNTS = "saved in saved: moments {} of {}, tables {} of {}, names {}, bytes {}\n"
+many = random.Random(1)
 
 
-class Capture(CaptureTest):
-    def test_EveryCommandPrintsTheSameElsewhere(self):
-        kernel = self.generate()
-        named = sorted(kernel.root.glob("proc/*/comm"))
-        for path, name in zip(named, (b"\n", b"a\nb\n", b"\x1b[2J\xff\n", b"fifteen bytes ..", b"")):
-            path.write_bytes(name)
-        named[5].unlink()
-        self.capture(kernel.root)
-        for command in commands:
-            live, elsewhere = (subprocess.run([*map(str, words), *command.split()], capture_output=True, env={**os.environ, "TARVEL_ROOT": root})
-                               for words, root in (([tarvelctl], str(kernel.root)),
-                                                   ([lab, "run", self.directory / "saved", "--", "tarvelctl"], "/")))
-            shown, *errors = elsewhere.stderr.splitlines(keepends=True)
-            self.assertRegex(shown.decode(), f"^tarvellab: this is {os.uname().nodename} at 20..-..-..T..:..:..Z\n$")
-            self.assertEqual((live.stdout, live.stderr, live.returncode), (elsewhere.stdout, b"".join(errors), elsewhere.returncode))
-            self.assertGreater(len(live.stdout), 300, command)
+class CaptureCase(LabCase):
+    def setUp(self):
+        super().setUp()
+        self.saved = Kernel(self.directory / "saved")
 
-    def test_CapturedKernelIsTheSameByteForByteForItsOwnerOnly(self):
-        kernel = self.generate()
-        before = time.strftime("%Y-%m-%dT%H:%M:%SZ", time.gmtime())
-        self.assertIn("holds addresses and process names", self.capture(kernel.root))
-        made, saved = files(kernel.root), files(self.directory / "saved")
-        note = dict(line.split(": ") for line in saved.pop("capture.txt").decode().splitlines())
-        self.assertTrue(before <= note.pop("time") <= time.strftime("%Y-%m-%dT%H:%M:%SZ", time.gmtime()))
-        self.assertEqual(note, {"format": "1", "host": os.uname().nodename, "redacted": "no"})
-        mentioned = {f"proc/{pid}/comm" for pid in kernel.pids()}
-        self.assertEqual(saved, {name: made[name] for name in made if "comm" not in name or name in mentioned})
-        sizes = [len(content) for name, content in saved.items() if "comm" not in name]
-        self.assertEqual(self.printed, f"saved in {self.directory}/saved: moments 1 of 1, tables 12 of 12, names {len(saved) - 12}, bytes {sum(sizes)}\n")
-        modes = {(p.is_dir(), p.stat().st_mode & 0o777) for p in (self.directory / "saved", *(self.directory / "saved").rglob("*"))}
-        self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
+    def capture(self, options="", out=None, err=NOTE, status=0, **more):
+        """Captures anew. The counts that are printed are those of the files."""
+        shutil.rmtree(self.saved.root, ignore_errors=True)
+        seen = self.lab(f"capture saved {options}", **more)
+        moments = [self.saved.root, *self.moments()]
+        tables, names = ([each.stat().st_size for root in moments for each in root.glob(what) if each.is_file()]
+                         for what in ("proc/sys/**/*", "proc/*/comm"))
+        counts = len(moments), len(moments), len(tables), 12 * len(moments), len(names), sum(tables)
+        self.assertEqual(seen, (COUNTS.format(*counts) if out is None else out, err, status))
 
-    def test_NamesOfProcessesThatNoOneReadsAreNotSaved(self):
-        self.generate("--processes", "0")
-        self.write(f"made/{node_dir}stats/arena", bytes(2576) + struct.pack("<8i", 7, 0, 8, 0, 0, 0, 0, 0))
-        for pid in 7, 8:
-            self.write(f"made/proc/{pid}/comm", b"name\n")
-        self.capture(self.directory / "made")
-        self.assertEqual([path.parent.name for path in self.directory.glob("saved/proc/*/comm")], ["7"])
+    def under_way(self, **options):
+        """A capture of many moments of empty tables, some of which are there."""
+        for name in TABLES:
+            self.kernel.put(name, b"")
+        run = self.start("capture saved --every .02 --count 1000", tarvellab, cwd=self.directory, **options)
+        wait_for(lambda: len(self.moments()) > 1)
+        return run
 
-    def test_NothingIsOverwritten(self):
-        kernel = self.generate()
-        made = files(kernel.root)
-        self.assertIn("Directory not empty", self.capture(kernel.root, name="made", status=1))
-        self.assertEqual(files(kernel.root), made)
-        self.write("file")
-        self.assertIn("Not a directory", self.capture(kernel.root, name="file", status=1))
-        (self.directory / "empty").mkdir(0o755)
-        self.capture(kernel.root, name="empty")
-        self.assertEqual((self.directory / "empty").stat().st_mode & 0o777, 0o700)
+    def moments(self):
+        return [*self.saved.root.glob("moments/[0-9]*")]
 
-    def test_MissingTablesAreLeftOut(self):
-        kernel = self.generate()
-        (kernel.root / node_dir / "stats/flow").unlink()
-        self.assertIn("kern.tarvel.stats.flow is left out", self.capture(kernel.root, status=1))
-        self.assertIn("tables 11 of 12", self.printed)
-        self.assertEqual(files(self.directory / "saved").keys() & {node_dir + "stats/flow"}, set())
-        errors = self.capture(self.directory / "empty", name="nothing", status=1)
-        self.assertEqual(errors, "tarvellab: no table can be read: No such file or directory\n")
-        self.assertFalse((self.directory / "nothing").exists())
+    def replay(self, *command, **options):
+        return self.lab(["run", self.kernel.root, "--", *command], **options)
 
-    def test_DamagedTablesAreSavedAsTheyAre(self):
-        kernel = self.generate()
-        for name, keep, damage in (("nexus_channel_list", 3000, (16, b"\xff" * 4)), ("nexus_channel_list", 71, (60, b"\xff" * 8)),
-                                   ("stats/flow_adv", 59, (36, b"\xff" * 4)), ("stats/flow", 639, (68, b"\xff" * 4)),
-                                   ("stats/arena", 2607, (0, b"")), ("stats/userstack", 1, (0, b""))):
-            table, (at, value) = kernel.table(name)[:keep], damage
-            table = table[:at] + value + table[at + len(value):]
-            (kernel.root / node_dir / name).write_bytes(table)
-            self.recapture(kernel.root)
-            self.assertEqual(self.saved().table(name), table)
-
-    def test_AMomentThatDoesNotFitEndsItAndLeavesTheOthers(self):
-        small, saved = self.directory / "small", self.directory / "saved"
-        self.write(f"small/{node_dir}ring_stat_enable", b"\1")
-        capture = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", saved], stdout=subprocess.PIPE, stderr=subprocess.PIPE,
-                                   text=True, env={**os.environ, "TARVEL_ROOT": str(small)}, preexec_fn=lambda: limit_files(1000))
-        self.wait_for(lambda: len(list(saved.glob("moments/[0-9]*"))) > 1)
-        self.write(f"small/{node_dir}stats/flow", bytes(3200))
-        printed, errors = capture.communicate(timeout=10)
-        self.assertIn("File too large", errors)
-        self.assertRegex(printed, "^saved in .*: moments (\\d+) of 1000, tables \\1 of \\d+, names 0, bytes \\1\n$")
-        self.assertEqual(capture.returncode, 1)
-        self.assertEqual([name for name in files(saved) if "/." in name], [])
-        errors = self.capture(self.generate().root, name="first", status=1, preexec_fn=lambda: limit_files(1000))
-        self.assertEqual((errors.count("File too large"), files(self.directory / "first")), (1, {}))
-        self.assertIn("moments 0 of 1, tables 0 of 0, names 0, bytes 0\n", self.printed)
-
-    @unittest.skipIf(os.path.exists("/proc/sys/kern/tarvel"), "there is a kernel")
-    def test_WithoutAKernelThereIsNothingToCapture(self):
-        seen = run("capture", self.directory / "live")
-        self.assertEqual((seen.returncode, seen.stderr), (1, "tarvellab: no table can be read: No such file or directory\n"))
-        self.assertFalse((self.directory / "live").exists())
-
-    def test_WrongArgumentsShowTheUsage(self):
-        for words in ("", "a b", "--redact", "--every 1 a", "--count 2 a", "--seed 1 a", "--every 1 --count 0 a", "--every 1 --count a",
-                      *(f"--every {every} --count 2 a" for every in ("0", "0.009", "3601", "-1", "nan", "inf", "1e1", "1s", ""))):
-            wrong = run("capture", *words.split(" "), cwd=self.directory)
-            self.assertEqual((wrong.returncode, wrong.stderr[:7]), (64, "usage:\n"), words)
-        for command in "generate", "simulate":
-            self.assertEqual(run(command, "--redact", "a").returncode, 64)
-
-
-class Moments(CaptureTest):
-    def moment(self, offset, comm=None, flows=None, channels=None):
-        """Adds a moment to a capture by hand; all else in it is the first's."""
-        root = self.directory / "made" / ("moments/" + offset if offset else "")
+    def moment(self, offset, flow=b"", name=b"same\n"):
+        """A moment of a capture by hand, the first where there is no offset; None takes a file away."""
+        root = self.kernel.root / "moments" / offset if offset else generate(self.kernel.root, "--flows", 3).root
         if offset:
-            shutil.copytree(self.directory / "made/proc", root / "proc")
-        for path, content in (("proc/94/comm", comm), (node_dir + "stats/flow", flows), (node_dir + "nexus_channel_list", channels)):
+            shutil.copytree(self.kernel.root / "proc", root / "proc")
+        else:
+            (root / "capture.txt").write_text("format: 1\nhost: a\ntime: noon\n")
+        for path, content in (FLOW, flow), (NAME, name):
             (root / path).unlink(missing_ok=True)
             if content is not None:
                 (root / path).write_bytes(content)
+        return root
 
-    def make(self):
-        kernel = self.generate("--flows", 3)
-        (kernel.root / "capture.txt").write_text("format: 1\nhost: a\ntime: noon\n")
-        return kernel
 
-    def replay(self, *command, **options):
-        return run("run", self.directory / "made", "--", *command, env={**os.environ, "TMPDIR": str(self.directory)}, **options)
+class Capture(CaptureCase):
+    def test_ACaptureIsTheKernelForItsOwnerOnly(self):
+        kernel = generate(self.kernel.root)
+        kernel.process(12345, "of no one's interest")
+        names = sorted(f"proc/{pid}/comm" for pid in kernel.pids() - {0})
+        for path, name in zip(names, (b"\n", b"a\nb\n", b"\x1b[2J\xff\n", b"sixteen bytes ..", b"")):
+            (kernel.root / path).write_bytes(name)
+        before = time.strftime(DATE, time.gmtime())
+        self.saved.root.mkdir(0o755)
+        self.assertEqual(self.lab("capture saved").err, NOTE)
+        modes = {(path.is_dir(), path.stat().st_mode & 0o777) for path in [self.saved.root, *self.saved.root.rglob("*")]}
+        self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
+        made, saved = files(kernel.root), files(self.saved.root)
+        said = re.fullmatch(f"format: 1\ntime: (.*)\nhost: {HOST}\nredacted: no\n", saved.pop("capture.txt").decode())[1]
+        self.assertTrue(before <= said <= time.strftime(DATE, time.gmtime()))
+        made[names[3]] = b"sixteen bytes .\n"
+        self.assertEqual(saved, {path: made[path] for path in made if path in names and made[path] or NODES in path})
+        live = self.start("flow -n").end()
+        self.assertEqual(self.lab("run saved -- tarvelctl flow -n"),
+                         live._replace(err=f"tarvellab: this is {HOST} at {said}\n"))
+        self.capture()
 
-    def test_MomentsAreTakenInTimeUntilInterrupted(self):
-        process, _ = self.start("simulate", self.directory / "made", "--interval", "20")
-        self.capture(self.directory / "made", "--every", ".25", "--count", 4)
-        offsets = [float(p.name) for p in sorted((self.directory / "saved/moments").iterdir())]
-        self.assertEqual(len(offsets), 3)
-        self.assertLess(sorted(offset % .25 for offset in offsets)[1], .1)  # a machine under load is late now and then
-        for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
-            self.assertGreater(len(Kernel(root).channels()), 10)
-            self.assertGreater(len(list(root.glob("proc/*/comm"))), 5)
-        long = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "1000", self.directory / "long"],
-                                stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL, env={**os.environ, "TARVEL_ROOT": str(self.directory / "made")})
-        self.wait_for(lambda: len(list(self.directory.glob("long/moments/[0-9]*"))) > 2)
-        long.send_signal(signal.SIGINT)
-        self.assertEqual(long.wait(5), 1)
-        self.assertEqual([p for p in files(self.directory / "long") if "/." in p], [])
-        process.kill()
+    def test_NothingIsOverwritten(self):
+        made = files(generate(self.kernel.root).root)
+        (self.directory / "file").touch()
+        for place, reason in ("kernel", "Directory not empty"), ("file", "Not a directory"):
+            self.expect({}, f"capture {place}", "", f"tarvellab: {place}: {reason}\n", 1, program=tarvellab, cwd=self.directory)
+        self.assertEqual(files(self.kernel.root), made)
 
+    def test_WhatCannotBeReadIsLeftOut(self):
+        self.capture("", "", GONE, 1)
+        self.assertFalse(self.saved.root.exists())
+        flow = generate(self.kernel.root).path("stats/flow")
+        flow.unlink()
+        missing = "sysctl for len failed, No such file or directory\ntarvellab: kern.tarvel.stats.flow is left out\n"
+        self.capture("", err=missing + NOTE, status=1)
+        os.mknod(flow)
+        os.truncate(flow, 17 << 20)
+        self.capture("", err="tarvellab: kern.tarvel.stats.flow is left out: mostly holes\n" + NOTE, status=1)
+        flow.write_bytes(bytes(17 << 20))
+        self.capture()
+
+    def test_MomentsAreTakenAtTheirTimes(self):
+        self.kernel.put("ring_stat_enable", b"\1")
+        began = time.monotonic()
+        run = self.start("capture saved --every .5 --count 4", tarvellab, cwd=self.directory)
+        wait_for(lambda: [*self.saved.root.glob("moments/[0-9]*")])
+        run.process.send_signal(signal.SIGSTOP)
+        time.sleep(1.1)  # a machine that is too slow for a moment
+        run.process.send_signal(signal.SIGCONT)
+        self.assertRegex(run.end().out, "^saved in saved: moments 4 of 4, tables 4 of 48, names 0, bytes 4\n$")
+        names = [path.name for path in self.saved.root.glob("moments/*")]
+        self.assertRegex(" ".join(names), r"^(\d+\.\d{3} ){2}\d+\.\d{3}$")
+        offsets = sorted(map(float, names))
+        self.assertEqual(len({offset // .5 for offset in offsets} - {0}), 3)  # each in an interval of its own
+        self.assertGreater(offsets[1] - offsets[0], 1)
+        self.assertLess(offsets[-1], time.monotonic() - began)
+
+    def test_WhatEndsACaptureLeavesTheMomentsSoFar(self):
+        for act, err in ((lambda run: run.process.send_signal(signal.SIGINT), "$"),
+                         (lambda run: self.kernel.put("stats/flow", bytes(3200)), "tarvellab: .*/flow: File too large\n$"),
+                         (lambda run: [self.kernel.root.rename(self.directory / "gone"), run.wait(GONE), time.sleep(.1),
+                                       run.process.send_signal(signal.SIGTERM)], f"([^/]*\n)*{GONE}$")):
+            run = self.under_way(preexec_fn=lambda: limit_files(1000))
+            act(run)
+            seen = run.end()
+            count = len(self.moments()) + 1
+            self.assertEqual((seen.out, seen.status), (COUNTS.format(count, 1000, 12 * count, 12 * count, 0, 0), 1))
+            self.assertRegex(seen.err, NOTE + err)
+            self.assertEqual([path for path in files(self.saved.root) if "/." in path], [])
+            shutil.rmtree(self.saved.root)
+
+
+class Replay(CaptureCase):
     def test_ACommandSeesEachMomentInItsTime(self):
-        self.make()
-        self.moment("", b"first\n", b"1" * 320)
-        self.moment("0.800", None, b"2" * 640)
-        self.moment("1.600", b"third\n", None)
-        seen = self.replay("sh", "-c", "r=$TARVEL_ROOT; until cat $r/proc/94/comm; wc -c <$r/proc/sys/kern/tarvel/stats/flow; grep third $r/proc/94/comm; do sleep 0.1;"
-                           " done 2>/dev/null; echo $r")
-        *words, place = seen.stdout.split()
-        self.assertFalse(pathlib.Path(place).parent.exists())
-        self.assertEqual(" ".join(dict.fromkeys(words)), "first 320 640 third")
-        self.assertEqual(seen.stderr, "tarvellab: this is a at noon\ntarvellab: the last moment is shown\n")
-
-    def test_AWatchShowsTheRatesOfThen(self):
-        kernel = self.make()
-        shutil.rmtree(kernel.root / "proc/94")
-        (kernel.root / "proc/94").mkdir()
-        moved = 0
-        for number in range(4):
-            moved += 1000 * number * number
-            ring = struct.pack("<8xQQ", 0, moved).ljust(184, b"\0")
-            self.moment(f"{number}.000" if number else "", channels=b"n" * 16 + struct.pack("<Q", 1) + b"c" * 16
-                        + struct.pack("<6I8x", 0, 94, 1, 0, 1, 0) + ring)
-        watch = self.replay("timeout", "--preserve-status", "-s", "INT", "4.4", tarvelctl, "-w", "1", "channel")
-        self.assertEqual([line.split()[3] for line in watch.stdout.splitlines() if line.startswith("TX[0]")][:3], ["1.00K", "4.00K", "9.00K"])
-
-    def test_AKernelThatGoesAwayIsMissed(self):
-        capture = subprocess.Popen([lab, "capture", "--every", "0.05", "--count", "8", self.directory / "saved"], stdout=subprocess.PIPE,
-                                   stderr=subprocess.PIPE, text=True, env={**os.environ, "TARVEL_ROOT": str(self.make().root)})
-        self.wait_for(lambda: (self.directory / "saved/moments").exists())
-        (self.directory / "made").rename(self.directory / "gone")
-        printed, errors = capture.communicate(timeout=10)
-        self.assertEqual(errors.splitlines()[-1], "tarvellab: no table can be read: No such file or directory")
-        self.assertLess(len(errors.splitlines()), 5)  # one table may be missed first
-        self.assertRegex(printed, "moments [2-7] of 8, tables (24|36|48|60|72|84) of \\1, ")
-        self.assertEqual(capture.returncode, 1)
-
-    def test_WhatWasRedactedStaysRedacted(self):
-        self.capture(self.generate().root, "--redact", "--every", "0.01", "--count", 2)
-        for root in self.directory / "saved", *(self.directory / "saved/moments").iterdir():
-            self.assertEqual(self.capture(root, name=f"again {root.name}"), "")
-            self.assertRegex((self.directory / f"again {root.name}/capture.txt").read_text(), "host: redacted\nredacted: yes\n$")
-        inside = self.generate(name="saved/a/kernel").root
-        self.assertIn("addresses", self.capture(inside, name="of another"))
-
-    def test_PathsDoNotDriveTheTerminal(self):
-        (self.directory / "named").symlink_to("\x1b[2Jthere")
-        (self.directory / "\x1b[2Jthere/proc/\x9b1m").mkdir(parents=True)
-        (self.directory / "\x1b[2Jthere/proc/\x9b1m/link").symlink_to(".")
-        mine, terminal = pty.openpty()
-        for words in ("run", "named", "--", "true"), ("generate", "/proc/\x1b]0;x\x07"):
-            subprocess.run([lab, *words], cwd=self.directory, stderr=terminal)
-        seen = os.read(mine, 10000)
-        self.assertIn(b"/?[2Jthere/proc/", seen)
-        self.assertEqual(set(b"\x1b\x07\x9b") & set(seen), set())
-
-    def test_OtherFormatsAreRefused(self):
-        kernel = self.make()
-        note = kernel.root / "capture.txt"
-        for content, message in (("format: 2\n", "format 2 is newer than this program, which knows 1"), ("host: a\nformat: 99999999999999999999", "is newer"),
-                                 ("", "does not state"), ("format: 0\n", "does not state"), ("format: -1\n", "does not state"),
-                                 ("format: \x1b[2J\n", "does not state"), ("x" * 10**6 + "\nformat: 1\n", "does not state")):
-            note.write_text(content)
-            seen = self.replay("true")
-            self.assertEqual(seen.returncode, 1, content[:50])
-            self.assertIn(f"{note}: {message}" if "is" not in message else message, seen.stderr)
-        for make in os.mkfifo, os.mkdir, lambda path: os.symlink("/dev/zero", path):
-            note.unlink()
-            make(note)
-            seen = self.replay("true")
-            self.assertEqual((seen.returncode, seen.stderr.count("\n")), (1, 1))
-            note.rmdir() if note.is_dir() else None
-            note.touch()
+        temporary, order = self.directory / "temporary", self.directory / "order"
+        temporary.mkdir()
+        self.moment("", b"1" * 320, b"first\n")
+        self.moment("2.400", b"2" * 640, None)
+        self.moment("2.500", None, b"third\n")
+        # All come a quarter of the first interval early: the second moment here before that of a shorter, later one.
+        other = shutil.copytree(self.kernel.root, self.directory / "other")
+        (other / "moments/2.400").rename(other / "moments/2.050")
+        shutil.copytree(self.kernel.root / "proc", other / "moments/0.100/proc")
+        script = f"""cd $TARVEL_ROOT; echo $TARVEL_ROOT; cat {NAME}; f=$TARVEL_ROOT/{FLOW} n=$TARVEL_ROOT/{NAME}; wc -c <$f
+                     while [ -e $n ]; do sleep .01; done; echo $0 >>{order}; wc -c <$f
+                     while [ -e $f ]; do sleep .01; done; cat $n; wc -c <{FLOW}"""
+        began = time.monotonic()
+        runs = [self.start(["run", root, "--", "sh", "-c", script, root.name], tarvellab,
+                           environment={"TMPDIR": str(temporary)}) for root in (self.kernel.root, other)]
+        wait_for(order.exists)
+        self.assertGreaterEqual(time.monotonic() - began, 1.8)
+        for run in runs:
+            seen = run.end()
+            self.assertRegex(seen.out, f"^{temporary}/tarvellab-....../moment\nfirst\n320\n640\nthird\n320\n$")
+            self.assertEqual(seen[1:], ("tarvellab: this is a at noon\ntarvellab: the last moment is shown\n", 0))
+        self.assertEqual((order.read_text(), [*temporary.iterdir()]), ("kernel\nother\n", []))
 
     def test_WhatIsNoMomentDoesNotCount(self):
-        kernel = self.make()
-        moments = kernel.root / "moments"
-        for name in "1e1.000", "-1.000", "0.000", ".000", "99999999999999999999.000", "9" * 30, "x", ".new", "0.1", "nan.000", "0.1000", "0.x00":
-            shutil.copytree(kernel.root / "proc", moments / name / "proc")
-        (moments / "0.100").touch()
-        self.assertEqual(self.replay("sh", "-c", "echo $TARVEL_ROOT").stdout, f"{kernel.root.resolve()}\n")
-        (moments / "0.010").mkdir()  # without any table
+        root = self.moment("")
+        for name in ("1e1.000", "-1.000", "0.000", ".000", "99999999999999999999.000", "9" * 30, "x", ".new", "0.1",
+                     "nan.000", "0.1000", "0.x00", "000000000001.000"):
+            self.moment(name)
+        (root / "moments/0.100").touch()
+        self.assertEqual(self.replay("sh", "-c", "echo $TARVEL_ROOT").out, f"{root.resolve()}\n")
+        (root / "moments/0.010").mkdir()  # without any table
         self.moment("99999999999.000")  # never comes
-        self.assertIn("No such file or directory", self.replay("sh", "-c", f"sleep 0.2; {tarvelctl} provider").stderr)
-        os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
-        self.assertRegex(self.replay("true").stderr, "/stats/flow: mostly holes\n$")
-        (kernel.root / node_dir / "stats/flow").unlink()
-        (kernel.root / "capture.txt").write_text("format: 1\n")
-        self.assertIn("this is unknown at unknown\n", self.replay("true").stderr)
-        os.mknod(kernel.root / node_dir / "stats/flow")
-        os.truncate(kernel.root / node_dir / "stats/flow", 2**42)
-        self.assertIn("flow is left out: mostly holes\n", self.capture(self.directory / "made", status=1))
-        (kernel.root / node_dir / "stats/flow").write_bytes(bytes(17 << 20))  # large, and all there
-        self.assertNotIn("holes", self.replay("true").stderr)
+        (root / "capture.txt").write_text("format: 1\n")
+        seen = self.replay("sh", "-c", "while [ -e $TARVEL_ROOT/proc ]; do sleep .01; done")
+        self.assertEqual(seen, ("", "tarvellab: this is unknown at unknown\n", 0))
+
+    def test_OtherFormatsAreRefused(self):
+        note, unknown = self.moment("") / "capture.txt", "does not state the capture's format"
+        newer = "format {} is newer than this program, which knows 1"
+        for content, said in (("format: 2\n", newer.format(2)), ("host: a\nformat: " + "9" * 20, newer.format("9" * 20)),
+                              *((text, unknown) for text in ("", "format: 0\n", "format: -1\n", "format: \x1b[2J\n",
+                                                             "a format: 1\n", "x" * 10**6 + "\nformat: 1\n")),
+                              (os.mkfifo, "Invalid argument"), (os.mkdir, "Invalid argument"),
+                              (lambda path: os.symlink("/dev/zero", path), "Invalid argument")):
+            remove(note)
+            note.write_text(content) if isinstance(content, str) else content(note)
+            self.assertEqual(self.replay("echo", "seen"), ("", f"tarvellab: {note}: {said}\n", 1))
 
     def test_OnlyFilesAreReplayed(self):
-        kernel = self.make()
-        self.moment("0.100")
-        for path in "proc/94/comm", node_dir + "stats/flow", "moments/0.100/proc", "moments", "more":
-            for make in os.mkfifo, lambda path: os.symlink("/etc", path), lambda path: os.makedirs(path / ("x/" * 8)):
-                kept = (kernel.root / path).exists() and (kernel.root / path).rename(self.directory / "kept")
-                make(kernel.root / path)
+        root = self.moment("")
+        deepest = self.moment("0.100") / NODES / "stats/more"
+        make_deep = lambda path: (path / "x/x/x/x/x/x/x/x").mkdir(parents=True)
+        for place, *makes in ([root / "proc/94/more"], [root / "moments/more"], [root / "more"], [deepest, os.mkdir]):
+            for make in os.mkfifo, lambda path: path.symlink_to("/etc"), make_deep, *makes:
+                make(place)
                 seen = self.replay("echo", "seen")
-                self.assertEqual((seen.returncode, seen.stdout), (1, ""))
-                self.assertRegex(seen.stderr, f"{path}(/x)*: no part of a capture\n")
-                (kernel.root / path).rename(self.directory / f"removed {time.monotonic_ns()}")
-                kept and kept.rename(kernel.root / path)
-        self.assertEqual(self.replay("echo", "seen").stdout, "seen\n")
-        os.mkfifo(kernel.root / "größe\u202e")
-        reader, terminal = pty.openpty()
-        subprocess.run([lab, "run", kernel.root, "--", "true"], stderr=terminal, env={**os.environ, "LC_ALL": "C.UTF-8"})
-        self.assertRegex(os.read(reader, 4096).decode(), r"größe\?\?\?: no part of a capture\r\n")
+                self.assertRegex(seen.err, f"^tarvellab: {place}(/x)*: no part of a capture\n$")
+                self.assertEqual((seen.out, seen.status), ("", 1))
+                remove(place)
+        os.truncate(root / FLOW, 2 ** 42)
+        self.assertEqual(self.replay("echo"), ("", f"tarvellab: {root / FLOW}: mostly holes\n", 1))
+        (root / FLOW).write_bytes(bytes(17 << 20))  # large, and all there
+        self.assertEqual(self.replay("echo", "seen").out, "seen\n")
+
+    def test_PathsDoNotDriveTheTerminal(self):
+        self.kernel.root = self.directory / "gr\u00f6\u00dfe\u202e\x1b\x07"
+        (self.kernel.root / "proc").mkdir(parents=True)
+        (self.kernel.root / "proc/\x07").symlink_to(".")
+        for locale, name in ("C", "gr\u00f6\udcc3?e\udce2?\udcae??"), ("C.UTF-8", "gr\u00f6\u00dfe?????"):
+            seen = self.replay("true", to="terminal", merged=True, environment={"LC_ALL": locale})
+            self.assertEqual(seen.out, f"tarvellab: {self.directory}/{name}/proc/?: no part of a capture\n")
 
 
-docs = pathlib.Path(__file__).parents[1] / "docs"
-# Of each record the fields, and the parts with all that is read of them, that survive redaction.
-surviving = {record: set(re.findall(r"[\w.]+", names)) for records, names in
-             re.findall(r"^\.It Vt (.*)\n((?:[^.].*\n)+)", (docs / "tarvellab.1").read_text(), flags=re.M) for record in records.split(" , ")}
+def elements(row):
+    return [f"[{number}]" for number in range(row["count"])] if row["count"] > 1 else [""]
 
 
-def survives(record):
-    """For each byte of a record whether it survives."""
-    result = []
-    for field, row in RECORDS[record]["fields"].items():
-        listed = row["kind"] != "unread" and bool({field, row["part"]} & surviving[record])
-        result += (survives(row["nested"]) if row["nested"] else [listed] * row["size"]) * row["count"]
-    return result
+def leaves(record, part=""):
+    """All elements of the fields of a record and of what belongs to it, as (name, row, bytes)."""
+    for field, row in record.fields.items():
+        for number, at in zip(elements(row), record.places(field)):
+            if row["nested"]:
+                yield from leaves(record.value(row, at), field + number + ".")
+            else:
+                yield part + field + number, row, record.table[at:at + row["size"]]
+    yield from (leaf for behind in record.followers.values() for each in behind for leaf in leaves(each))
 
 
-v4, v6 = (lambda t: ipaddress.ip_address(t).packed), (lambda t: ipaddress.ip_address(t).packed)
-entry = ("tv_stats_flow_adv_entry", [], [])
-mac, group = (b"\1\2\3\4\5\6", b"\3\0\0\0\0\1"), (b"\xff" * 6, b"\xff" * 6)
+def noisy(name, chosen, part=""):
+    """A record of random bytes, none of them 0 but where texts end, and of elements that are chosen; one follows it."""
+    data, followers = b"", RECORDS[name]["followers"]
+    chosen = {**{each["count"]: 1 for each in followers}, **chosen}
+    for field, row in RECORDS[name]["fields"].items():
+        for key in (part + field + number for number in elements(row)):
+            noise = bytearray(many.choices(range(128, 224), k=row["size"]))
+            if row["type"] == "text" and many.randrange(4):
+                noise[many.randrange(row["size"])] = 0
+            noise = encoded(row, chosen[key]) if key in chosen else noise
+            data += noisy(row["nested"], chosen, key + ".") if row["nested"] else noise
+    return data + b"".join(noisy(each["record"], chosen) for each in followers for _ in range(chosen[each["count"]]))
 
 
-class Redact(CaptureTest):
-    def redacted(self, tables, message=""):
-        """What becomes of tables, by name."""
-        shutil.rmtree(self.directory / "bare", ignore_errors=True)
-        for name, table in tables.items():
-            self.write(f"bare/{node_dir}{name}", table)
-        errors = self.recapture(self.directory / "bare", "--redact", status=1)  # the other tables are missing
-        self.assertIn(message, errors)
-        self.assertNotIn("holds", errors)
-        return {name: self.saved().table(name) for name in tables}
+KEPT = {"identifier", "number", "gauge", "counter", "flags", "enumeration", "pid"}
+REGION = ["regions[0]." + field for field in """name mode seg_size_req seg_size obj_size_req obj_count_req obj_size obj_count
+          objs_per_seg seg_in_use rescales allocs frees""".split()]
+# Tables, what is chosen in their records, and which fields then say nothing.
+CASES = [each.split() for each in f"""nexus_provider_list; nexus_channel_list; ring_stat_enable; stats/flow_owner; stats/arena
+    ; stats/net_if; stats/flow_switch; stats/userstack; stats/netns address_length=16; stats/netns address_length=5 address
+    ; stats/flow sf_local.family=2 sf_local.ipv6 sf_remote.ipv6; stats/flow sf_local.family=30 sf_local.ipv4 sf_remote.ipv4
+    ; stats/flow sf_local.family=3 sf_local.ipv4 sf_remote.ipv4 sf_local.ipv6 sf_remote.ipv6 sf_local.port sf_remote.port
+    ; stats/flow_route sfr_remote.family=2 sfr_flags=160 sfr_local.ipv6 sfr_remote.ipv6 sfr_gateway.ipv6
+    ; stats/flow_route sfr_remote.family=30 sfr_flags=127 sfr_local.ipv4 sfr_remote.ipv4 sfr_gateway.ipv4 sfr_mac
+    ; stats/flow_route sfr_remote.family=2 sfr_flags=223 sfr_local.ipv6 sfr_remote.ipv6 sfr_gateway.ipv4 sfr_gateway.ipv6
+    ; stats/flow_adv sfa_entries_count=512; stats/flow_adv sfa_entries_count=513 sfae_flow_uuid sfae_flags
+    ; stats/arena pids[2]=0 pids[3] pids[4] pids[5] pids[6] pids[7]; stats/arena regions[0].seg_count=0 {" ".join(REGION)}
+    """.split(";")]
 
-    # Of each table its records: what they are amid noise, as (offset, before, after), and what does not survive then, as (offset, width).
-    formats = {
-        "stats/flow": [
-            ("tv_stats_flow", [(16, b"en0\0", b"en1"), (36, b"browser\0", b"process1"), (81, b"\2"), (84, v4("10.0.0.1"), v4("240.0.0.1")),
-                               (112, v4("10.0.0.2"), v4("240.0.0.2"))], []),
-            ("tv_stats_flow", [(16, b"enx0050b6112233\0", b"if1"), (36, b"com.example.browser\0", b"process2"), (81, b"\x1e"),
-                               (88, v6("2001:db8::7"), v6("3fff::1")), (116, v6("fe80:4::7"), v6("fe80:4::3fff:0:0:2"))], []),
-            ("tv_stats_flow", [(16, b"pdp_ip3\0", b"pdp_ip1"), (36, b"\0", b""), (81, b"\3")], [(82, 2), (110, 2)]),
-            ("tv_stats_flow", [(16, b"en7\0", b"en2"), (36, b"com.example.bro\0", b"process2"), (81, b"\2"), (84, v4("10.0.0.2"), v4("240.0.0.2")),
-                               (112, v4("127.0.0.9"), v4("127.0.0.9"))], [])],
-        "stats/flow_route": [
-            ("tv_stats_flow_route", [(32, b"wlan\0", b"if1"), (56, b"\xa0"), (101, b"\2"), (76, bytes(4), bytes(4)),
-                                     (104, v4("224.0.0.251"), v4("239.0.0.1")), (132, v4("169.254.7.7"), v4("169.254.0.1")), (192, *mac)], []),
-            ("tv_stats_flow_route", [(32, b"7\0", b"if2"), (56, b"\xa0"), (101, b"\x1e"), (80, v6("::1"), v6("::1")),
-                                     (108, v6("ff02:5::fb"), v6("ff02:5::3fff:0:0:1")), (136, v6("::ffff:10.0.0.1"), v6("::ffff:240.0.0.1")),
-                                     (192, b"\0" * 6, b"\0" * 6)], []),
-            ("tv_stats_flow_route", [(32, b"\0", b""), (56, b"\x80"), (101, b"\2"), (76, v4("255.255.255.255"), v4("255.255.255.255")),
-                                     (104, v4("224.0.0.251"), v4("239.0.0.1")), (192, *group)], []),
-            ("tv_stats_flow_route", [(32, b"wlan\0", b"if1"), (56, b"\x20"), (101, b"\x1e"), (80, v6("fec0::7"), v6("3fff::2")),
-                                     (108, v6("ff01:5::fb"), v6("ff01:5::3fff:0:0:3")), (136, v6("ff05:5::fb"), v6("ff05::3fff:0:0:4"))], [])],
-        "stats/flow_owner": [("tv_stats_flow_owner", [(16, before + b"\0", after), (36, b"x" * size + b"\0" * (size < 32), b"process1")], [])
-                             for before, after, size in ((b"EN0", b"if1", 15), (b"en", b"if2", 16), (b"en0", b"en1", 32), (b"en00", b"en2", 31))],
-        "stats/netns": [("tv_stats_netns", [(0, v4("10.0.0.7"), v4("240.0.0.1")), (16, b"\4"), (18, b"\0")], []),
-                        ("tv_stats_netns", [(0, v6("fe80::7"), v6("fe80::3fff:0:0:1")), (16, b"\x10"), (18, b"\1")], []),
-                        ("tv_stats_netns_range", [], []), ("tv_stats_netns", [(16, b"\0"), (18, b"\0")], [])],
-        "stats/net_if": [("tv_stats_net_if", [(16, b"bridge0\0", b"bridge1")], [])],
-        "stats/flow_switch": [("tv_stats_flow_switch", [(16, b"enp0s31f6\0", b"if1")], [])],
-        "stats/userstack": [("tv_stats_userstack", [(16, b"lo0\0", b"lo1")], [])],
-        "stats/flow_adv": [("tv_stats_flow_adv", [(16, b"utun9\0", b"utun1"), (36, struct.pack("<I", 512))], []), *[entry] * 512,
-                           ("tv_stats_flow_adv", [(16, b"utun99\0", b"utun2"), (36, struct.pack("<I", 513))], []), *[(entry[0], [], [(0, 20)])] * 513],
-        "nexus_provider_list": [("nexus_provider_record", [(64, b"com.Browser.10.0.0.7\0", b"provider1"), (128, b"\x14\0\0\0", b"\x09"), (256, b"\1\0\0\0")], []),
-                                ("uuid", [], []),
-                                ("nexus_provider_record", [(64, b"en0\0", b"provider2"), (128, b"\0\0\0\0", b""), (256, b"\0\0\0\0")], [])],
-        "ring_stat_enable": [("ring_stat_enable", [], [])],
-        "nexus_channel_list": [("nexus_channel_header", [(16, b"\1\0\0\0")], []), ("channel_entry", [(32, b"\1\0\0\0\0\0\0\0")], []), ("ring_stats", [], [])],
-        "stats/arena": [("tv_stats_arena", [(0, b"host.example\0", b"arena1"), *((80 + 208 * i, b"r%d\0" % (i // 2), b"region%d" % (i // 2 + 1)) for i in range(11)),
-                                            (80 + 208 * 11 + 104, bytes(8)), (2584, bytes(4))], [(2368 + 84, 68), (2368 + 168, 40), (2588, 20)])],
-    }
 
-    def test_OnlyWhatTheManualListsSurvives(self):
-        noise = random.Random(1)
-        self.assertEqual({name for records in self.formats.values() for name, *_ in records} | {"tv_stats_region"}, RECORDS.keys())
-        for name, records in self.formats.items():
-            before = after = b""
-            for record, fields, gone in records:
-                mask = survives(record)
-                made = bytearray(noise.choices(range(1, 256), k=len(mask)))
-                for at, value, *_ in fields:
-                    made[at:at + len(value)] = value
-                expected = bytearray(byte * kept for byte, kept in zip(made, mask))
-                for at, width in gone:
-                    expected[at:at + width] = bytes(width)
-                for at, _, substitute in (field for field in fields if len(field) == 3):
-                    expected[at:at + len(substitute)] = substitute
-                before, after = before + made, after + expected
-            self.assertEqual(self.redacted({name: before})[name], after, name)
+class Redact(CaptureCase):
+    def setUp(self):
+        super().setUp()
+        self.shown, self.meant = {}, {}
 
-    def test_ReportsAreTheSameButForSubstitutes(self):
-        kernel, mapped = self.generate(), {}
-        self.capture(kernel.root, "--redact")
-        substitute = re.compile(r"(process|provider|arena|region|en|bridge)\d+|2(40|39)(\.\d+){3}|169\.254(\.\d+){2}|3fff::[\da-f]+|[\da-f:]+:3fff:0:0:[\da-f]+|0[23](:..){5}")
-        for command in commands:
-            live, redacted = (subprocess.run([tarvelctl, *command.split()], capture_output=True, text=True, env={**os.environ, "TARVEL_ROOT": str(root)}).stdout
-                              for root in (kernel.root, self.directory / "saved"))
-            self.assertEqual(live.count("\n"), redacted.count("\n"))
-            for original, shown in zip(live.split(), redacted.split(), strict=True):
-                found = substitute.search(shown)
-                self.assertTrue(shown == original or found and original.startswith(shown[:found.start()]) and original.endswith(shown[found.end():]), (command, original, shown))
-                self.assertEqual(mapped.setdefault(original, shown), shown)
-        self.assertEqual(len(set(mapped.values())), len(mapped))
+    def redact(self, name, table, err="", status=0):
+        for each in TABLES:
+            self.kernel.put(each, table if each == name else b"")
+        self.capture("--redact", err=err, status=status)
+        return self.saved.table(name)
 
-    def test_WhatCannotBeDecodedIsLeftOut(self):
-        secret = b"secret".ljust(64, b"\0")
-        head, entry = bytes(16) + struct.pack("<Q", 0xffffffff), bytes(32) + struct.pack("<IIQ", 1, 0, 0)
-        for name, table, kept in (("stats/flow", bytes(640) + secret * 4, 640), ("stats/flow_owner", secret, 0), ("stats/flow_route", secret, 0),
-                                  ("stats/arena", secret * 40, 0), ("nexus_channel_list", head + entry + bytes(184) + entry + secret, 24 + 232),
-                                  ("stats/netns", bytes(32) + b"secret".ljust(18, b"\0") + b"\2".ljust(14, b"\0") + secret[:63], 32),
-                                  ("stats/flow_adv", bytes(40) + secret[:36] + b"\xff" * 4 + secret, 40),
-                                  ("nexus_provider_list", secret * 4 + b"\xff" * 8 + secret, 0), ("ring_stat_enable", b"\1secret", 1)):
-            seen = self.redacted({name: table}, f"{name.replace('/', '.')} is cut")
-            self.assertEqual((len(seen[name]), b"secret" in seen[name]), (kept, False), name)
+    def match(self, what, was, now):
+        """The same stands for the same, and for nothing else."""
+        self.assertEqual((self.shown.setdefault((what, was), now), self.meant.setdefault((what, now), was)), (now, was))
+
+    def compare(self, name, before, after, silent=()):
+        """Each element of a table became what its kind says."""
+        old, new = ([leaf for each in walk(TABLES[name], table) for leaf in leaves(each)] for table in (before, after))
+        for (field, row, was), (_, _, now) in zip(old, new, strict=True):
+            kind, text = row["kind"], now.rstrip(b"\0")
+            if kind == "unread" or field in silent:
+                self.assertEqual(text, b"", field)
+            elif kind in KEPT:
+                self.assertEqual(now, was, field) if field != "name_length" else None
+            elif row["type"] == "text":
+                word = {"interface": "[a-z_]+", "process": kind}.get(kind, field[:6] if "." in field else re.split("[_/]", name)[1])
+                self.assertRegex(text.decode(), rf"^({word}\d+)?$")
+                self.match(word, was.split(b"\0")[0][:15 if kind == "process" else None], text)
+            else:
+                self.match(kind, *(each if any(each[4:]) else each[:4] for each in (was, now)))
+
+    def test_EveryFieldIsKeptReplacedOrCleared(self):
+        for name, *words in CASES:
+            chosen = {field: int(value) for field, _, value in (word.partition("=") for word in words) if value}
+            before = noisy(TABLES[name], chosen)
+            self.shown, self.meant = {}, {}
+            with self.subTest(name, chosen=chosen):
+                self.compare(name, before, self.redact(name, before), words)
+                self.assertEqual([key for key, now in self.shown.items() if now == key[1] != b""], [])
+
+
+    def test_TheManualNamesWhatIsKept(self):
+        page = re.findall(r"^\.It Vt (.*)\n((?:[^.].*\n)+)", (top / "docs/tarvellab.1").read_text(), flags=re.M)
+        manual = {record: set(re.findall(r"[\w.]+", fields)) for records, fields in page for record in records.split(" , ")}
+        for name, record in RECORDS.items():
+            for field, row in record["fields"].items():
+                if row["kind"] not in ("unread", "nested"):
+                    kept = row["kind"] in KEPT and field != "name_length"
+                    self.assertEqual(kept, bool({field, row["part"]} & manual[name]), (name, field))
 
     def test_NoOriginalIsLeftAnywhere(self):
-        made = self.generate("--flows", 300, "--seed", 3)
-        self.assertEqual(self.capture(made.root, "--redact", "--every", "0.05", "--count", 3), "")
-        originals, saved = set(), files(self.directory / "saved")
-        for records in map(made.records, TABLES):
-            for row, at in (place for record in records for place in record.find("type", "bytes")):
-                held = records[0].table[at:at + row["size"]].rstrip(b"\0")  # an IPv4 address of 16 bytes is the first 4
-                originals |= {held, held[-8:]}
-        originals = {original for original in originals if any(original[:-1])}  # all but unspecified, and the 1 of fe80::1
-        names = {path.read_bytes().strip() for path in made.root.glob("proc/*/comm")} | {b"com.example"}  # of arenas, ...
-        self.assertGreater(len(originals), 100)
-        self.assertGreater(len(names), 11)
-        self.assertEqual([(path, found) for path, content in saved.items() for found in originals | names if found in content], [])
-        self.assertIn(b"host: redacted\n", saved["capture.txt"])
-        # The same stand for the same, in every moment.
-        for moment in (self.directory / "saved/moments").iterdir():
-            self.assertEqual(files(moment / "proc"), files(self.directory / "saved/proc"))
+        made = generate(self.kernel.root, "--flows", 300, "--seed", 3)
+        self.capture("--redact --every .05 --count 3", err="")
+        for root in [self.saved.root, *self.moments()]:
+            for name in TABLES:
+                self.compare(name, made.table(name), Kernel(root).table(name))
+            for path in files(root / "proc"):
+                if "comm" in path:
+                    self.match("process", (made.root / "proc" / path).read_bytes()[:-1], (root / "proc" / path).read_bytes()[:-1])
+        originals = {each for what, was in self.shown if what != "[a-z_]+" for each in (was, was[-8:]) if any(each[:-1])}
+        self.assertGreater(len(originals), 200)
+        saved = b" ".join(files(self.saved.root).values())
+        self.assertEqual({each for each in originals | {b"com.example", HOST.encode()} if each in saved}, set())
+        # What was redacted stays so; what lies below it is another's.
+        for root in [self.saved.root, *self.moments()]:
+            seen = self.lab(f"capture {self.directory}/again{root.name}", environment={"TARVEL_ROOT": str(root)})
+            self.assertEqual(seen.err, "")
+            self.assertRegex((self.directory / f"again{root.name}/capture.txt").read_text(), "host: redacted\nredacted: yes\n$")
+        inside = generate(self.saved.root / "a/kernel")
+        self.assertIn("addresses", self.lab("capture other", kernel=inside).err)
+
+    def test_SubstitutesAreOfTheKindOfTheirOriginals(self):
+        for name, field, pairs in (
+                ("stats/netns", "address", """10.0.0.1 240.0.0.1 10.0.0.2 240.0.0.2 10.0.0.1 240.0.0.1 127.0.0.9 127.0.0.9 0.0.0.0
+                 0.0.0.0 255.255.255.255 255.255.255.255 224.0.0.251 239.0.0.1 169.254.7.7 169.254.0.1 169.253.0.1 240.0.0.3
+                 239.255.0.1 239.0.0.2 223.255.0.1 240.0.0.4 2001:db8::7 3fff::1 :: :: ::1 ::1 fe80:4::7 fe80:4::3fff:0:0:2
+                 fe80::7 fe80::3fff:0:0:2 febf::7 fe80::3fff:0:0:3 ff02:5::fb ff02:5::3fff:0:0:4 ff01:5::fb ff01:5::3fff:0:0:5
+                 ff05:5::fb ff05::3fff:0:0:6 fec0::7 3fff::7 ::ffff:10.0.0.2 ::ffff:240.0.0.2 ::2 3fff::8 1::1 3fff::9"""),
+                ("stats/flow_owner", "sfo_if_name", """en0 en1 en01 en2 EN0 if1 en if2 7 if3 enx00 if4 enp0s31f6 if5 bond0 bond1
+                 bridge9 bridge1 eth1 eth1 gif0 gif1 ipsec2 ipsec1 lo0 lo1 pdp_ip3 pdp_ip1 ppp0 ppp1 tap0 tap1 tun4 tun1 utun9
+                 utun1 vlan7 vlan1 wl0 wl1 wlan0 wlan1 wlan1 wlan2 en0 en1"""),
+                ("stats/flow_owner", "sfo_proc_name", """browser process1 com.example.bro process2 com.example.browser process2
+                 com.example.brO process3 Browser process4 browser process1"""),
+                ("nexus_provider_list", "name", "com.example.en0 provider1 en0 provider2 com.example.en0 provider1"),
+                ("stats/flow_route", "sfr_mac", """010203040506 030000000001 020203040506 020000000002 ffffffffffff ffffffffffff
+                 000000000000 000000000000 ffffffffff00 030000000003 010203040506 030000000001""")):
+            made = {"address": lambda text: {"address": text, "address_length": 16 if ":" in text else 4},
+                    "sfr_mac": lambda text: {"sfr_mac": bytes.fromhex(text), "sfr_flags": 0x80},
+                    "name": lambda text: {"name": text, "name_length": len(text)}}.get(field, lambda text: {field: text})
+            before, after = (b"".join(make(TABLES[name], **made(text)) for text in pairs.split()[at::2]) for at in (0, 1))
+            seen, expected = ([(what, data) for each in walk(TABLES[name], table) for what, row, data in leaves(each)
+                               if row["kind"] != "unread"] for table in (self.redact(name, before), after))
+            self.assertEqual(seen, expected)
+
+    def test_WhatCannotBeDecodedIsLeftOut(self):
+        secret, entry = b"secret".ljust(64, b"\0"), make("channel_entry", tx=[make("ring_stats")])
+        for name, table, kept in (
+                ("stats/flow", bytes(640) + secret * 4, 640), ("stats/flow_owner", secret, 0), ("stats/arena", secret * 40, 0),
+                ("nexus_channel_list", bytes(16) + b"\2".ljust(8, b"\0") + entry + secret[:40], 24 + len(entry)),
+                ("stats/netns", bytes(32) + make("netns", ranges=[secret[:32]])[:-1], 32),
+                ("stats/flow_adv", bytes(40) + secret[:36] + b"\xff" * 4 + secret, 40),
+                ("nexus_provider_list", secret * 4 + b"\xff" * 8 + secret, 0), ("ring_stat_enable", b"\1secret", 1)):
+            node = "kern.tarvel." + name.replace("/", ".")
+            seen = self.redact(name, table, f"tarvellab: {node} is cut: the rest of it cannot be redacted\n", 1)
+            self.assertEqual((len(seen), b"secret" in seen), (kept, False), name)
+            self.capture()
+            self.assertEqual(self.saved.table(name), table)
 
 
 if __name__ == "__main__":

@@ -118,6 +118,11 @@ def files(root):
     return {str(p.relative_to(root)): p.read_bytes() for p in sorted(pathlib.Path(root).rglob("*")) if p.is_file()}
 
 
+def remove(path):
+    """Whatever it is. What a link leads to stays."""
+    shutil.rmtree(path) if path.is_dir() and not path.is_symlink() else path.unlink()
+
+
 def limit_files(size):
     """For a process that is about to start: no file grows beyond a size."""
     resource.setrlimit(resource.RLIMIT_FSIZE, (size, resource.RLIM_INFINITY))
@@ -191,3 +196,11 @@ class Case(unittest.TestCase):
         run.wait("sleep ", len(tables))
         seen = run.end(signal.SIGINT)
         return seen._replace(out=TIME.sub("<time>", seen.out))
+
+
+class LabCase(Case):
+    """The lab, which sees `self.kernel` as its kernel, and stands in the folder of the test unless told otherwise."""
+
+    def lab(self, line, **options):
+        """What a run of it leaves behind."""
+        return self.start(line, tarvellab, **{"cwd": self.directory, **options}).end()
