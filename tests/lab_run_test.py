@@ -27,12 +27,14 @@ class Generate(LabCase):
 
     def test_SameSeedSameBytesAnotherSeedOthers(self):
         one, other = (files(generate(self.directory / str(seed), "--seed", seed).root) for seed in (7, 8))
-        self.assertEqual({path for path in one if NODES in path and one[path] == other[path]}, {NODES + "ring_stat_enable"})
+        same = {path for path in one if NODES in path and one[path] == other[path]}
+        self.assertEqual(same, {NODES + "ring_stat_enable"})
         for seed, made in (7, one), (8, other):  # nothing of what was there is left
             self.assertEqual(files(self.generate("--seed", seed).root), made)
 
     def test_TablesAgree(self):
-        for options in (("--rings", 3), ("--flows", 3000), ("--channels", 400, "--nexuses", 60), ("--processes", 1)):
+        for options in (("--rings", 3), ("--flows", 3000), ("--channels", 400, "--nexuses", 60), ("--processes", 1),
+                        ("--providers", 2400, "--channels", 3000, "--flows", 3000)):
             self.check(self.generate(*options))
         for size in "providers", "nexuses", "channels", "processes":  # nothing stands on nothing
             kernel = self.generate("--" + size, 0)
@@ -60,6 +62,8 @@ class Generate(LabCase):
             moved[flow["sf_nx_uuid"], flow["sf_nx_port"]] += flow["sf_lstats.bytes"]
             local, remote = flow["sf_local.ipv6"], flow["sf_remote.ipv6"]  # on one link
             self.assertTrue(local[:2] != b"\xfe\x80" or local[:4] == remote[:4] and any(local[2:4]))
+        homes = {(flow["sf_local.ipv4"], flow["sf_nx_uuid"]) for flow in flows if any(flow["sf_local.ipv4"])}
+        self.assertEqual(len(homes), len(dict(homes)))  # an address belongs to one interface
         for place, channel in ports.items():
             self.assertGreaterEqual(sum(ring["xfer.bytes"] for ring in channel["tx"]), moved[place])
         for owner in kernel.records("stats/flow_owner"):
@@ -82,8 +86,8 @@ class Generate(LabCase):
                     self.assertEqual((slots[0], rates[0]), (counted, sum(rates.values()) - rates[0]))
 
     def test_SizesAreKeptToTheLastRecord(self):
-        sizes = {"providers": (30, "nexus_provider_list"), "flows": (4000, "stats/flow"), "stacks": (90, "stats/userstack"),
-                 "arenas": (41, "stats/arena"), "namespaces": (25, "stats/netns")}
+        sizes = {"providers": (30, "nexus_provider_list"), "flows": (4000, "stats/flow"), "arenas": (41, "stats/arena"),
+                 "namespaces": (25, "stats/netns"), "stacks": (90, "stats/userstack")}
         kernel = self.generate("--nexuses", 77, "--channels", 500, "--processes", 50, "--rings", 0,
                                *(word for name in sizes for word in ("--" + name, sizes[name][0])))
         instances = sum(len(each["instances"]) for each in kernel.records("nexus_provider_list"))
@@ -93,17 +97,23 @@ class Generate(LabCase):
             self.assertEqual((len(kernel.records(table)), empty.table(table)), (count, b""))
 
     def test_WrongWordsAreUsageErrors(self):
-        for words in ("""|nothing|run|run --|run a --flows 1 -- true|run a b -- true|generate|generate a b|generate ''
-                |generate a --flows|generate a --flows -1|generate a --flows 1x|generate a --flows 99999999999|generate a --
-                |generate a --flows 10000001|generate a --rings 1025|generate a --seed x|generate --seed 1
-                |generate a --interval 50|generate a --every 1|generate a --count 1|generate a --redact
-                |simulate a --interval 9|simulate a --interval 3600001|simulate a --redact|capture|capture a b
-                |capture a --seed 1|capture --redact|capture --every 1 a|capture --count 2 a|capture a --count 2 --every
-                |capture --every 1 --count 0 a|capture --every 1 --count 10000001 a|capture --every 1 --count a|capture a
-                --every """ + " --count 2|capture a --every ".join("0 0.009 3601 -1 nan inf 1e1 1s ''".split())).split("|"):
+        wrong = """
+|nothing|run|run --|run a --flows 1 -- true|run a b -- true|generate|generate a b|generate ''|generate a --
+|generate a --flows|generate a --flows -1|generate a --flows 1x|generate a --flows 10000001
+|generate a --flows 99999999999|generate a --seed x|generate a --seed 18446744073709551616|generate a --rings 1025
+|generate a --interval 50|generate a --every 1|generate a --count 1|generate a --redact|generate --seed 1
+|simulate a --interval 9|simulate a --interval 3600001|simulate a --redact|capture|capture a b|capture a --seed 1
+|capture --redact|capture --every 1 a|capture --count 2 a|capture a --count 2 --every|capture --every 1 --count 0 a
+|capture --every 1 --count 10000001 a|capture --every 1 --count a"""
+        seconds = "0", "0.009", "3600.01", "-1", "nan", "inf", "1e1", "1s", "''"
+        for words in wrong.replace("\n", "").split("|") + [f"capture a --count 2 --every {each}" for each in seconds]:
             seen = self.lab(words)
             self.assertEqual((seen.out, seen.err[:7], seen.status), ("", "usage:\n", 64), words)
         self.assertEqual([*self.directory.iterdir()], [])
+        for words in ("generate a --seed 0", "generate a --seed 18446744073709551615", "generate a --rings 1024",
+                      "generate a --channels 0 --flows 10000000", "run --interval 3600000 -- true",
+                      "capture b --every 0.01 --count 1", "capture c --every 3600 --count 10000000"):
+            self.assertNotEqual(self.lab(words).status, 64, words)
 
     def test_WhatCannotBeWrittenIsNamed(self):
         made = self.kernel.root
@@ -202,13 +212,16 @@ class Run(LabCase):
                  self.start(["-c", "cat /proc/[0-9]*/environ 2>&1"], "/bin/sh").end().out)
 
     def test_EndsAsTheCommandDid(self):
+        def ignore():
+            for number in signal.SIGCHLD, signal.SIGTERM:
+                signal.signal(number, signal.SIG_IGN)
         for status, *command in ((0, "true"), (7, "sh", "-c", "exit 7"), (-9, "sh", "-c", "kill -KILL $$"),
                                  (-15, "env", "--default-signal=TERM", "sh", "-c", "kill -TERM $$"),
                                  (127, "no-such-command"), (126, "/dev/null")):
-            for ignored in (), (signal.SIGCHLD, signal.SIGTERM):  # by the caller
-                seen = self.run_lab("--", *command, preexec_fn=lambda: [signal.signal(n, signal.SIG_IGN) for n in ignored])
-                self.assertEqual(seen.end().status, status, command)
-        self.assertEqual(self.run_lab("none", "--", "true").end(), ("", "tarvellab: none: No such file or directory\n", 1))
+            for prepare in None, ignore:
+                seen = self.run_lab("--", *command, preexec_fn=prepare).end()
+                self.assertEqual(seen.status, status, command)
+        self.assertEqual(self.lab("run none -- true"), ("", "tarvellab: none: No such file or directory\n", 1))
 
     def test_ACommandGetsWhatItsCallerHas(self):
         def prepare():
@@ -225,7 +238,8 @@ class Run(LabCase):
 
     def test_TemporaryDirectoryIsTheCallersOrTheSystems(self):
         for name, parent in (self.temporary, self.temporary), ("", "/tmp"), (".", f"{self.directory}/."):
-            seen = self.run_lab("--", "sh", "-c", "stat -c '%n %a' $TARVEL_ROOT", environment={"TMPDIR": str(name)}).end()
+            words = "--", "sh", "-c", "stat -c '%n %a' $TARVEL_ROOT"
+            seen = self.run_lab(*words, environment={"TMPDIR": str(name)}).end()
             self.assertRegex(seen.out, f"^{parent}/tarvellab-...... 700\n$")
             self.assertFalse(os.path.exists(seen.out.split()[0]))
         seen = self.run_lab("--", "true", environment={"TMPDIR": "/none"}).end()
@@ -258,7 +272,7 @@ class Run(LabCase):
     def test_SignalsArePassedOn(self):
         for number in signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGQUIT:
             for trap, status in (f"trap 'exit 9' {int(number)}; ", 9), ("", -number):
-                run = self.run_lab("--interval", 20, "--", "sh", "-c", trap + "echo ready; while :; do sleep 0.01; done")
+                run = self.run_lab("--interval", 20, "--", "sh", "-c", trap + "echo ready; while :; do sleep .01; done")
                 run.wait("ready")
                 self.assertEqual(run.end(number).status, status)
 
@@ -269,8 +283,8 @@ class Run(LabCase):
 
     def test_TheTerminalInterruptsTheCommandOnceAndTheSimulationNever(self):
         script = f"""n=0; trap 'n=$((n+1))' INT; echo ready; while [ $n = 0 ]; do sleep .01; done
-            for each in 1 2 3; do i=$(stat -c %Y%i $TARVEL_ROOT/{NODES}stats/flow)
-            until [ $i != $(stat -c %Y%i $TARVEL_ROOT/{NODES}stats/flow) ]; do sleep .01; done; done; echo moved, $n times"""
+            f=$TARVEL_ROOT/{NODES}stats/flow; for each in 1 2 3; do i=$(stat -c %i $f)
+            until [ $i != $(stat -c %i $f) ]; do sleep .01; done; done; echo moved, $n times"""
         process, terminal = pty.fork()
         if process == 0:
             os.environ["TMPDIR"] = str(self.temporary)

@@ -76,7 +76,8 @@ class Strangers(LabCase):
             shutil.rmtree(self.place / below)
             (self.place / below).symlink_to(self.victim / target)
             reasons = "Not a directory", "no part of a capture"
-            self.assertLessEqual(self.said(self.place, MAKING), {f"tarvellab: {self.place / below}: {each}\n" for each in reasons})
+            said = {f"tarvellab: {self.place / below}: {reason}\n" for reason in reasons}
+            self.assertLessEqual(self.said(self.place, MAKING), said)
             shutil.rmtree(self.place)
         self.assertEqual(self.listing(), self.before)
         self.kernel.path("stats/flow").unlink()
