@@ -42,19 +42,17 @@ class Strangers(LabCase):
                 runs[-1].process.wait(seconds)
         return {run.end(signal.SIGINT).err for run in runs}
 
-    @contextlib.contextmanager
-    def meanwhile(self, act):
-        """The stranger acts again and again; what fails now may work the next time."""
+    def stranger(self, *acts):
+        """A child that acts again and again; what fails now may work the next time."""
         child = os.fork()
-        while child == 0:
-            with contextlib.suppress(OSError):
-                os.getuid() or (os.setgroups([]), os.setgid(STRANGER), os.setuid(STRANGER))
-                act()
-        try:
-            yield
-        finally:
-            os.kill(child, signal.SIGKILL)
-            os.waitpid(child, 0)
+        if child:
+            self.addCleanup(os.waitpid, child, 0)
+            self.addCleanup(os.kill, child, signal.SIGKILL)
+        while not child:
+            os.getuid() or (os.setgroups([]), os.setgid(STRANGER), os.setuid(STRANGER))
+            for act in acts:
+                with contextlib.suppress(OSError):
+                    act()
 
     def test_WhatIsNotTheCallersAloneIsRefused(self):
         self.assertEqual(self.said(self.theirs, ALL), {f"tarvellab: {self.theirs}: belongs to another user\n"})
@@ -84,49 +82,46 @@ class Strangers(LabCase):
         os.mkfifo(self.kernel.path("stats/flow"))
         self.assertEqual(self.said(self.kernel.root, ["generate {}"]), {""})
 
-    def test_NothingReachesAPlaceThatIsExchangedMeanwhile(self):
+    def test_NothingReachesOrShowsWhatIsExchangedMeanwhile(self):
         place, aside = self.theirs / "place", self.theirs / "aside"
+        kernel = Kernel(shutil.copytree(self.kernel.root, self.theirs / "kernel"))
+        aside.mkdir()
+        for path in self.theirs.rglob("*"):
+            os.chown(path, STRANGER, STRANGER)
+        folder, table = kernel.path(""), kernel.path("nexus_provider_list")
 
-        def exchange():
-            aside.mkdir(exist_ok=True)
+        def exchange_place():
             with contextlib.suppress(OSError):
                 place.rename(aside / os.urandom(4).hex())
-            os.symlink(self.victim, place)
+            place.symlink_to(self.victim)
             place.unlink()
             place.mkdir()
             (place / "proc").symlink_to(self.victim)
             shutil.rmtree(place)
-        with self.meanwhile(exchange):
-            for _ in range(12):
-                self.said(place, ALL, seconds=.3)
-        self.assertEqual(self.listing(), self.before)
-        for path in self.theirs.rglob("*"):
-            if path.lstat().st_uid == 0:  # made by the lab: closed to others, in nothing of theirs but the named place
-                self.assertEqual(path.lstat().st_mode & 0o777, 0o700 if path.is_dir() else 0o600, path)
-                self.assertTrue(path.parent in (self.theirs, aside) or path.parent.lstat().st_uid == 0, path)
 
-    def test_AStrangersKernelShowsNothingButItsOwnFiles(self):
-        kernel = Kernel(shutil.copytree(self.kernel.root, self.theirs / "kernel"))
-        for path in self.theirs.rglob("*"):
-            os.chown(path, STRANGER, STRANGER)
-        folder, name = kernel.path(""), "nexus_provider_list"
+        def exchange_table(plant):
+            plant(folder / "new")
+            (folder / "new").rename(table)
 
-        def exchange():
-            for plant in os.mkfifo, lambda path: path.symlink_to(self.victim / name):
-                with contextlib.suppress(OSError):
-                    plant(folder / "new")
-                    (folder / "new").rename(folder / name)
+        def exchange_folder():
             folder.rename(folder.with_name("aside"))
             folder.symlink_to(self.victim)
             folder.unlink()
             folder.with_name("aside").rename(folder)
+        self.stranger(exchange_place, lambda: exchange_table(os.mkfifo), exchange_folder,
+                      lambda: exchange_table(lambda path: path.symlink_to(self.victim / table.name)))
         seen = ""
-        with self.meanwhile(exchange):
-            for number in range(60):
-                seen += self.start("provider", kernel=kernel).end().out
-                self.said(self.directory / f"saved{number}", ["capture {}"], kernel)
-        saved = b"".join(content for path, content in files(self.directory).items() if path.startswith("saved"))
+        for number in range(60):
+            seen += self.start("provider", kernel=kernel).end().out
+            self.said(self.directory / f"saved{number}", ["capture {}"], kernel)
+            self.said(place, [ALL[number % 5]], seconds=.3)
+        saved = [content for path, content in files(self.directory).items() if path.startswith("saved")]
         self.assertNotIn("secret", seen + str(saved))
+        self.assertEqual(self.listing(), self.before)
+        for path in [*place.rglob("*"), *aside.rglob("*")]:
+            if path.lstat().st_uid == 0:  # made by the lab: closed to others, in nothing of theirs but the named place
+                self.assertEqual(path.lstat().st_mode & 0o777, 0o700 if path.is_dir() else 0o600, path)
+                self.assertTrue(path.parent in (self.theirs, aside) or path.parent.lstat().st_uid == 0, path)
 
 
 if __name__ == "__main__":
