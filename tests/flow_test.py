@@ -8,7 +8,7 @@ sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
 from records import make  # noqa: E402
 from runs import Case, Result, aborted, name_services  # noqa: E402
 
-NEXUS, OTHER = "FEDCBA98-7654-3210-0123-456789ABCDEF", "00112233-4455-6677-8899-AABBCCDDEEFF"
+NEXUS, OTHER = "FEDCBA98-7654-3210-0123-456789ABCDEF", "FEDCBA98-7654-3210-0123-456789ABCDE0"
 LONG6 = "fd11:1111:2222:3333:4444:5555:6666:7777"
 FLOWS = ("Proto Local Address                               Remote Address                              "
          "InBytes      OutBytes     InPackets  OutPackets SvC NetIf    Port Adv Flags          "
