@@ -1,120 +1,98 @@
 #!/usr/bin/env python3
-"""Runs the fuzz targets, each from seeds that the lab makes and from every input that once was a finding.
+"""Runs the fuzzer, from commands over tables of the lab and from every input that once was a finding.
 
-In the short form each target runs for a few seconds. In the long form all of them share 100 million executions. The
-inputs that widen the coverage are kept in the folder `corpus` beside the targets, where the next run begins.
+The short form does the same each time. In the long one, processes share 60 million executions, and what widens the
+coverage is kept in the folder `corpus` beside the fuzzer, where the next run begins.
 """
-
 import argparse
 import concurrent.futures
+import os
 import pathlib
 import re
 import struct
 import subprocess
 import sys
 import tempfile
+import uuid
 
-# The tables of each target: the one that is fuzzed and those that go with it.
-TABLES = {
-    "provider": ("nexus_provider_list", "nexus_channel_list", "stats/flow"),
-    "channel": ("nexus_channel_list", "nexus_channel_list", "nexus_provider_list"),
-    "flow": ("stats/flow", "nexus_provider_list", "nexus_channel_list"),
-    **{name: ("stats/" + name,) for name in
-       ("flow_adv", "flow_owner", "flow_route", "userstack", "net_if", "flow_switch", "arena", "netns")},
+# The nodes as common/tables/tables.h has them, below kern.tarvel.
+NODES = ("nexus_provider_list nexus_channel_list ring_stat_enable stats.flow stats.flow_adv stats.flow_owner "
+         "stats.flow_route stats.net_if stats.flow_switch stats.userstack stats.netns stats.arena").split()
+# Which commands read them, the last one above all; "@" stands for the UUID at its start.
+COMMANDS = {
+    "nexus_channel_list stats.flow nexus_provider_list": "provider;list-providers --details;tree;tree @;show",
+    "nexus_provider_list nexus_channel_list nexus_channel_list": "-w 1 channel;channel;-w 7 channel;tree @;show -w",
+    "nexus_provider_list nexus_channel_list stats.flow": "flow;flow -n -- -w;tree;channel-stats x;netstat -ap tcp",
+    "stats.flow": "netstat -an --uuid @;netstat -a --pid 94;netstat -a --protocol",
+    "stats.flow_adv": "-f out flow-adv;netstat --flow-adv;NETSTAT --flow-adv --uuid @ --pid 94",
+    "stats.flow_owner": "flow-owner;-w 1 netstat --flow-owner;netstat --flow-owner --pid 94",
+    "stats.flow_route": "flow-route;flow-route -n",
+    "stats.userstack": "netstat -s;netstat -sp udp;netstat -s --show-zeros;netstat -s --global;netstat -s --pid 94",
+    "stats.net_if": "interface;netstat --netif;netstat --netif --show-zeros;netstat --netif --global -f",
+    "stats.flow_switch": "flow-switch;netstat --flowswitch --show-zeros;netstat --flowswitch --global",
+    "stats.arena": "memory;-w 1 memory;-w x memory",
+    "stats.netns": "netns;netns -a;netns -ap tcp;netns -i global -p tcp;netns --ip=fe80::1 --proto udp;netns -i 1.2.3.4",
 }
-SIZES = [dict(providers=2, nexuses=1, channels=1, rings=1, flows=1, stacks=1, arenas=1, namespaces=1, processes=1),
-         dict(providers=4, nexuses=3, channels=3, rings=2, flows=4, stacks=1, arenas=1, namespaces=3, processes=2)]
-COMMAND_LINES = ["provider -D", "tree 00000000-0000-0000-0000-000000000000", "netstat -ansp tcp --show-zeros",
-                 "netns -i global -p udp", "netns --ip=10.0.0.1 --proto tcp", "-w 1 channel", "-f out memory",
-                 "flow -n -- -w", "NETSTAT --uuid x --pid 3 --wait 1", "show -w", "list-providers --details -f",
-                 "flow-adv", "flow-owner", "flow-route -n", "interface", "flow-switch", "channel-stats extra", "-w x"]
-# Executions of each target in the long form: fewer where a record fills pages.
-LONG = {"print": 40_000_000, "arguments": 12_000_000, "capture": 1_000_000,
-        **{name: 3_000_000 if name in ("provider", "channel", "flow", "userstack", "arena") else 6_000_000
-           for name in TABLES}}
-CHUNK = 500_000  # executions of a process, which keeps what it has seen of memory regions and code
+KINDS = "providers nexuses channels rings flows stacks arenas namespaces processes".split()
+SIZES = (2, 1, 1, 1, 1, 1, 1, 1, 1), (4, 3, 3, 2, 4, 1, 1, 3, 2)
 
 
-def table_seeds(lab, name):
-    for seed, sizes in enumerate(SIZES):
-        with tempfile.TemporaryDirectory() as root:
-            options = [word for what, count in sizes.items() for word in (f"--{what}", str(count))]
-            subprocess.run([lab, "generate", root, "--seed", str(seed), *options], check=True)
-            first, *more = [(pathlib.Path(root) / "proc/sys/kern/tarvel" / node).read_bytes() for node in TABLES[name]]
-        more += [b""] * (2 - len(more))
-        for command in range(8):
-            yield struct.pack("<BBBBHH", command, command % 8, 1, command, *map(len, more)) + b"".join(more) + first
-            yield struct.pack("<BBBBHH", command, 0, 1, 0, 0, 0) + first[:-1]
+def generated(lab, seed, sizes):
+    """The tables that the lab makes, in the order of the nodes."""
+    options = [word for kind, size in zip(KINDS, sizes) for word in (f"--{kind}", str(size))]
+    with tempfile.TemporaryDirectory() as root:
+        subprocess.run([lab, "generate", root, "--seed", str(seed), *options], check=True)
+        folder = pathlib.Path(root) / "proc/sys/kern/tarvel"
+        return [(folder / node.replace(".", "/")).read_bytes() for node in NODES]
 
 
-def capture_seeds():
-    """A capture with a second moment, as steps: what, where, name, how; then the same with each step changed."""
-    tree = [(1, 0, 7, 0), *((0, i, i, 1) for i in range(5)), (1, 5, 5, 0), (0, 0, 8, 1), (0, 6, 9, 1), (5, 7, 0, 0)]
-    for changed in range(len(tree) + 1):
-        for what in 2, 3, 4:
-            steps = [(what, *step[1:3], 33) if i == changed else step for i, step in enumerate(tree)]
-            yield bytes(sum(steps + [(2, 0, 7, 2)] * (32 - len(steps)), ())) + b"format: 1\nhost: a\ntime: b\nredacted: yes\n"
+def inputs(tables):
+    """As fuzz.cpp reads them: each command over whole tables and over a cut one."""
+    for nodes, commands in COMMANDS.items():
+        chosen = [NODES.index(node) for node in nodes.split()]
+        *others, last = (tables[node] for node in chosen)
+        others = [b""] * (2 - len(others)) + others
+        chosen = [0] * (3 - len(chosen)) + chosen
+        first = str(uuid.UUID(bytes=last[:16].ljust(16)))
+        for turn, command in enumerate(commands.split(";")):
+            words = ["tarvelctl", *command.replace("@", first).split()]
+            line = "".join(word + "\0" for word in words).encode()
+            for surroundings, table in (2 * turn + 1, last), (2 * turn, last[:-1]):
+                start = struct.pack("<3H4B", *map(len, (line, *others)), *chosen, surroundings)
+                yield b"".join([start, line, *others, table])
 
 
-def seeds(lab, name):
-    if name == "capture":
-        yield from capture_seeds()
-    elif name == "arguments":
-        yield from (b"\0" + "\0".join(["tarvelctl", *line.split()]).encode() for line in COMMAND_LINES)
-    elif name == "print":
-        yield from (struct.pack("<Bq", kind, value) for kind in range(64) for value in (0, 1, -1, 1 << 62))
-    else:
-        yield from table_seeds(lab, name)
-
-
-def execute(target, limits):
-    """Returns the executions done, those per second, and what was found."""
-    corpus = target.parent / "corpus" / target.name
-    kept = pathlib.Path(__file__).parent / "findings" / target.name
-    options = ["-max_len=6000", "-timeout=5", "-rss_limit_mb=1024", "-malloc_limit_mb=64", "-entropic=0", "-print_final_stats=1",
-               f"-artifact_prefix={target.parent}/finding-{target.name}-"]
-    done = subprocess.run([target, *options, *limits, corpus, *([kept] if kept.is_dir() else [])],
-                          stderr=subprocess.PIPE, stdout=subprocess.DEVNULL, text=True, errors="replace")
-    count = re.search(r"number_of_executed_units: (\d+)", done.stderr)
-    speed = re.search(r"average_exec_per_sec: *(\d+)", done.stderr)
-    return int(count[1]) if count else 0, int(speed[1]) if speed else 0, done.stderr if done.returncode else ""
-
-
-def fuzz(lab, folder, name, seconds):
-    target = folder / f"fuzz_{name}"
-    corpus = folder / "corpus" / target.name
-    corpus.mkdir(parents=True, exist_ok=True)
-    for number, seed in enumerate(seeds(lab, name)):
-        (corpus / f"seed-{number}").write_bytes(seed)
-    wanted, runs, slowest, findings = LONG[name], 0, None, 0
-    while not findings and runs < (1 if seconds else wanted):
-        limits = [f"-max_total_time={seconds}"] if seconds else [f"-runs={min(CHUNK, wanted - runs)}"]
-        executed, speed, found = execute(target, limits)
-        runs += executed
-        slowest = min(slowest or speed, speed)
-        if found:
-            findings += 1
-            print(f"{name}: {found[-4000:]}", flush=True)
-        if not seconds and runs < wanted:
-            print(f"{name}: {runs} runs so far", flush=True)
-    print(f"{name}: {runs} runs, {slowest} a second at the slowest, {findings} findings", flush=True)
-    return runs, findings
+def execute(fuzzer, seed, runs, first, *corpus):
+    """Returns the executions done, and whether those were all."""
+    options = [f"-seed={seed}", f"-runs={runs}", f"-seed_inputs={','.join(map(str, first))}", "-shuffle=0", "-reload=0",
+               "-entropic=0", "-max_len=6000", "-timeout=5", "-rss_limit_mb=1024", "-malloc_limit_mb=64",
+               "-print_final_stats=1", f"-artifact_prefix={fuzzer}-finding-"]
+    done = subprocess.run([fuzzer, *options, *corpus], stdout=subprocess.DEVNULL, stderr=subprocess.PIPE, text=True,
+                          errors="replace")
+    executed, speed = re.findall(r"^stat::(?:number_of_executed|average_exec)\w+: +(\d+)", done.stderr, re.M)
+    print(f"seed {seed}: {executed} runs, {speed} a second", done.stderr[-4000:] * bool(done.returncode), flush=True)
+    return int(executed), done.returncode == 0
 
 
 def main():
     parser = argparse.ArgumentParser(description=__doc__)
+    parser.add_argument("fuzzer", type=pathlib.Path)
     parser.add_argument("lab")
-    parser.add_argument("folder", help="where the targets are", type=pathlib.Path)
     parser.add_argument("--long", action="store_true")
-    parser.add_argument("--seconds", type=int, default=2, help="of each target, in the short form")
-    parser.add_argument("--jobs", type=int, default=1)
-    parser.add_argument("--only", nargs="*", default=[*TABLES, "arguments", "print", "capture"])
     options = parser.parse_args()
-    with concurrent.futures.ThreadPoolExecutor(options.jobs) as pool:
-        results = list(pool.map(lambda name: fuzz(options.lab, options.folder.resolve(), name,
-                                                  None if options.long else options.seconds), options.only))
-    runs, findings = map(sum, zip(*results))
-    print(f"fuzz: {runs} runs, 0 faults injected, {findings} findings")
+    processes, runs, corpus = 1, 100_000, []
+    if options.long:  # a process keeps what it has seen of code and memory, so there are many
+        processes, runs, corpus = 120, 500_000, [options.fuzzer.with_name("corpus")]
+        corpus[0].mkdir(exist_ok=True)
+    first = sorted((pathlib.Path(__file__).parent / "findings").glob("*"))
+    with tempfile.TemporaryDirectory() as folder, concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
+        made = (content for seed, sizes in enumerate(SIZES) for content in inputs(generated(options.lab, seed, sizes)))
+        for number, content in enumerate(made):
+            first.append(pathlib.Path(folder) / f"{number}")
+            first[-1].write_bytes(content)
+        done = list(pool.map(lambda seed: execute(options.fuzzer, seed, runs, first, *corpus), range(1, processes + 1)))
+    executed, findings = sum(count for count, _ in done), sum(not whole for _, whole in done)
+    print(f"fuzz: {executed} runs, 0 faults injected, {findings} findings")
     sys.exit(findings > 0)
 
 
