@@ -1,5 +1,6 @@
 // Saves what a process has covered also where it ends without running its exit handlers, or becomes another program.
 
+#include <stddef.h>
 #include <sys/resource.h>
 #include <unistd.h>
 
@@ -12,12 +13,12 @@ int __real_execv(const char *path, char *const argv[]);
 int __real_execvp(const char *file, char *const argv[]);
 
 // Defined where calls fail on demand.
-__attribute__((weak)) void disarm_faults(void);
+extern __attribute__((weak)) unsigned *call_counts;
 
 // Lets the files be written, whatever the test has done to the process. Runs also before they are written at exit().
 __attribute__((destructor(101))) static void prepare(void) {
   struct rlimit size;
-  if (disarm_faults) disarm_faults();
+  if (&call_counts) call_counts = NULL;
   getrlimit(RLIMIT_FSIZE, &size);
   size.rlim_cur = size.rlim_max;
   setrlimit(RLIMIT_FSIZE, &size);

@@ -1,6 +1,7 @@
 """What the drivers share: their options, kernels to damage, runs of the tool, and the account of what they found."""
 import argparse
 import os
+import pathlib
 import random
 import shutil
 import sys
@@ -46,5 +47,6 @@ class Driver:
     def end(self):
         """Tells the account and ends the process."""
         shutil.rmtree(self.directory, ignore_errors=True)
-        print(f"seed {self.options.seed}: {self.runs} runs, {self.faults} faults injected, {self.findings} findings")
+        print("seed", self.options.seed)
+        print(f"{pathlib.Path(sys.argv[0]).stem}: {self.runs} runs, {self.faults} faults injected, {self.findings} findings")
         sys.exit(self.findings > 0)
