@@ -8,7 +8,7 @@ build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase
 package_packages=(dpkg-dev file)
 test_packages=(clang-14 libclang-rt-14-dev zsh fish "${package_packages[@]}")
 cross_packages=(g++-aarch64-linux-gnu qemu-user)
-lint_packages=(clang-format clang-tidy shellcheck mandoc)
+lint_packages=(clang-format clang-tidy flake8 shellcheck mandoc)
 
 # Installs those of the named Debian packages that are missing. Silent when none is, and on systems whose packages
 # have other names.
