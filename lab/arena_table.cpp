@@ -33,7 +33,7 @@ struct region_shape {
 };
 
 // By region type.
-constexpr region_shape shapes[tv_stats_arena::region_slots] = {
+constexpr region_shape region_shapes[tv_stats_arena::region_slots] = {
     {channel_scope, no_redirect | map_ok | read_only | monolithic, 2904, 1, 64, 16384, false},
     {channel_scope, map_ok, 12'440, 4, 64, 32768, false},
     {nexus_scope, map_ok | persistent, 2048, 2000, 128, 65536, true},
@@ -69,7 +69,7 @@ std::uint64_t rounded_up(std::uint64_t value, std::uint64_t step) {
 // The state of a region follows from whose it is, so that all arenas that have it show the same.
 tv_stats_region region_of(const world &state, std::size_t type, const uuid &owner,
                           const std::string &owner_name) {
-  const region_shape &shape = shapes[type];
+  const region_shape &shape = region_shapes[type];
   std::uint64_t key;
   std::memcpy(&key, owner.bytes, sizeof key);
   random_source random(state.seed, 16 + type, key);
@@ -114,7 +114,7 @@ void put_arena(const world &state, const arena_parts &parts, const arena_owner &
   set_text(arena.name, owner.names[channel_scope]);
   arena.type = parts.type;
   for (std::size_t type = 0; type < tv_stats_arena::region_slots; ++type) {
-    const scope shared = shapes[type].shared;
+    const scope shared = region_shapes[type].shared;
     if ((parts.regions >> type & 1) == 0) continue;
     arena.regions[type] = region_of(state, type, owner.ids[shared], owner.names[shared]);
   }

@@ -7,7 +7,7 @@ namespace lab {
 
 namespace {
 
-constexpr std::uint32_t on_link = route_flag_names.bit("o");
+constexpr std::uint32_t has_no_gateway = route_flag_names.bit("o");
 constexpr std::uint32_t resolved = route_flag_names.bit("r");
 
 constexpr std::uint32_t lifetime = 1200;  // seconds
@@ -39,7 +39,7 @@ void write_routes(const world &state, table_file &file) {
     // It is resolved anew from time to time; shortly before, there is no one to send frames to.
     const std::uint64_t age = state.elapsed / 1000 + random.below(lifetime);
     record.sfr_expire = lifetime - static_cast<std::int64_t>(age % lifetime);
-    record.sfr_flags = way.on_link ? on_link : tv_stats_flow_route::has_gateway;
+    record.sfr_flags = way.on_link ? has_no_gateway : tv_stats_flow_route::has_gateway;
     if (!way.on_link) record.sfr_gateway = gateway_address(carrier.ordinal, way.kind != address_kind::ipv4);
     if (record.sfr_expire > lifetime / 20) {
       record.sfr_flags |= resolved | tv_stats_flow_route::has_mac;

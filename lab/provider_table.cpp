@@ -21,22 +21,22 @@ struct provider_shape {
   std::int32_t mhints;
 };
 
-constexpr std::uint32_t flow_switch = nexus_types.number("flow-switch");
-constexpr std::uint32_t user_pipe = nexus_types.number("user-pipe");
+constexpr std::uint32_t flow_switch_type = nexus_types.number("flow-switch");
+constexpr std::uint32_t user_pipe_type = nexus_types.number("user-pipe");
 
 // By nexus_kind.
-constexpr provider_shape shapes[] = {
-    {flow_switch, flow_switch_subtypes.number("multistack"), 0, 512, 1024, 512, 1},
+constexpr provider_shape provider_shapes[] = {
+    {flow_switch_type, flow_switch_subtypes.number("multistack"), 0, 512, 1024, 512, 1},
     {nexus_types.number("net-if"), 0, 0, 512, 512, 512, 0},
-    {flow_switch, flow_switch_subtypes.number("bridge"), 0, 1024, 1024, 512, 0},
-    {user_pipe, 0, 0, 256, 256, 128, 0},
+    {flow_switch_type, flow_switch_subtypes.number("bridge"), 0, 1024, 1024, 512, 0},
+    {user_pipe_type, 0, 0, 256, 256, 128, 0},
     {nexus_types.number("kernel-pipe"), 0, 0, 256, 512, 512, 2},
-    {user_pipe, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
+    {user_pipe_type, 0, nexus_provider_parameters::anonymous, 128, 128, 128, 0},
 };
-static_assert(std::size(shapes) == nexus_kinds);
+static_assert(std::size(provider_shapes) == nexus_kinds);
 
 nexus_provider_parameters parameters_of(const world &state, const provider &source) {
-  const provider_shape &shape = shapes[static_cast<int>(source.kind)];
+  const provider_shape &shape = provider_shapes[static_cast<int>(source.kind)];
   const std::string name = registered_name(source.kind, source.ordinal);
   nexus_provider_parameters made{};
   set_text(made.name, name);

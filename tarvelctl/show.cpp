@@ -25,7 +25,7 @@ void for_each_child(const object_tree &tree, const object_node &node, object_typ
   }
 }
 
-void print_flow(const tv_stats_flow &flow) {
+void print_ends(const tv_stats_flow &flow) {
   const bool has_family = flow.visit_addresses([&](const auto &local, const auto &remote) {
     print<"\t\t %s.%d <-> %s.%d\n">(local, static_cast<int>(ntohs(flow.sf_local.port)), remote,
                                     static_cast<int>(ntohs(flow.sf_remote.port)));
@@ -38,7 +38,7 @@ void print_port(const object_tree &tree, const object_node &node, process_names 
   if (channel.port < first_client_port) return;
   const char *status = channel.flags & channel.defunct ? highlight("defunct", colour::red) : "";
   print<"\tPort[%2u] %-22s%s\n">(channel.port, owners.of(channel.pid), status);
-  tree.for_each_flow(node, print_flow);
+  tree.for_each_flow(node, print_ends);
 }
 
 void print_flow_switches(const object_tree &tree, const object_node &provider, process_names &owners) {
