@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
-"""Tests of the completions, typed into the shells themselves.
+"""Tests of the completions, typed into those shells that are here.
 
-usage: completions_test.py SHELL SCRIPT PROGRAM_DIRECTORY [unittest options]
+usage: completions_test.py BUILD [unittest options]
 """
 import os
 import pathlib
@@ -16,155 +16,120 @@ import tempfile
 import unittest
 import uuid
 
-shell, script, programs = sys.argv[1:4]
-del sys.argv[1:4]
+build = pathlib.Path(sys.argv.pop(1)).resolve()
+shells = [shell for shell in ("bash", "zsh", "fish") if shutil.which(shell)]
 
 # Beside its two providers, the kernel has names that would like to be commands, or to be taken for other lines.
 ids = [str(uuid.UUID(int=0xABCDEF << 100 | number)).upper() for number in range(4)]
-names = ["$(touch hurt)`touch hurt`;touch hurt\n\tinstance $(touch hurt)", f'x",\n"uuid":"$(touch hurt)",\n"uuid":"{ids[0]}'[:64]]
-tree_ids, nexus_ids = sorted(ids), sorted(ids[2:])
+names = ["$(touch hurt)`touch hurt`;touch hurt\n\tinstance $(touch hurt)",
+         f'x",\n"uuid":"$(touch hurt)",\n"uuid":"{ids[0]}'[:64]]
+providers = b"".join(uuid.UUID(provider).bytes + bytes(48) + struct.pack("64sI", name.encode(), 64) + bytes(124) +
+                     struct.pack("II", 1, 0) + uuid.UUID(instance).bytes
+                     for provider, instance, name in zip(ids, ids[2:], names))
 
 commands = ("channel flow flow-adv flow-owner flow-route flow-switch interface memory netns provider show tree "
             "channel-stats list-providers netstat").split()
-everywhere = ["-f", "-w"]
 
 # What is typed behind the program's name, and what the last word of it may become. Empty: it stays as it is.
 cases = [
     ("", commands),
-    ("net", ["netns", "netstat"]),
-    ("NETN", ["netns"]),
+    ("NET", ["netns", "netstat"]),
     ("nothing", []),
-    ("-", everywhere),
-    ("-w 1 -f net netst", ["netstat"]),
-    ("netns -", ["-a", "--all", "-i", "--ip", "-p", "--proto"] + everywhere),
-    ("NetNS --p", ["--proto"]),
-    ("provider -", ["-D", "--details"] + everywhere),
-    ("flow -", ["-n"] + everywhere),
-    ("netstat --flow-o", ["--flow-owner"]),
+    ("-", ["-f", "-w"]),
+    ("-w 1 -f net:b flow-r", ["flow-route"]),
+    ("netns -", ["-a", "--all", "-i", "--ip", "-p", "--proto", "-f", "-w"]),
+    ("flow -", ["-n", "-f", "-w"]),
+    ("NetStat --flow-o", ["--flow-owner"]),
     ("netns -p ", ["tcp", "udp"]),
-    ("netns -a --proto t", ["tcp"]),
     ("netns --proto=t", ["--proto=tcp"]),
     ("netns -i g", ["global"]),
-    ("netstat -s -p ", ["ip", "ip6", "tcp", "udp"]),
+    ("netstat -asp ", ["ip", "ip6", "tcp", "udp"]),
     ("netstat -s -w 3 --per-protocol u", ["udp"]),
-    ("netstat -asp t", ["tcp"]),
     ("netstat -s -pudp t", []),
-    ("tree ", tree_ids),
-    ("tree " + ids[1][:35].lower(), tree_ids),
-    ("-f x tree " + ids[1], [ids[1]]),
-    ("netstat --uuid ", nexus_ids),
+    ("netstat --uuid ", ids[2:]),
     ("netstat --flow --uuid=" + ids[2], ["--uuid=" + ids[2]]),
     ("netstat --pid ", []),
+    ("tree " + ids[1][:35].lower(), ids),
+    ("-f x tree " + ids[1], [ids[1]]),
     ("tree '$(touch hurt)'", []),
     ("-f wi", ["with blanks.log"]),
     ("flow -n -f wi", ["with blanks.log"]),
-    ("-f a:b flow-r", ["flow-route"]),
     ("channel wi", []),
 ]
 
-# What each shell reads at its start. Control-G inserts everything that could stand there, the command writes down
-# how the shell reads the line then, and the shell says when it is ready for the next.
-ready = b"<ready>"
-start_up = {
-    "bash": """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed); }
-PS1=; PROMPT_COMMAND='printf "<%s>" ready'; . SCRIPT
-bind 'set bell-style none' '"\\C-g": insert-completions'""",
-    "zsh": """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed) }
+# How a shell is started, and what it reads then. Control-G inserts everything that could stand there, the command
+# writes down how the shell reads the line then, and the shell says when it is ready for the next.
+start_ups = {
+    "bash": ("--noprofile --rcfile ../.bashrc -i", """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed); }
+PS1=; PROMPT_COMMAND='printf "<%s>" ready'; . $MADE/tarvelctl.bash
+bind 'set bell-style none' '"\\C-g": insert-completions'"""),
+    "zsh": ("-di", """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed) }
 PS1=; precmd() { printf '<%s>' ready }; unsetopt beep prompt_cr prompt_sp
-fpath=($PWD/../functions $fpath); autoload -U compinit; compinit -u -d ../dump
+cp $MADE/tarvelctl.zsh ../_tarvelctl; fpath=($PWD/.. $fpath); autoload -U compinit; compinit -u -d ../dump
 zle -C all-matches complete-word _generic; bindkey '^G' all-matches
 zstyle ':completion:all-matches:*' insert yes
-zstyle ':completion:all-matches::::' completer _all_matches _complete""",
+zstyle ':completion:all-matches::::' completer _all_matches _complete"""),
 }
-
-
-class Terminal:
-    """A shell on a terminal of its own."""
-
-    def __init__(self, command, **options):
-        self.master, slave = pty.openpty()
-        self.process = subprocess.Popen(command, stdin=slave, stdout=slave, stderr=slave, start_new_session=True, **options)
-        os.close(slave)
-
-    def type(self, text):
-        os.write(self.master, text.encode())
-
-    def wait_for(self, text):
-        seen = b""
-        while text not in seen:
-            ready = select.select([self.master], [], [], 20)[0]
-            assert ready, f"no {text} in {seen}"
-            seen += os.read(self.master, 4096)
-
-    def close(self):
-        self.process.kill()
-        self.process.wait()
-        os.close(self.master)
 
 
 class Completions(unittest.TestCase):
     def setUp(self):
         self.top = pathlib.Path(tempfile.mkdtemp(prefix="completions_test"))
         self.addCleanup(shutil.rmtree, self.top)
-        self.directory = self.top / "work"
-        for name in "work", "home", "functions", "kernel/proc/sys/kern/tarvel/stats":
-            (self.top / name).mkdir(parents=True)
-        (self.directory / "with blanks.log").touch()
-        shutil.copy(script, self.top / "functions/_tarvelctl")
-        tables = self.top / "kernel/proc/sys/kern/tarvel"
-        for name in "nexus_channel_list", "stats/flow":
-            (tables / name).touch()
-        (tables / "nexus_provider_list").write_bytes(b"".join(
-            uuid.UUID(ids[i]).bytes + bytes(48) + struct.pack("64sI", name.encode(), 64) + bytes(124) +
-            struct.pack("II", 1, 0) + uuid.UUID(ids[2 + i]).bytes for i, name in enumerate(names)))
-        self.environment = {"PATH": f"{programs}:{os.environ['PATH']}", "TARVEL_ROOT": str(self.top / "kernel"),
-                            "HOME": str(self.top / "home"), "TERM": "dumb", "LC_ALL": "C.UTF-8"}
+        tables = self.top / "proc/sys/kern/tarvel"
+        for folder in self.top / "work", tables / "stats":
+            folder.mkdir(parents=True)
+        for file in self.top / "work/with blanks.log", tables / "nexus_channel_list", tables / "stats/flow":
+            file.touch()
+        (tables / "nexus_provider_list").write_bytes(providers)
+        self.options = {"cwd": self.top / "work", "env": {
+            "PATH": f"{self.top}:{build}:{os.environ['PATH']}", "MADE": str(build / "completions"), "TERM": "dumb",
+            "HOME": str(self.top), "TARVEL_ROOT": str(self.top), "LC_ALL": "C.UTF-8"}}
 
-    def typed(self, lines):
-        """What the shell makes of each line."""
-        rc = self.top / "start_up"
-        rc.write_text(start_up[shell].replace("SCRIPT", script))
-        command = {"bash": ["bash", "--noprofile", "--rcfile", rc, "-i"], "zsh": ["zsh", "-dfi"]}[shell]
-        terminal = Terminal(command, cwd=self.directory, env=self.environment)
-        self.addCleanup(terminal.close)
-        if shell == "zsh":
-            terminal.type(f". {rc}\n")
-        for line in lines:
-            terminal.wait_for(ready)
-            terminal.type(f"tarvelctl {line}\a\n")
-        terminal.wait_for(ready)
-        return [line.split("@") for line in (self.top / "typed").read_text().splitlines()]
+    def typed(self, shell, lines):
+        """What a shell on a terminal makes of each line."""
+        arguments, start_up = start_ups[shell]
+        (self.top / f".{shell}rc").write_text(start_up)
+        terminal, its = pty.openpty()
+        process = subprocess.Popen([shell, *arguments.split()], stdin=its, stdout=its, stderr=its,
+                                   start_new_session=True, **self.options)
+        self.addCleanup(process.kill)
+        for line in *(f"tarvelctl {line}\a\n" for line in lines), "exit\n":
+            seen = b""
+            while b"<ready>" not in seen:
+                self.assertTrue(select.select([terminal], [], [], 20)[0], seen)
+                seen += os.read(terminal, 4096)
+            os.write(terminal, line.encode())
+        process.wait(20)
+        return [line.split("@") for line in (self.top / "typed").read_text().splitlines()[-len(lines):]]
 
     def listed(self, lines):
         """What fish says could stand at the end of each line."""
-        ask = f"source {script}; for line in $argv; complete -C \"tarvelctl $line\"; printf '\\0'; end"
-        answer = subprocess.run(["fish", "--no-config", "-c", ask, *lines], cwd=self.directory, env=self.environment,
-                                capture_output=True, text=True, timeout=60, check=True)
+        ask = 'source $MADE/tarvelctl.fish; for line in $argv; complete -C "tarvelctl $line"; printf "\\0"; end'
+        answer = subprocess.run(["fish", "--no-config", "-c", ask, *lines], capture_output=True, text=True, timeout=60,
+                                check=True, **self.options)
         self.assertEqual(answer.stderr, "")
         return [words.splitlines() for words in answer.stdout.split("\0")[:-1]]
 
-    def check(self, cases):
+    def check(self, shell, cases):
         lines = [line for line, _ in cases]
-        made = self.listed(lines) if shell == "fish" else self.typed(lines)
+        made = self.listed(lines) if shell == "fish" else self.typed(shell, lines)
         for (line, expected), words in zip(cases, made, strict=True):
-            if shell != "fish":  # which leaves the line alone
-                *before, last = shlex.split(line + "''")
-                before, words = words[:len(before)], words[len(before):]
-                self.assertEqual(before, shlex.split(line)[:len(before)])
-                expected = expected or list(filter(None, [last]))
-            with self.subTest(line=line):
-                self.assertEqual(sorted(words), sorted(expected))
+            *before, last = [""] if shell == "fish" else shlex.split(line + "''")  # fish leaves the line alone
+            with self.subTest(shell=shell, line=line):
+                self.assertEqual(words[:len(before)], before)
+                self.assertEqual(sorted(words[len(before):]), sorted(expected or filter(None, [last])))
 
     def test_EveryWordIsCompletedAndNothingIsRun(self):
-        self.check(cases)
-        self.assertFalse((self.directory / "hurt").exists())
+        for shell in shells:
+            self.check(shell, cases)
+        self.assertFalse((self.top / "work/hurt").exists())
 
     def test_ToolThatDoesNotAnswerIsGivenUp(self):
-        tool = self.top / "tarvelctl"
-        tool.write_text("#!/bin/sh\nexec sleep 100\n")
-        tool.chmod(0o755)
-        self.environment["PATH"] = f"{self.top}:{self.environment['PATH']}"
-        self.check([("tree ", [])])
+        (self.top / "tarvelctl").write_text("#!/bin/sh\nexec sleep 100\n")
+        (self.top / "tarvelctl").chmod(0o755)
+        for shell in shells:
+            self.check(shell, [("tree ", [])])
 
 
 if __name__ == "__main__":
