@@ -88,12 +88,6 @@ class Docs(unittest.TestCase):
             with tempfile.TemporaryDirectory() as folder:
                 self.check_page(page, pathlib.Path(folder))
 
-    def test_ReadmeNamesEveryCommand(self):
-        usage = subprocess.run([build / "tarvelctl"], capture_output=True, text=True).stderr
-        names = re.findall(r"^\t([a-z-]+)$", usage, re.M)
-        self.assertIn("netstat", names)
-        self.assertEqual([name for name in names if f"`{name}`" not in (top / "README.md").read_text()], [])
-
     def test_LinksLeadSomewhere(self):
         for page in pages:
             for target, heading in re.findall(r"\]\((?!\w+:)([^)#]*)#?([^)]*)\)", page.read_text()):

@@ -53,8 +53,6 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     check_has(run("scripts/demo", root / "usr/bin"), f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14",
               "Proto Local Address", "LISTENER")
     assert not (scratch / "build").exists()
-    page = run("gzip", "-cd", root / "usr/share/man/man1/tarvelctl.1.gz")
-    assert page == pathlib.Path("docs/tarvelctl.1").read_text()
     guide = (root / "usr/share/doc/tarvelctl/from-symptom-to-command.md").read_text()
     assert not re.search(r"\]\((?!#)", guide), "a link to a page that is not installed"
 
