@@ -1,12 +1,9 @@
 #!/usr/bin/env python3
 """channel: the listing, the ring table, the watch loop of its own."""
-import pathlib
-import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import make  # noqa: E402
-from runs import MISSING, Case, Result  # noqa: E402
+from records import make
+from runs import MISSING, Case, Result
 
 LIST, SWITCH, ON = "nexus_channel_list", "ring_stat_enable", b"\x80"
 A, B = "AAAAAAAA-0000-0000-0000-00000000000A", "BBBBBBBB-0000-0000-0000-00000000000B"

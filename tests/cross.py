@@ -3,15 +3,12 @@
 
 --other is the second build, as a command line: scripts/torture gives the one for arm64, run by qemu-user.
 """
-import pathlib
 import re
 import resource
 import shlex
-import sys
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import TABLES  # noqa: E402
-from driver import Driver  # noqa: E402
+from records import TABLES
+from driver import Driver
 
 LINES = {"nexus_provider_list": ("provider -D", "tree", "show"), "nexus_channel_list": ("channel", "tree", "show"),
          "stats/flow": ("flow", "netstat -an --pid 94", "tree", "show"), "stats/flow_adv": ("flow-adv",),

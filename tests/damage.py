@@ -9,15 +9,12 @@ each byte is one; the expectation is a report in which the same texts are harmle
 """
 import functools
 import os
-import pathlib
 import re
-import sys
 import unicodedata
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from driver import Driver  # noqa: E402
-from records import RECORDS, TABLES, encoded  # noqa: E402
-from runs import SHORT, Result, aborted, name_services  # noqa: E402
+from driver import Driver
+from records import RECORDS, TABLES, encoded
+from runs import SHORT, Result, aborted, name_services
 
 WIDTH = "(length % width) == 0"
 SCAN = "scan == (buffer + length)"

@@ -12,11 +12,9 @@ import os
 import pathlib
 import re
 import signal
-import sys
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from driver import Driver  # noqa: E402
-from runs import Result, Run, TIME, build, limit_files  # noqa: E402
+from driver import Driver
+from runs import Result, Run, TIME, build, limit_files
 
 FOREVER, STAMP, INTERRUPT = 1 << 31, "\n<time>\n", (1, signal.SIGINT)
 TREE = ["nexus_provider_list", "nexus_channel_list", "stats/flow"]

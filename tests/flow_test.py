@@ -1,12 +1,9 @@
 #!/usr/bin/env python3
 """flow, flow-adv, flow-owner, flow-route."""
-import pathlib
-import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import make  # noqa: E402
-from runs import Case, Result, aborted, name_services  # noqa: E402
+from records import make
+from runs import Case, Result, aborted, name_services
 
 NEXUS, OTHER = "FEDCBA98-7654-3210-0123-456789ABCDEF", "FEDCBA98-7654-3210-0123-456789ABCDE0"
 LONG6 = "fd11:1111:2222:3333:4444:5555:6666:7777"
@@ -114,7 +111,6 @@ class Flow(Case):
             f"\n<time>\n{FLOWS}{NUMERIC}" * 2, "netstat: option requires an argument -- 'p'\nsleep 1\n" * 2, 0))
 
     def test_AdvisoriesAreBlocksOfUpTo512(self):
-        self.kernel.process(42, "curl")
         one, shown = advisories(42, NEXUS, 1), advisory_block("curl.42", NEXUS, "1<VALID>")
         most, title = advisories(42, NEXUS, *[0] * 512), advisory_block("<unknown>.43", NEXUS)
         self.expect({"stats/flow_adv": advisories(43, NEXUS) + one + most + advisories(-7, OTHER, 3, 0x80000006, 12)},

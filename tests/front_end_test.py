@@ -1,15 +1,12 @@
 #!/usr/bin/env python3
 """The command line: usage, global options, the watch loop, the ways out; and what the commands have in common."""
 import os
-import pathlib
 import signal
-import sys
 import time
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import TABLES, make  # noqa: E402
-from runs import MISSING, SHORT, TIME, Case, tarvelctl, wait_for  # noqa: E402
+from records import TABLES, make
+from runs import MISSING, SHORT, TIME, Case, tarvelctl, wait_for
 
 os.environ["POSIXLY_CORRECT"] = ""  # options behind operands are options none the less
 EMPTY = dict.fromkeys(TABLES, b"")

@@ -11,13 +11,11 @@ import pathlib
 import re
 import signal
 import subprocess
-import sys
 import threading
 import time
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from driver import Driver  # noqa: E402
-from runs import Run, TIME, name_services, tarvelctl, text, wait_for  # noqa: E402
+from driver import Driver
+from runs import Run, TIME, name_services, tarvelctl, text, wait_for
 
 STAMP, KILLERS = "\n<time>\n", (signal.SIGTERM, signal.SIGHUP, signal.SIGKILL)
 SIZES = "--flows 1500 --channels 400 --providers 600 --arenas 60 --namespaces 800 --processes 60 --stacks 60"
@@ -54,7 +52,7 @@ class Interrupts(Driver):
     def learn(self, command):
         """What a watch writes up to its first sleep, what in its next runs, and how long a run takes."""
         started = time.monotonic()
-        listing = STAMP + text(self.run(self.kernel, command).out)
+        listing = STAMP + self.run(self.kernel, command).out
         if command != "channel":
             return listing, listing, time.monotonic() - started
         watch = Run([tarvelctl, "-w", "1", command], self.kernel)  # prints from its second run on, and what has changed
@@ -71,7 +69,10 @@ class Interrupts(Driver):
         blocked = {"NAME_SERVICES_BLOCK_AT": str(self.random.randrange(1, 1000) if state == "blocked" else 0)}
         interval, to = "1000" if state == "asleep" else "1", ["-f", self.file] if sink == "file" else []
         run = PacedRun([tarvelctl, "-w", interval, *to, *command.split()], self.kernel, environment=blocked, **paced)
-        written = lambda: TIME.sub("<time>", run.out + text(self.file.read_bytes()))
+
+        def written():
+            return TIME.sub("<time>", run.out + text(self.file.read_bytes()))
+
         while not catches_interrupts(run.process):
             pass
         if state == "asleep":
@@ -90,7 +91,6 @@ class Interrupts(Driver):
                     (0 if number == signal.SIGINT else -number, "", True))
 
 
-signal.signal(signal.SIGINT, signal.SIG_DFL)  # a process that has not begun yet shall not seem to catch it
 driver = Interrupts(__doc__, limit=0.0, count=0)
 driver.limit = driver.options.limit or (0.2 if driver.long else 20.0)
 driver.file, driver.kernel = pathlib.Path(driver.directory, "output"), driver.make_kernel(*SIZES.split())

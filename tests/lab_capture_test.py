@@ -11,8 +11,8 @@ import time
 import unittest
 
 sys.path.insert(0, os.path.join(os.path.dirname(__file__), "support"))
-from records import RECORDS, TABLES, Kernel, encoded, make, walk  # noqa: E402
-from runs import LabCase, files, generate, limit_files, remove, tarvellab, top, wait_for  # noqa: E402
+from records import RECORDS, TABLES, Kernel, encoded, make, walk
+from runs import LabCase, files, generate, limit_files, remove, tarvellab, top, wait_for
 
 NODES = "proc/sys/kern/tarvel/"
 FLOW, NAME = NODES + "stats/flow", "proc/94/comm"

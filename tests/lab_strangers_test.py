@@ -2,16 +2,14 @@
 """The lab of root among strangers, who plant what they can before and while it runs. Who is not root skips it by 77."""
 import contextlib
 import os
-import pathlib
 import shutil
 import signal
 import subprocess
 import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import Kernel, make  # noqa: E402
-from runs import LabCase, files, generate, tarvellab  # noqa: E402
+from records import Kernel, make
+from runs import LabCase, files, generate, tarvellab
 
 NODES = "proc/sys/kern/tarvel/"
 STRANGER = 65534

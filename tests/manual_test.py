@@ -10,7 +10,6 @@ import sys
 import unittest
 
 tests, build = pathlib.Path(__file__).resolve().parent, pathlib.Path(sys.argv.pop(1)).resolve()
-sys.path.insert(0, str(tests / "support"))
 from records import RECORDS, TABLES, load
 
 load(build / "tests/describe")

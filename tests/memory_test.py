@@ -1,13 +1,10 @@
 #!/usr/bin/env python3
 """memory: arenas, their regions, the summary of all regions."""
-import pathlib
 import re
-import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import make  # noqa: E402
-from runs import Case  # noqa: E402
+from records import make
+from runs import Case
 
 ARENAS, MOST = "stats/arena", (1 << 64) - 1
 TYPES = "SCHEMA", "RING", "BUF", "MDU", "USD", "USTATS", "FLOWADV", "NEXUSADV", "SYSCTLS", "MDK", "KSD", "KSTATS"
@@ -45,7 +42,6 @@ def summary(total, wired, **types):
 
 class Memory(Case):
     def test_ReportsArenasWithTheirProcessesAndRegions(self):
-        self.kernel.process(42, "curl")
         name, none = "n" * 64, ("0*0 -> 0*0 (0.00% inflation)", "0 -> 0 (0.00% inflation)")
         table = arena(
             region(1, name="schema.en0", mem_total=65536 + 1023, mode=5, seg_size_req=4096, seg_size=16384, seg_count=4,

@@ -9,17 +9,14 @@ moves, where nothing is amiss at any time, and reading a table gives whole recor
 import itertools
 import multiprocessing
 import os
-import pathlib
 import re
 import shutil
 import signal
-import sys
 import tempfile
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from driver import Driver  # noqa: E402
-from records import TABLES, Kernel  # noqa: E402
-from runs import Run, TIME, tarvelctl, tarvellab  # noqa: E402
+from driver import Driver
+from records import TABLES, Kernel
+from runs import Run, TIME, tarvelctl, tarvellab
 
 TREE = "nexus_provider_list", "nexus_channel_list", "stats/flow"
 COMMANDS = {"channel": TREE[1:2], "flow": TREE[2:], "flow-adv": ["stats/flow_adv"], "flow-owner": ["stats/flow_owner"],

@@ -1,12 +1,9 @@
 #!/usr/bin/env python3
 """netns: one port namespace, or all of them."""
-import pathlib
-import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import make  # noqa: E402
-from runs import Case  # noqa: E402
+from records import make
+from runs import Case
 
 TCP, UDP = 6, 17
 V4 = "10.0.0.1"

@@ -1,14 +1,11 @@
 #!/usr/bin/env python3
 """netstat and its counter reports, interface, flow-switch."""
 import itertools
-import pathlib
 import re
-import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import RECORDS, make  # noqa: E402
-from runs import MISSING, Case  # noqa: E402
+from records import RECORDS, make
+from runs import MISSING, Case
 
 USAGE = """Usage:
 tarvelctl netstat arguments

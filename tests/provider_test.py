@@ -1,12 +1,9 @@
 #!/usr/bin/env python3
 """provider, also called list-providers."""
-import pathlib
-import sys
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import make  # noqa: E402
-from runs import Case, text  # noqa: E402
+from records import make
+from runs import Case, text
 
 LIST = "nexus_provider_list"
 ID, INSTANCE = "FEDCBA98-7654-3210-0123-456789ABCDEF", "01000000-0000-0000-0000-00000000000A"

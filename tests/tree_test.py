@@ -1,14 +1,11 @@
 #!/usr/bin/env python3
 """tree; show, also called channel-stats."""
 import json
-import pathlib
-import sys
 import textwrap
 import unittest
 
-sys.path.insert(0, str(pathlib.Path(__file__).parent / "support"))
-from records import make  # noqa: E402
-from runs import MISSING, SHORT, Case, aborted  # noqa: E402
+from records import make
+from runs import MISSING, SHORT, Case, aborted
 
 ORPHAN = "orphan flow orphan nx_uuid"
 CHAIN = "1/1; 1 2/2; 2 3/3; 3 4/4; 4 5/5; 5 6/6; 6 7/7"

@@ -11,7 +11,7 @@
 #include <functional>
 
 #include "common/text/output_helpers.h"
-#include "tests/support/units.h"
+#include "tests/units/units.h"
 
 static std::deque<int> writes;  // what becomes of the next ones: an error, or -N, where N bytes are taken
 static std::function<void()> behind_writes;  // comes before the first write behind them

@@ -48,5 +48,6 @@ class Driver:
         """Tells the account and ends the process."""
         shutil.rmtree(self.directory, ignore_errors=True)
         print("seed", self.options.seed)
-        print(f"{pathlib.Path(sys.argv[0]).stem}: {self.runs} runs, {self.faults} faults injected, {self.findings} findings")
+        name = pathlib.Path(sys.argv[0]).stem
+        print(f"{name}: {self.runs} runs, {self.faults} faults injected, {self.findings} findings")
         sys.exit(self.findings > 0)

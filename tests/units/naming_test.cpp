@@ -9,7 +9,7 @@
 #include <sstream>
 
 #include "common/names/host_naming.h"
-#include "tests/support/units.h"
+#include "tests/units/units.h"
 
 static std::map<std::string, std::string> known;  // names by questions, "-" for an entry without one
 static std::string asked;                         // the questions

@@ -5,7 +5,7 @@
 #include "common/mib.h"
 #include "common/tables/table_walk.h"
 #include "platform/sysctl.h"
-#include "tests/support/units.h"
+#include "tests/units/units.h"
 
 static std::string table,
     answers;  // of a kernel: an x for each call that fails with ENOMEM, a dot for others

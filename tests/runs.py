@@ -22,10 +22,11 @@ import unittest
 from records import Kernel, load
 
 build = pathlib.Path(sys.argv.pop(1)).resolve()
-top = pathlib.Path(__file__).parents[2]
+top = pathlib.Path(__file__).parents[1]
 tarvelctl, tarvellab = str(build / "tarvelctl"), str(build / "tarvellab")
 load(build / "tests/describe")
 
+signal.signal(signal.SIGINT, signal.SIG_DFL)  # what is started neither ignores it nor, while it starts, catches it
 MISSING = "sysctl for len failed, No such file or directory\n"
 SHORT = "Buffer too short\n"
 TIME = re.compile(r"\d{4}-\d\d-\d\d \d\d:\d\d:\d\d")
@@ -150,7 +151,7 @@ def aborted(function, line, expression, out="", file="tarvelctl/tarvelctl"):
 
 
 class Case(unittest.TestCase):
-    """Whole commands in the folder `self.directory`, on `self.kernel`, which has no tables yet, and curl as process 42."""
+    """Whole commands in the folder `self.directory`, on `self.kernel`: no tables yet, and curl as process 42."""
     maxDiff = None
 
     def setUp(self):

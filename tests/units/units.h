@@ -1,7 +1,7 @@
 // What the tests of single pieces share.
 
-#ifndef TARVELCTL_TESTS_SUPPORT_UNITS_H
-#define TARVELCTL_TESTS_SUPPORT_UNITS_H
+#ifndef TARVELCTL_TESTS_UNITS_UNITS_H
+#define TARVELCTL_TESTS_UNITS_UNITS_H
 
 #include <fcntl.h>
 #include <gtest/gtest.h>

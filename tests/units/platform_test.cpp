@@ -11,7 +11,7 @@
 #include "common/text/output_helpers.h"
 #include "platform/memory.h"
 #include "platform/sysctl.h"
-#include "tests/support/units.h"
+#include "tests/units/units.h"
 
 // Files of the live kernel that fail or are long, under names of variables, and a machine without /proc.
 extern "C" int __real_open(const char *path, int flags);
