@@ -51,7 +51,7 @@ class Netstat(Case):
                 ("netstat: option requires an argument -- 'p'\n" + USAGE, "-p"),
                 ("netstat: option '--pid' requires an argument\n" + USAGE, "--pid"),
                 ("netstat: option '--netif' doesn't allow an argument\n" + USAGE, "--netif=1"),
-                *((f'Unsupported protocol "{each}"\n', f"-s -p tcp -p '{each}'") for each in ("icmp", "TCP", "tcp6", "")),
+                *((f'Unsupported protocol "{each}"\n', f"-s -pudp -p '{each}'") for each in ("icmp", "TCP", "ip4", "")),
                 *(("Bad UUID\n", f"-s --uuid '{each}' -x") for each in (A + "0", A[1:], "G" + A[1:], ""))):
             self.expect(STACKS, [f"netstat {each}" for each in options], err=error, name="tv")
             if USAGE not in error:

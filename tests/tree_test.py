@@ -137,8 +137,9 @@ class Tree(Case):
     def test_ShowHasPortsAndFlowsOfMultistackFlowSwitches(self):
         flows = flow("A", 2, 30, 53) + flow("A", 1, 9) + flow("A", 2, 2, 65535)
         tables = {"nexus_provider_list": provider("E", type=3) + provider("D", type=3, subtype=2)
-                  + provider("", type=3, subtype=1) + provider("BA", "n" * 64, subtype=1), "stats/flow": flows,
-                  "nexus_channel_list": groups("A 12 2/D 1 -1 0; D 9; E 2", flags=1 << 31) + groups("B 3", pid=77)}
+                  + provider("", type=3, subtype=1) + provider("BA", "n" * 64, subtype=1),
+                  "nexus_channel_list": groups("A 12 2/D 1 -1 0; D 9; E 2", flags=1 << 31)
+                  + groups("B 3", pid=77, flags=63), "stats/flow": flows}
         report = (f"flow-switch {uid('B')} {'n' * 64}\n\tPort[ 3] <unknown>.77          \n"
                   f"flow-switch {uid('A')} {'n' * 64}\n\tPort[4294967295] curl.42               defunct\n"
                   "\tPort[ 2] curl.42               defunct\n\t\t fe80::1.443 <-> 2001:db8::9.53\n"
