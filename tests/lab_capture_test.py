@@ -118,7 +118,7 @@ class Capture(CaptureCase):
         self.assertRegex(" ".join(names), r"^(\d+\.\d{3} ){2}\d+\.\d{3}$")
         offsets = sorted(map(float, names))
         self.assertEqual(len({offset // .5 for offset in offsets} - {0}), 3)  # each in an interval of its own
-        self.assertTrue(offsets[1] - offsets[0] > 1 and offsets[2] < time.monotonic() - began)
+        self.assertLess(offsets[2], time.monotonic() - began)
 
     def test_WhatEndsACaptureLeavesTheMomentsSoFar(self):
         def take_away(run):
@@ -137,6 +137,7 @@ class Capture(CaptureCase):
             seen, count = run.end(), len(self.moments()) + 1
             self.assertEqual(seen[::2], (COUNTS.format(count, 1000, 12 * count, 12 * count, 0, 0), 1))
             self.assertRegex(seen.err, f"^{NOTE}{err}$")
+            self.assertLessEqual(seen.err.count(GONE), 1)
             self.assertEqual([path for path in files(self.saved.root) if "/." in path], [])
             shutil.rmtree(self.saved.root)
 
@@ -146,11 +147,11 @@ class Replay(CaptureCase):
         temporary, order = self.directory / "temporary", self.directory / "order"
         temporary.mkdir()
         self.moment("", b"1" * 320, b"first\n")
-        self.moment("2.400", b"2" * 640, None)
-        self.moment("2.500", None, b"third\n")
+        self.moment("3.200", b"2" * 640, None)
+        self.moment("3.300", None, b"third\n")
         # All come a quarter of the first interval early: the second moment here before that of a shorter, later one.
         other = shutil.copytree(self.kernel.root, self.directory / "other")
-        (other / "moments/2.400").rename(other / "moments/2.050")
+        (other / "moments/3.200").rename(other / "moments/3.000")
         shutil.copytree(self.kernel.root / "proc", other / "moments/0.100/proc")
         script = f"""r=$TARVEL_ROOT; cd $r; echo $r; cat {NAME}; f=$r/{FLOW} n=$r/{NAME}; wc -c <$f
                      while [ -e $n ]; do sleep .01; done; echo $0 >>{order}; wc -c <$f
@@ -159,7 +160,7 @@ class Replay(CaptureCase):
         runs = [self.start(["run", root, "--", "sh", "-c", script, root.name], tarvellab,
                            environment={"TMPDIR": str(temporary)}) for root in (self.kernel.root, other)]
         wait_for(order.exists)
-        self.assertGreaterEqual(time.monotonic() - began, 1.8)
+        self.assertGreaterEqual(time.monotonic() - began, 2.4)
         for run in runs:
             seen = run.end()
             self.assertRegex(seen.out, f"^{temporary}/tarvellab-....../moment\nfirst\n320\n640\nthird\n320\n$")
