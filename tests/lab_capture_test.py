@@ -55,7 +55,7 @@ class CaptureCase(LabCase):
         if offset:
             shutil.copytree(self.kernel.root / "proc", root / "proc")
         else:
-            (root / "capture.txt").write_text("format: 1\nhost: a\ntime: noon\n")
+            (root / "capture.txt").write_text("format: 1\nhost: time: a\ntime: noon\n")
         for path, content in (root / FLOW, flow), (root / NAME, name):
             path.unlink(missing_ok=True)
             content is None or path.write_bytes(content)
@@ -164,7 +164,7 @@ class Replay(CaptureCase):
         for run in runs:
             seen = run.end()
             self.assertRegex(seen.out, f"^{temporary}/tarvellab-....../moment\nfirst\n320\n640\nthird\n320\n$")
-            self.assertEqual(seen[1:], ("tarvellab: this is a at noon\ntarvellab: the last moment is shown\n", 0))
+            self.assertEqual(seen[1:], ("tarvellab: this is time: a at noon\ntarvellab: the last moment is shown\n", 0))
         self.assertEqual((order.read_text(), [*temporary.iterdir()]), ("kernel\nother\n", []))
 
     def test_WhatIsNoMomentDoesNotCount(self):
