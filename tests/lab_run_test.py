@@ -67,6 +67,15 @@ class Generate(LabCase):
         shared = {(each["region_uuid"], each.table[each.at:each.end]) for each in regions}
         self.assertEqual(len(shared), len({name for name, _ in shared}))
 
+    def test_EveryValueWithANameAppears(self):
+        kernel, seen = generate(self.kernel.root), {}
+        for name in TABLES:
+            for record in kernel.records(name):
+                for row, at in record.find("kind", "enumeration"):
+                    seen.setdefault((name, *row["values"]), set()).add(record.value(row, at))
+        for (name, *values), found in seen.items():
+            self.assertEqual(found, {*map(int, values)}, name)
+
     def test_WhatPassesASwitchPassesItsDevice(self):
         kernel = generate(self.kernel.root, "--rings", 4)
         interfaces = {each["name"]: each for each in kernel.records("stats/net_if")}
@@ -160,17 +169,20 @@ class Simulate(LabCase):
         running = {int(path.parent.name) for path in self.kernel.root.glob("proc/*/comm")}
         self.assertLessEqual(self.kernel.pids() - {0}, running)
 
-    def test_RatesAreTheDifferencesOfSnapshots(self):
-        run, snapshots = self.simulate("--interval", 100), [{}]
+    def test_FlowsChangeAndRatesAreTheDifferencesOfSnapshots(self):
+        run, snapshots, states = self.simulate("--interval", 100), [{}], {}
 
         def follow_each_other():
             """Whether the last two snapshots are an interval apart, or two where the machine is slow."""
             snapshots.append({(channel["channel_uuid"], way): channel[way][0]
                               for channel in self.kernel.channels() for way in ("tx", "rx")})
+            for flow in self.kernel.records("stats/flow"):
+                ends = "nx_uuid protocol local.ipv4 local.port remote.ipv4 remote.ipv6 remote.port".split()
+                states.setdefault(tuple(flow["sf_" + end] for end in ends), set()).add(flow["sf_lstats.state"])
             before, now = snapshots[-2:]
             moved = {ring: now[ring]["xfer.bytes"] - before[ring]["xfer.bytes"] for ring in now.keys() & before.keys()}
             self.assertGreaterEqual(min(moved.values(), default=0), 0)
-            return sum(map(bool, moved.values())) > 30 and any(
+            return max(map(len, states.values())) > 1 and sum(map(bool, moved.values())) > 30 and any(
                 all(now[ring]["xfer.bytes_per_sec"] == moved[ring] * 10 // steps for ring in moved) for steps in (1, 2))
         wait_for(follow_each_other)
         self.assertEqual(run.end(signal.SIGTERM).status, 0)
