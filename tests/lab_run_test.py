@@ -170,10 +170,10 @@ class Simulate(LabCase):
         self.assertLessEqual(self.kernel.pids() - {0}, running)
 
     def test_FlowsChangeAndRatesAreTheDifferencesOfSnapshots(self):
-        run, snapshots, states = self.simulate("--interval", 100), [{}], {}
+        run, snapshots, states = self.simulate("--interval", 200), [{}], {}
 
         def follow_each_other():
-            """Whether the last two snapshots are an interval apart, or two where the machine is slow."""
+            """Whether the last two snapshots are one interval apart, and some flow has been established so far."""
             snapshots.append({(channel["channel_uuid"], way): channel[way][0]
                               for channel in self.kernel.channels() for way in ("tx", "rx")})
             for flow in self.kernel.records("stats/flow"):
@@ -182,8 +182,8 @@ class Simulate(LabCase):
             before, now = snapshots[-2:]
             moved = {ring: now[ring]["xfer.bytes"] - before[ring]["xfer.bytes"] for ring in now.keys() & before.keys()}
             self.assertGreaterEqual(min(moved.values(), default=0), 0)
-            return any({2, 4} <= each for each in states.values()) and sum(map(bool, moved.values())) > 30 and any(
-                all(now[ring]["xfer.bytes_per_sec"] == moved[ring] * 10 // steps for ring in moved) for steps in (1, 2))
+            return any({2, 4} <= each for each in states.values()) and sum(map(bool, moved.values())) > 30 and all(
+                now[ring]["xfer.bytes_per_sec"] == moved[ring] * 5 for ring in moved)
         wait_for(follow_each_other)
         self.assertEqual(run.end(signal.SIGTERM).status, 0)
 
