@@ -1,6 +1,5 @@
 #!/usr/bin/env python3
 """capture, and run on a capture: what is saved, shown again, refused and hidden."""
-import ipaddress
 import os
 import random
 import re
