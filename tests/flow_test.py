@@ -153,7 +153,7 @@ class Flow(Case):
                 ("flow", FLOWS, [make("flow", sf_pid=pid, sf_nx_uuid=nexus) for pid, nexus in keys],
                  [row(42), row(42), row(43)]),
                 ("flow_adv", "", [advisories(*key) for key in keys],
-                 [advisory_block(f"<unknown>.{pid}", nexus) for pid, nexus in keys]),
+                 [advisory_block("curl.42" if pid == 42 else f"<unknown>.{pid}", nexus) for pid, nexus in keys]),
                 ("flow_owner", OWNERS, [owner(*key) for key in keys], [OWNER.format(pid) for pid, _ in keys])):
             for options, left in (("--pid 42", rows[:2]), ("--pid x", []), (by_nexus, rows[::2]),
                                   (by_nexus + "--pid 43", rows[2:])):

@@ -192,8 +192,8 @@ class Replay(CaptureCase):
     def test_OnlyFilesAreReplayed(self):
         root, deepest = self.moment(""), self.moment("0.100") / NODES / "stats/more"
         for place, *makes in ([root / "proc/94/more"], [root / "moments/more"], [root / "more"], [deepest, os.mkdir]):
-            for make in os.mkfifo, link_out, lambda path: (path / "x/x/x/x/x/x/x/x").mkdir(parents=True), *makes:
-                make(place)
+            for put in os.mkfifo, link_out, lambda path: (path / "x/x/x/x/x/x/x/x").mkdir(parents=True), *makes:
+                put(place)
                 seen = self.replay("echo", "seen")
                 self.assertRegex(seen.err, f"^tarvellab: {place}(/x)*: no part of a capture\n$")
                 self.assertEqual(seen[::2], ("", 1))

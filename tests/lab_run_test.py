@@ -93,7 +93,7 @@ class Generate(LabCase):
         sizes = {"providers": (30, "nexus_provider_list"), "flows": (4000, "stats/flow"), "arenas": (41, "stats/arena"),
                  "namespaces": (25, "stats/netns"), "stacks": (90, "stats/userstack")}
         kernel = generate(self.kernel.root, "--nexuses", 77, "--channels", 500, "--processes", 50, "--rings", 0,
-                               *(word for name in sizes for word in ("--" + name, sizes[name][0])))
+                          *(word for name in sizes for word in ("--" + name, sizes[name][0])))
         instances = sum(len(each["instances"]) for each in kernel.records("nexus_provider_list"))
         self.assertEqual((instances, len(kernel.channels()), len([*kernel.root.glob("proc/*/comm")])), (77, 500, 50))
         for name, (count, table) in sizes.items():

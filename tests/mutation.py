@@ -1,148 +1,151 @@
 #!/usr/bin/env python3
 """Makes small faults in the product, one at a time, and looks whether the tests notice.
 
-The faults are the usual slips: a bound off by one, a comparison or sum turned round, a condition or a step forgotten.
-They are drawn from all places where such a slip can stand, in a copy of the sources that is built without
-optimization. A fault that does not compile is drawn anew. One that no test notices is listed as a survivor; some
-change nothing that can be seen, such as a hint to the cache.
+The faults are the usual slips: a bound off by one, a comparison or sum turned round, a condition or a step forgotten,
+a constant changed. Lines are drawn from the whole product, and for each a slip that can stand there; one that does not
+compile is drawn anew. They are made in a copy of the tracked files, built without optimization. The tests are those of
+ctest, the quick ones first, until one fails twice. Nine of ten faults must be noticed; some change nothing to be seen.
+
+--record writes down which test noticed each fault. --replay makes those again that a test had noticed: one still must.
 """
 
 import argparse
+import ctypes
+import json
 import os
 import pathlib
 import random
 import re
-import resource
 import shutil
 import signal
 import subprocess
 import sys
-import time
 
-# Decoders and bounds. What prints and writes has checks of its own: fuzzing against snprintf, writes that fail.
-SOURCES = ["common/*.cpp", "common/channel*.h", "common/names/*.cpp", "common/tables/*.cpp", "common/tables/provider.h",
-           "common/tables/record_walk.h", "common/tables/channel.h", "common/tables/flow.h", "common/tables/netns.h",
-           "common/text/invariant.cpp", "common/text/memory.cpp", "tarvelctl/[!t]*.cpp", "tarvelctl/tree.cpp",
-           "platform/linux/[!dm]*.cpp"]
+TOP = pathlib.Path(__file__).parent.parent
+PRODUCT = ["common", "platform", "tarvelctl", "lab", "completions"]
 OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
     (r" < ", " <= "), (r" <= ", " < "), (r" > ", " >= "), (r" >= ", " > "), (r" == ", " != "), (r" != ", " == "),
-    (r" \+ ", " - "), (r" - ", " + "), (r" \* ", " / "), (r" % ", " / "), (r" && ", " || "), (r" \|\| ", " && "),
-    (r" & ", " | "), (r" \| ", " & "), (r" << ", " >> "), (r" >> ", " << "), (r" \+= ", " -= "), (r"\(!", "("),
-    (r"\bcontinue;", "break;"), (r"\bbreak;", "continue;"), (r"\btrue\b", "false"), (r"\bfalse\b", "true"),
-    (r"(?<![\w.\"'\\])(\d+)(?![\w.\"'])", lambda found: str(int(found[1]) + 1)),
-    (r"^(\s+)[\w.:>-]+\(.*\);$", r"\1;"), (r"^(\s+)\+\+[\w.]+;$", r"\1;"), (r"^(\s+)if \(.*\) (return|continue)\b.*;$", r"\1;"),
+    (r" \+ ", " - "), (r" - ", " + "), (r" \* ", " / "), (r" / ", " * "), (r" % ", " / "), (r" \+= ", " -= "),
+    (r" && ", " || "), (r" \|\| ", " && "), (r" & ", " | "), (r" \| ", " & "), (r" << ", " >> "), (r" >> ", " << "),
+    (r"\(!", "("), (r"\btrue\b", "false"), (r"\bfalse\b", "true"), (r"std::min\b", "std::max"),
+    (r"std::max\b", "std::min"), (r"\bcontinue;", "break;"), (r"\bbreak;", "continue;"),
+    (r"(?<![\w.\"'\\])(\d+|0x[0-9a-f]+)(?![\w.\"'])", r"(\1 + 1)"),
+    (r"\bif \(.*\) (?=\S.*;$)", ""), (r"^(\s+)if \(.*\) (return|continue|break)\b.*;$", r"\1;"),
+    (r"^(\s+)([\w.:>-]+\(.*\)|(\+\+|--)[\w.>-]+|[\w.:>\[\]-]+ [-+|&]?= .*);$", r"\1;"),
 ]]
-# Where a fault says nothing of a decoder or a bound, or cannot be seen: a buffer larger than it needs to be, the ways up a
-# tree that only save time.
-LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|template|using|char \w+\[)|prefetch|reserve\(|static_assert|print<|complain<|\"|"
-                      r"netstat_options\.\S+ = 1|report\.flush|jump")
-TESTS = ["unit_tests", "blocking_output_tests", "kernel_table_tests", "flow_naming_tests", "program_tests"]
-SHARDS = 4
-# What is asked where those notice nothing, because it takes longer.
-DRIVERS = {"truncation": ["tarvelctl", "tarvellab"], "terminal": ["tarvelctl", "tarvellab", "--name-services",
-                                                                  "tests/libname_services.so"],
-           "kernel": ["tests/faulted_tarvelctl", "tarvellab"], "memory": ["tests/faulted_tarvelctl", "tarvellab"],
-           "output": ["tests/faulted_tarvelctl", "tarvellab"]}
+# What nobody meets who runs the programs: comments, inclusions, what the compiler checks, hints, sizes of buffers.
+LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|char \w+\[)|prefetch|reserve\(")
+
+# Tests of what is written and packed are asked about faults in these folders only, and at first those that are named.
+PAPERS = "docs|manual|completions|package"
+FIRST = {"lab": "lab_", "completions": PAPERS}
+VERDICT = re.compile(r"Test +#(\d+): (\S+) \.* *(\S.*?) +([\d.]+) sec")
 
 
-def places(root):
-    """Every fault that can be made, as (file, line number, new line)."""
-    for pattern in SOURCES:
-        for path in sorted(root.glob(pattern)):
-            for number, line in enumerate(path.read_text().splitlines()):
-                code = line.split("  //")[0]
-                if LEFT_OUT.search(code):
-                    continue
-                for operator, replacement in OPERATORS:
-                    for found in operator.finditer(code):
-                        changed = code[:found.start()] + found.expand(replacement) if isinstance(replacement, str) \
-                            else code[:found.start()] + replacement(found)
-                        yield path.relative_to(root), number, changed + code[found.end():]
+def places():
+    """For each line where faults can be made all of them: the NTH line of FILE that is BEFORE becomes AFTER."""
+    for path in sorted(path for folder in PRODUCT for path in (TOP / folder).rglob("*.[ch]*")):
+        lines = path.read_text().splitlines()
+        for number, line in enumerate(lines):
+            code = line.split("  //")[0]
+            faults = [{"file": str(path.relative_to(TOP)), "nth": lines[:number].count(line), "before": line,
+                       "after": code[:found.start()] + found.expand(replacement) + code[found.end():]}
+                      for operator, replacement in OPERATORS for found in operator.finditer(code)]
+            if faults and not LEFT_OUT.search(code):
+                yield faults
 
 
-def quietly(*words, **options):
-    return subprocess.run(words, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL, **options).returncode == 0
+def run(log, *words):
+    """Whether a command succeeds within bounds that only a fault meets. Nothing that it started is left behind."""
+    with open(log, "w") as file:
+        status = subprocess.call(["prlimit", "--as=8000000000", "timeout", "1200", *words], stdout=file, stderr=file)
+    while left := pathlib.Path(f"/proc/self/task/{os.getpid()}/children").read_text().split():
+        for child in map(int, left):
+            os.kill(child, signal.SIGKILL)
+            os.waitpid(child, 0)
+    return status == 0
 
 
-def is_noticed(build):
-    """Whether a test fails. The shards of all test programs run at once: most of their time is waiting."""
-    running = []
-    for name in TESTS:
-        for shard in range(SHARDS if name == "program_tests" else 1):
-            sharding = {"GTEST_TOTAL_SHARDS": str(SHARDS), "GTEST_SHARD_INDEX": str(shard)} if name == "program_tests" else {}
-            running.append(subprocess.Popen([build / "tests" / name, "--gtest_fail_fast", "--gtest_brief=1"],
-                                            env={**os.environ, **sharding}, stdout=subprocess.DEVNULL,
-                                            stderr=subprocess.DEVNULL, start_new_session=True))
-    end = time.monotonic() + 40
-    while any(each.poll() is None for each in running) and not any(each.poll() for each in running):
-        if time.monotonic() > end:
-            break
-        time.sleep(0.02)
-    noticed = any(each.poll() != 0 for each in running)
-    for each in running:
-        try:
-            os.killpg(each.pid, signal.SIGKILL)
-        except ProcessLookupError:
-            pass
-        each.wait()
-    return noticed
+def run_tests(copy, *options):
+    """What the tests said, as (number, name, verdict, seconds), and one that failed in the end."""
+    log = copy / "tests.log"
+    passed = run(log, "ctest", "--test-dir", copy / "build", f"-j{os.cpu_count()}", "--timeout", "300", *options)
+    verdicts = VERDICT.findall(log.read_text(errors="replace"))
+    failed = [f"{name} ({verdict})" for _, name, verdict, _ in verdicts if verdict not in ("Passed", "***Skipped")]
+    return verdicts, None if passed else ["ctest", *failed][-1]
 
 
-def is_noticed_by_drivers(build, make):
-    quietly(*make, "faulted_tarvelctl", "name_services")
-    tests = pathlib.Path(__file__).parent
-    return any(not quietly("timeout", "120", tests / f"{name}_torture.py",
-                           *(word if word.startswith("-") else (build / word).resolve() for word in words))
-               for name, words in DRIVERS.items())
+def groups(healthy, folder):
+    """The numbers of the tests to ask, by the dozen, as ctest takes them."""
+    tests = sorted((not re.search(FIRST.get(folder, ""), name), float(seconds), number)
+                   for number, name, _, seconds in healthy if folder in FIRST or not re.search(PAPERS, name))
+    return [",".join(["0,0,0", *(number for *_, number in tests[i:i + 12])]) for i in range(0, len(tests), 12)]
+
+
+def noticed_by(copy, healthy, fault):
+    """The test that notices a fault, None if there is none, False if the fault cannot be made."""
+    path, make = copy / fault["file"], (copy / "build.log", "cmake", "--build", copy / "build")
+    original = path.read_text()
+    lines = original.split("\n")
+    same = [number for number, line in enumerate(lines) if line == fault["before"]]
+    if fault["nth"] >= len(same):
+        return False
+    lines[same[fault["nth"]]] = fault["after"]
+    path.write_text("\n".join(lines))
+    test = False
+    if run(*make, "--target", "tarvelctl", "tarvellab", "generate_completions"):
+        failures = (run_tests(copy, "--stop-on-failure", "--repeat", "until-pass:2", "-I", group)[1]
+                    for group in groups(healthy, fault["file"].split("/")[0]))
+        test = next(filter(None, failures), None) if run(*make) else "the build"
+    path.write_text(original)
+    return test
+
+
+def make_copy(copy):
+    """Copies and builds the tracked files. What each test says of the healthy programs."""
+    refill = 'rm -rf "$0" && mkdir -p "$0" && git ls-files -z | xargs -0 cp --parents -t "$0"'
+    subprocess.check_call(["sh", "-c", refill, copy], cwd=TOP)
+    subprocess.check_call(["cmake", "-S", copy, "-B", copy / "build", "-G", "Ninja", "-DCMAKE_BUILD_TYPE=Debug",
+                           f"-DCMAKE_CXX_COMPILER_LAUNCHER={shutil.which('ccache') or ''}",
+                           "-DTARVELCTL_BENCH=OFF", "-DCMAKE_CXX_FLAGS_DEBUG=-O0"], stdout=subprocess.DEVNULL)
+    subprocess.check_call(["cmake", "--build", copy / "build"], stdout=subprocess.DEVNULL)
+    healthy, failed = run_tests(copy)
+    if failed:
+        sys.exit(f"a test fails without any fault, see {copy}/tests.log: {failed}")
+    return healthy
 
 
 def main():
-    parser = argparse.ArgumentParser(description=__doc__)
-    parser.add_argument("copy", help="folder for the copy", type=pathlib.Path)
-    parser.add_argument("--count", type=int, default=200)
-    parser.add_argument("--seed", type=int, default=1)
-    parser.add_argument("--skip", type=int, default=0, help="so many of the faults drawn, to go on where a run ended")
-    parser.add_argument("--wanted", type=float, default=0.9, help="share to be noticed")
+    commit = subprocess.check_output(["git", "rev-parse", "HEAD"], cwd=TOP, text=True).strip()
+    parser = argparse.ArgumentParser(description=__doc__, formatter_class=argparse.RawDescriptionHelpFormatter)
+    parser.add_argument("copy", help="folder for the copy", type=lambda name: pathlib.Path(name).resolve())
+    parser.add_argument("--count", type=int, default=100, help="of faults that are drawn")
+    parser.add_argument("--seed", type=int, default=int(commit[:8], 16), help="by default taken from the commit")
+    parser.add_argument("--record", type=pathlib.Path, default=os.devnull)
+    parser.add_argument("--replay", type=lambda name: json.loads(pathlib.Path(name).read_text())["faults"])
     options = parser.parse_args()
-    resource.setrlimit(resource.RLIMIT_AS, (8 << 30, 8 << 30))  # a fault may ask for all memory there is
-    shutil.rmtree(options.copy, ignore_errors=True)
-    options.copy.mkdir(parents=True)
-    top = pathlib.Path(__file__).parent.parent
-    for name in subprocess.run(["git", "ls-files"], cwd=top, capture_output=True, text=True, check=True).stdout.split():
-        (options.copy / name).parent.mkdir(parents=True, exist_ok=True)
-        shutil.copy(top / name, options.copy / name)
-    build = options.copy / "build"
-    subprocess.run(["cmake", "-S", options.copy, "-B", build, "-G", "Ninja", "-DCMAKE_BUILD_TYPE=Debug",
-                    "-DTARVELCTL_BENCH=OFF", "-DCMAKE_CXX_FLAGS=-O0 -g0"], check=True, stdout=subprocess.DEVNULL)
-    make = ["cmake", "--build", build, "--target", "tarvelctl", *TESTS]
-    subprocess.run([*make, "tarvellab", "describe"], check=True, stdout=subprocess.DEVNULL)
-    if is_noticed(build) or is_noticed_by_drivers(build, make):
-        sys.exit("the tests fail without any fault")
+    ctypes.CDLL(None).prctl(36, 1, 0, 0, 0)  # PR_SET_CHILD_SUBREAPER: what tests leave behind comes to this process
+    healthy = make_copy(options.copy)
 
-    drawn = list(places(options.copy))
-    random.Random(options.seed).shuffle(drawn)
-    made = noticed = 0
-    for name, number, changed in drawn[options.skip:]:
-        if made == options.count:
-            break
-        path = options.copy / name
-        original = path.read_text()
-        lines = original.splitlines(keepends=True)
-        before, lines[number] = lines[number].strip(), changed + "\n"
-        path.write_text("".join(lines))
-        if quietly(*make):
-            made += 1
-            if is_noticed(build) or is_noticed_by_drivers(build, make):
-                noticed += 1
-            else:
-                print(f"survivor: {name}:{number + 1}: {before}  ->  {changed.strip()}", flush=True)
-        path.write_text(original)
-        if made % 20 == 0:
-            print(f"{noticed} of {made} so far", flush=True)
-    print(f"{noticed} of {made} faults are noticed, drawn from {len(drawn)} places")
-    missed = noticed < options.wanted * made
-    print(f"mutation: {made} runs, {made} faults injected, {int(missed)} findings")
-    sys.exit(missed)
+    chance, lines = random.Random(options.seed), list(places())
+    faults = [chance.choice(line) for line in chance.sample(lines, len(lines))]
+    if options.replay:
+        faults = [fault for fault in options.replay if fault["noticed_by"]]
+        options.count = len(faults)
+    made, noticed = [], 0
+    while faults and len(made) < options.count:
+        fault = faults.pop(0)
+        test = noticed_by(options.copy, healthy, fault)
+        said = "cannot be made" if test is False else test or "missed"
+        print(f"{said}: {fault['file']}: {fault['before'].strip()}  ->  {fault['after'].strip()}", flush=True)
+        if test is not False:
+            noticed += test is not None
+            made.append({**fault, "noticed_by": test})
+            options.record.write_text(json.dumps({"commit": commit, "seed": options.seed, "faults": made}, indent=1))
+    print(f"{noticed} of {len(made)} faults are noticed, seed {options.seed}")
+    findings = options.count - noticed if options.replay else int(noticed < 0.9 * len(made))
+    print(f"mutation: {len(made)} runs, {len(made)} faults injected, {findings} findings")
+    sys.exit(findings > 0)
 
 
 if __name__ == "__main__":

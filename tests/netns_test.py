@@ -12,7 +12,8 @@ V4 = "10.0.0.1"
 def namespace(address, protocol, *ranges, length=None):
     """Of an address; the global one has none. A range has first and last port and reservations of three subsystems."""
     names = "first_port", "last_port", "subsystem", "bsd", "listeners"
-    return make("netns", address=address or b"", address_length=length or (16 if ":" in address else len(address) and 4),
+    length = length or (16 if ":" in address else 4 if address else 0)
+    return make("netns", address=address or b"", address_length=length,
                 protocol=protocol, ranges=[make("netns_range", **dict(zip(names, each))) for each in ranges])
 
 
@@ -36,8 +37,8 @@ TABLE = {"stats/netns": b"".join([
     namespace(V4, TCP, length=7), namespace("", 200), make("netns", address="fe80::1", protocol=UDP, ranges=[
         make("netns_range", first_port=2)]), namespace("", TCP, *RANGES), namespace("a00:1::", TCP), namespace(V4, UDP),
     namespace(V4, TCP, (6,)), namespace(V4, TCP), namespace("fe80::1", UDP, (8,))])}
-ALL = (report("tcp global namespace") * 2 + GLOBAL_UDP + GLOBAL_TCP + LONG_TCP + V4_UDP + V4_TCP + report("tcp 10.0.0.1")
-       + V6_UDP)
+ALL = (report("tcp global namespace") * 2 + GLOBAL_UDP + GLOBAL_TCP + LONG_TCP + V4_UDP + V4_TCP
+       + report("tcp 10.0.0.1") + V6_UDP)
 
 
 class Netns(Case):

@@ -48,7 +48,7 @@ __attribute__((constructor(101))) static void read_plan() {
 // Counts a call. Returns what shall become of it.
 static long take_turn(char letter) {
   if (!call_counts) return unharmed;
-  const unsigned long turn = ++call_counts[static_cast<int>(letter)];
+  const unsigned long turn = ++call_counts[static_cast<unsigned char>(letter)];
   long value = unharmed;
   for (const auto &fault : plan) {
     if (turn - fault.first >= fault.count) continue;
@@ -97,12 +97,12 @@ void *__wrap_realloc(void *block, std::size_t size) {
 
 ssize_t __wrap_write(int fd, const void *data, std::size_t size) {
   const ssize_t taken = share(fd, size);
-  return taken < 0 ? -1 : __real_write(fd, data, taken);
+  return taken < 0 ? -1 : __real_write(fd, data, static_cast<std::size_t>(taken));
 }
 
 ssize_t __wrap_send(int fd, const void *data, std::size_t size, int flags) {
   const ssize_t taken = share(fd, size);
-  return taken < 0 ? -1 : __real_send(fd, data, taken, flags);
+  return taken < 0 ? -1 : __real_send(fd, data, static_cast<std::size_t>(taken), flags);
 }
 
 int __wrap_close(int fd) {
