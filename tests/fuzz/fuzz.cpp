@@ -24,7 +24,6 @@
 #include <vector>
 
 #include "common/tables/tables.h"
-#include "common/text/guard.h"
 #include "common/text/output.h"
 #include "platform/process.h"
 #include "platform/sysctl.h"
@@ -38,11 +37,8 @@
 
 namespace {
 
-using bytes = std::span<const std::uint8_t>;
-
 struct table {
-  std::string_view node;
-  bytes content;
+  std::string_view node, content;
 };
 
 // What the program meets outside itself.
@@ -138,14 +134,10 @@ void judge(std::size_t size) {
          "an exit status of no meaning", seen.diagnostics);
 }
 
-bytes take(bytes &input, std::size_t size) {
-  const bytes taken = input.first(std::min(size, input.size()));
-  input = input.subspan(taken.size());
+std::string_view take(std::string_view &input, std::size_t size) {
+  const std::string_view taken = input.substr(0, size);
+  input.remove_prefix(taken.size());
   return taken;
-}
-
-std::string_view text_of(bytes input) {
-  return {reinterpret_cast<const char *>(input.data()), input.size()};
 }
 
 }  // namespace
@@ -162,18 +154,17 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
     std::uint8_t nodes[3];   // rows of all_tables
     std::uint8_t surroundings;
   } header{};
-  bytes rest(data, size);
-  const bytes start = take(rest, sizeof header);
-  std::memcpy(&header, start.data(), start.size());
-  const std::string line(text_of(take(rest, header.sizes[0])));
+  std::string_view rest(reinterpret_cast<const char *>(data), size);
+  take(rest, sizeof header).copy(reinterpret_cast<char *>(&header), sizeof header);
+  const std::string line(take(rest, header.sizes[0]));
   world = {};
   for (std::size_t i = 0; i < 3; ++i) {
     const char *node = all_tables[header.nodes[i] % std::size(all_tables)].node;
     world.tables.push_back({node, i < 2 ? take(rest, header.sizes[i + 1]) : rest});
   }
-  world.tables.push_back({ring_stat_enable_node, {&header.surroundings, 1}});
+  world.tables.push_back({ring_stat_enable_node, header.surroundings & 8 ? std::string_view("\0", 1) : "\1"});
   world.has_terminal = header.surroundings & 1;
-  if (header.surroundings & 2) world.process = text_of(rest).substr(0, 20);
+  if (header.surroundings & 2) world.process = rest.substr(0, 20);
   world.files_can_open = !(header.surroundings & 4);
   run(line);
   judge(size);
@@ -200,12 +191,12 @@ int sysctlbyname(const char *name, void *old_value, std::size_t *old_length, con
                  std::size_t /*new_length*/) {
   const auto is_asked = [&](const table &each) { return each.node == name; };
   const auto first = std::ranges::find_if(world.tables, is_asked);
-  const bytes content = first == world.tables.end() ? bytes() : first->content;
+  const std::string_view content = first == world.tables.end() ? "" : first->content;
   const bool fits = !old_value || content.size() <= *old_length;
   *old_length = content.size();
   if (!fits) errno = ENOMEM;
   if (!fits || !old_value) return fits ? 0 : -1;
-  std::copy(content.begin(), content.end(), static_cast<std::uint8_t *>(old_value));
+  content.copy(static_cast<char *>(old_value), content.size());
   if (std::count_if(first, world.tables.end(), is_asked) > 1) world.tables.erase(first);
   return 0;
 }

@@ -31,7 +31,7 @@ COMMANDS = {
     "stats.net_if": "interface;netstat --netif;netstat --netif --show-zeros;netstat --netif --global -f",
     "stats.flow_switch": "flow-switch;netstat --flowswitch --show-zeros;netstat --flowswitch --global",
     "stats.arena": "memory;-w 1 memory;-w x memory",
-    "stats.netns": "netns;netns -a;netns -ap tcp;netns -i global -p tcp;netns --ip=::1 --proto udp;netns -i 1.2.3.4",
+    "stats.netns": "netns;netns -a;netns -ap tcp;netns -i global -p tcp;netns --ip=fe80::1 --proto udp;netns -i 1.2.3",
 }
 KINDS = "providers nexuses channels rings flows stacks arenas namespaces processes".split()
 SIZES = (2, 1, 1, 1, 1, 1, 1, 1, 1), (4, 3, 3, 2, 4, 1, 1, 3, 2)
