@@ -120,7 +120,8 @@ TEST(naming, ServicesAreAskedForByProtocol) {
 
 TEST(naming, NumbersAreAskedOfNobodyButForScopesNotYetKnown) {
   const std::string cut = "fe80::7%" + std::string(41, 'i'), long_end = ":1111:2222:3333:4444:5555:6666";
-  know("257 - 258 fe80::7%interface-of-15 259 fe80::7%interface-of-16c 260 fe80:104::7 261 " + cut + "i");
+  know("257 - 258 fe80::7%interface-of-15 259 fe80::7%interface-of-16c 260 fe80:104::7 261 " + cut +
+       "i 262 fe80:0" + long_end + "%interface-of-15");
   host_naming naming(true);
   EXPECT_EQ(tell(naming, "1.2.3.0 0.0.0.0 :: fd11:1111:2222:3333:4444:5555:6666:7777"),
             "1.2.3.0 * * fd11:1111:2222:3333:4444:5555:6666:7777 |");
@@ -129,8 +130,9 @@ TEST(naming, NumbersAreAskedOfNobodyButForScopesNotYetKnown) {
   EXPECT_EQ(tell(naming, "fe80:102::7 fe80:102::8 fe80:102" + long_end),
             "fe80::7%interface-of-15 fe80::8%interface-of-15 fe80:0" + long_end + "%interface-of | 258");
   for (int times = 0; times < 2; ++times) {  // what can be of use for no other address
-    EXPECT_EQ(tell(naming, "fe80:101::7 fe80:103::7 fe80:104::7 fe80:105::7"),
-              "? fe80::7%interface-of-16c fe80:104::7 " + cut + " | 257 259 260 261");
+    EXPECT_EQ(tell(naming, "fe80:101::7 fe80:103::7 fe80:104::7 fe80:105::7 fe80:106" + long_end),
+              "? fe80::7%interface-of-16c fe80:104::7 " + cut + " fe80:0" + long_end +
+                  "%interface-of | 257 259 260 261 262");
   }
 }
 

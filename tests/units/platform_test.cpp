@@ -8,6 +8,7 @@
 #include <fstream>
 #include <sstream>
 
+#include "common/channel_snapshot.h"
 #include "common/text/output_helpers.h"
 #include "platform/memory.h"
 #include "platform/sysctl.h"
@@ -64,8 +65,8 @@ TEST_F(kernel_files, VariableIsDeliveredWhereItFits) {
   for (const std::string &text : {"ten bytes."s, std::string(100'000, 'x'), ""s}) {
     put("sys/a", text);
     EXPECT_EQ(ask("a"), std::to_string(text.size()));
-    for (const std::size_t more : {0, 5}) EXPECT_EQ(ask("a", text.size() + more), text);
-    for (const std::size_t size : {0, 1, 9}) EXPECT_EQ(ask("a", size), text.empty() ? "" : "ENOMEM");
+    for (const std::size_t more : {0U, 5U}) EXPECT_EQ(ask("a", text.size() + more), text);
+    for (const std::size_t size : {0U, 1U, 9U}) EXPECT_EQ(ask("a", size), text.empty() ? "" : "ENOMEM");
   }
   char none = 'n';
   EXPECT_EQ(sysctlbyname("a", &none, nullptr, nullptr, 0) + none, 'n');
@@ -74,6 +75,33 @@ TEST_F(kernel_files, VariableIsDeliveredWhereItFits) {
     EXPECT_EQ(sysctlbyname("a", nullptr, nullptr, value, 1), -1);
     EXPECT_EQ(errno, EPERM);
   }
+}
+
+TEST_F(kernel_files, TableIsFetchedIntoABlockOfItsOwn) {
+  const auto fetch = [](const char *new_value) {
+    const capture said(diagnostics);
+    void *buffer = &buffer;
+    std::size_t length = 7;
+    const int status = sysctl_fetch("a", &buffer, &length, new_value, 0);
+    const std::unique_ptr<void, c_free> block(buffer);
+    EXPECT_TRUE(block || status || length == 0);
+    return said.text() + (block ? std::string(static_cast<char *>(buffer), length) : std::to_string(status));
+  };
+  for (const char *text : {"", "data"}) {
+    put("sys/a", text);
+    EXPECT_EQ(fetch(nullptr), *text ? text : "0");
+  }
+  EXPECT_EQ(fetch("new"), "sysctl for len failed, Operation not permitted\n1");
+}
+
+// As many searches as would take minutes if each of them looked at every nexus.
+TEST_F(kernel_files, NexusesWithoutChannelsAreLookedAtOnce) {
+  constexpr std::uint32_t count = 1'000'000;
+  put("sys/kern/tarvel/nexus_channel_list", std::string(24 * count, '\0'));
+  channel_snapshot snapshot;
+  EXPECT_TRUE(channel_snapshot_fetch(snapshot));
+  ASSERT_EQ(snapshot.ref_count(), count);
+  for (std::uint32_t i = 0; i < count; ++i) ASSERT_EQ(channel_snapshot_find(snapshot, {}), nullptr);
 }
 
 // What is below a root was made by whoever made the root.
@@ -103,26 +131,22 @@ TEST_F(kernel_files, BelowARootNothingButItsOwnFilesIsOpened) {
 }
 
 TEST_F(kernel_files, SwitchThatIsAskedForAgainAnswersAnew) {
-  put("sys/two", "2");
+  std::string told;
+  const auto ask_in_turn = [&told](std::initializer_list<const char *> names) {
+    for (const char *name : names) told += ask(name, 1) + " ";
+  };
   for (const char *value : {"a", "b"}) {
     put("sys/one", value);
-    for (int times = 0; times < 2; ++times) EXPECT_EQ(ask("one", 1), value);
+    put("sys/two", "2");
+    ask_in_turn({"one", "one", "two"});
+    fs::remove(root + "/proc/sys/two");
+    ask_in_turn({"one", "two", "two"});
   }
-  const auto expect_two = [](const std::string &told) {
-    EXPECT_EQ(ask("two", 1), told);
-    EXPECT_EQ(ask("one", 1), "b");
-    EXPECT_EQ(ask("two", 1), told);
-  };
-  expect_two("2");
-  fs::remove(root + "/proc/sys/two");
-  put("sys/two", "3");
-  EXPECT_EQ(ask("one"), "1");
-  expect_two("3");
   put("sys/two", "too long");
-  EXPECT_EQ(ask("one", 1), "b");
-  expect_two("ENOMEM");
-  fs::remove(root + "/proc/sys/two");
-  expect_two("ENOENT");
+  ask_in_turn({"one", "two"});
+  put("sys/two", "3");
+  ask_in_turn({"two"});
+  EXPECT_EQ(told, "a a 2 a ENOENT ENOENT b b 2 b ENOENT ENOENT b ENOMEM 3 ");
 }
 
 // The name of a process, or its cut form, in a buffer behind which nothing may change.
@@ -140,7 +164,7 @@ TEST_F(kernel_files, LiveMachineIsSeenOnlyWithoutARoot) {
   prctl(PR_SET_NAME, "a tarvel test");
   EXPECT_EQ(name_of(getpid()), "a tarvel test,");
   EXPECT_EQ(ask("kernel.ostype") + ask("kernel.ostype", 6) + ask("kernel.ostype", 5), "6Linux\nENOMEM");
-  for (const std::size_t size : {0, 1, 100}) EXPECT_EQ(ask("kern.broken", size), "EIO");
+  for (const std::size_t size : {0U, 1U, 100U}) EXPECT_EQ(ask("kern.broken", size), "EIO");
   EXPECT_EQ(ask("kern.broken") + ask("kernel"), "EIOEISDIR");
   const std::size_t size = std::stoul(ask("kern.long"));
   EXPECT_GT(size, 20'000U);

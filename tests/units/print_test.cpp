@@ -45,8 +45,7 @@ template <format::text F, class... Args>
 void agree(const Args &...args) {
   char expected[1024];
   const int size = std::snprintf(expected, sizeof expected, F.chars, args...);
-  EXPECT_EQ(shown<F>(guard::none, args...), std::string_view(expected, static_cast<std::size_t>(size)))
-      << F.chars;
+  EXPECT_EQ(shown<F>(guard::none, args...), std::string(expected, expected + size)) << F.chars;
 }
 
 // Compares each format for a value that `make` makes anew in every round; stops at the first disagreement.

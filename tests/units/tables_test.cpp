@@ -1,66 +1,17 @@
-// Fetching tables, also such as grow meanwhile, walking them, and finding what is in them.
+// Walking tables by their descriptions, and what else finds and holds things in memory.
 
 #include "common/tables/tables.h"
-#include "common/channel_snapshot.h"
 #include "common/mib.h"
+#include "common/tables/key_index.h"
 #include "common/tables/table_walk.h"
-#include "platform/sysctl.h"
 #include "tests/units/units.h"
-
-static std::string table,
-    answers;  // of a kernel: an x for each call that fails with ENOMEM, a dot for others
-static const void *new_value = nullptr;
-
-extern "C" decltype(sysctlbyname) __real_sysctlbyname;
-extern "C" int __wrap_sysctlbyname(const char *name, void *old_value, std::size_t *old_length,
-                                   const void *value, std::size_t length) {
-  if (answers.empty()) return __real_sysctlbyname(name, old_value, old_length, value, length);
-  EXPECT_EQ(std::pair(value, length), std::pair(new_value, new_value ? 1UL : 0UL));
-  EXPECT_TRUE(!old_value || *old_length == table.size());
-  const bool fails = answers[0] == 'x';
-  answers.erase(0, 1);
-  *old_length = table.size();
-  if (old_value && !fails) std::memcpy(old_value, table.data(), table.size());
-  errno = ENOMEM;
-  return fails ? -1 : 0;
-}
 
 namespace {
 
-TEST(sysctl_fetch, GoesOnUpToTheEleventhFailureForWantOfMemory) {
-  const auto fetch = [](const std::string &script) {
-    void *buffer = &answers;
-    std::size_t length = 7;
-    answers = script;
-    const capture unused(diagnostics);
-    const std::string status =
-        std::to_string(sysctl_fetch("a", &buffer, &length, new_value, new_value ? 1 : 0));
-    const std::unique_ptr<void, c_free> block(buffer);
-    EXPECT_EQ(answers, "");
-    return status + (block ? std::string(static_cast<char *>(buffer), length) : " no block");
-  };
-  EXPECT_EQ(fetch("."), "0 no block");
-  table = "data";
-  for (const void *value : {static_cast<void *>(nullptr), static_cast<void *>(&table)}) {
-    new_value = value;
-    EXPECT_EQ(fetch("..") + fetch(".x..") + fetch(".xxxx.x.x.xxx.."), "0data0data0data");
-    EXPECT_EQ(fetch(".x.x.x.x.x.x.x.x.x.x.x") + fetch(".x.xxxxxxxxxx"), "12 no block12 no block");
-  }
-  new_value = nullptr;
-}
-
 TEST(allocation, EndsTheProcessOrIsABlockAlsoOfNothing) {
-  const auto attempt = [] {
-    diagnostics.attach(STDERR_FILENO);
-    report.attach(open("/dev/full", O_WRONLY));
-    print<"lost\n">();
-    volatile std::size_t size = SIZE_MAX / 2;
-    xmalloc(size);
-  };
-  EXPECT_EXIT(attempt(), testing::ExitedWithCode(255),
-              "write error: No space left on device\nmalloc failed$");
-  const std::unique_ptr<void, c_free> resized(xrealloc(xmalloc(0), 0));
-  EXPECT_NE(resized, nullptr);
+  EXPECT_EXIT((diagnostics.attach(STDERR_FILENO), xmalloc(SIZE_MAX / 2)), testing::ExitedWithCode(255),
+              "malloc failed$");
+  EXPECT_NE((std::unique_ptr<void, c_free>(xrealloc(xmalloc(0), 0))), nullptr);
 }
 
 // So many zeros, with bytes in some places.
@@ -70,9 +21,7 @@ std::string record(std::size_t size,
   for (const auto &[at, value] : values) bytes.replace(at, value.size(), value);
   return bytes;
 }
-record_bytes bytes_of(std::string_view text) {
-  return std::as_bytes(std::span(text));
-}
+constexpr auto bytes_of = [](std::string_view text) { return std::as_bytes(std::span(text)); };
 
 // The noun of each record, with the size of its followers of either kind.
 std::string visited(const record_description &what, const std::string &bytes) {
@@ -128,21 +77,10 @@ TEST(key_index, FindsWhatWasAddedFirst) {
   constexpr unsigned count = 1000;
   key_index index;
   EXPECT_EQ(index.find(0U), key_index::none);
-  for (const std::size_t room : {100, 10}) index.reserve(room);
+  for (const std::size_t room : {100U, 10U}) index.reserve(room);
   for (unsigned i = 0; i < count; ++i) EXPECT_TRUE(index.add(i, i));
   for (unsigned i = 0; i < count; ++i) EXPECT_FALSE(index.add(i, i + 1));
   for (unsigned i = 0; i <= count; ++i) EXPECT_EQ(index.find(i), i < count ? i : key_index::none);
-}
-
-// As many searches as would take minutes if each of them looked at every nexus.
-TEST(channel_snapshot, NexusesWithoutChannelsAreLookedAtOnce) {
-  constexpr std::uint32_t count = 1'000'000;
-  table.assign(24 * count, '\0');
-  answers = "..";
-  channel_snapshot snapshot;
-  EXPECT_TRUE(channel_snapshot_fetch(snapshot));
-  ASSERT_EQ(snapshot.ref_count(), count);
-  for (std::uint32_t i = 0; i < count; ++i) ASSERT_EQ(channel_snapshot_find(snapshot, {}), nullptr);
 }
 
 TEST(object_type_name, NamesTypesOnly) {
