@@ -41,8 +41,8 @@ def pattern(shown, moves):
     pieces = re.split(r"^\.\.\.$\n?", shown, flags=re.M)
     first, *others = [".*".join(map(escaped, piece.split("..."))) for piece in pieces]
     skip = r"(?:.*\n)*?"
-    middle = [f"(?>{skip}{piece})" for piece in others[:-1]]
-    return re.compile("".join([first, *middle, *(skip + piece for piece in others[-1:])]))
+    middle = "".join(f"(?>{skip}{piece})" for piece in others[:-1])
+    return re.compile(first + middle + (skip + others[-1] if others else ""))
 
 
 class Docs(unittest.TestCase):
@@ -55,10 +55,10 @@ class Docs(unittest.TestCase):
             process = subprocess.Popen(["bash", "-c", command], cwd=folder / "cwd", env=env, stdin=subprocess.DEVNULL,
                                        stdout=out, stderr=out)
         self.addCleanup(process.kill)
-        end = time.monotonic() + 30
-        while expected and not expected.fullmatch(printed()) and time.monotonic() < end:
-            time.sleep(0.1)
         if expected:
+            end = time.monotonic() + 30
+            while not expected.fullmatch(printed()) and time.monotonic() < end:
+                time.sleep(0.1)
             process.send_signal(signal.SIGINT)
         self.assertEqual(process.wait(30), 0, printed())
         return printed()
@@ -85,8 +85,7 @@ class Docs(unittest.TestCase):
     def test_CommandsPrintWhatThePagesShow(self):
         self.assertTrue([*commands(top / "README.md")])
         for page in pages:
-            with tempfile.TemporaryDirectory() as folder:
-                self.check_page(page, pathlib.Path(folder))
+            self.check_page(page, pathlib.Path(self.enterContext(tempfile.TemporaryDirectory())))
 
     def test_LinksLeadSomewhere(self):
         for page in pages:
