@@ -22,7 +22,8 @@ bool channel_snapshot::frame() {
 void channel_snapshot::append(const channel_ref &ref) {
   if (ref_count_ == capacity_) {
     capacity_ = capacity_ ? 2 * capacity_ : 10;
-    void *const grown = xrealloc(refs_.release(), capacity_ * sizeof ref);
+    void *const grown = xrealloc(refs_.get(), capacity_ * sizeof ref);
+    static_cast<void>(refs_.release());
     refs_.reset(static_cast<channel_ref *>(grown));
   }
   refs_[ref_count_++] = ref;
