@@ -67,8 +67,8 @@ class Capture(CaptureCase):
         before = time.strftime(DATE, time.gmtime())
         self.saved.root.mkdir(0o755)
         self.assertEqual(self.lab("capture saved").err, NOTE)
-        paths = [self.saved.root, *self.saved.root.rglob("*")]
-        modes = {(path.is_dir(), path.stat().st_mode & 0o777) for path in paths}
+        modes = {(path.is_dir(), path.stat().st_mode & 0o777)
+                 for path in [self.saved.root, *self.saved.root.rglob("*")]}
         self.assertEqual(modes, {(True, 0o700), (False, 0o600)})
         made, saved = files(kernel.root), files(self.saved.root)
         note = saved.pop("capture.txt").decode()
@@ -84,8 +84,7 @@ class Capture(CaptureCase):
         self.capture("", "", GONE, 1)
         self.assertFalse(self.saved.root.exists())
         made = files(generate(self.kernel.root).root)
-        (self.directory / "file").touch()
-        for place, reason in ("kernel", "Directory not empty"), ("file", "Not a directory"):
+        for place, reason in ("kernel", "Directory not empty"), (tarvellab, "Not a directory"):
             self.assertEqual(self.lab(f"capture {place}"), ("", f"tarvellab: {place}: {reason}\n", 1))
         self.assertEqual(files(self.kernel.root), made)
         flow = self.kernel.path("stats/flow")

@@ -170,8 +170,8 @@ class Run(LabCase):
         def ignore():
             for number in signal.SIGCHLD, signal.SIGTERM:
                 signal.signal(number, signal.SIG_IGN)
-        commands = {"true": 0, "sh -c 'exit 7'": 7, "no-such-command": 127, "/dev/null": 126, "sh -c 'kill -KILL $$'": -9,
-                    "env --default-signal=TERM sh -c 'kill -TERM $$'": -15}
+        commands = {"true": 0, "sh -c 'exit 7'": 7, "no-such-command": 127, "/dev/null": 126,
+                    "sh -c 'kill -KILL $$'": -9, "env --default-signal=TERM sh -c 'kill -TERM $$'": -15}
         for command, prepare in itertools.product(commands, (None, ignore)):
             seen = self.run_lab("--", *shlex.split(command), preexec_fn=prepare).end()
             self.assertEqual(seen.status, commands[command], command)

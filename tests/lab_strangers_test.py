@@ -33,12 +33,11 @@ class Strangers(LabCase):
 
     def said(self, place, lines, kernel=None, seconds=60):
         """What runs say that make or enter a place. What goes on behind that time is ended."""
-        runs = []
-        for line in lines:
-            runs.append(self.start(line.format(place), tarvellab, kernel=kernel))
+        def said_by(run):
             with contextlib.suppress(subprocess.TimeoutExpired):
-                runs[-1].process.wait(seconds)
-        return {run.end(signal.SIGINT).err for run in runs}
+                run.process.wait(seconds)
+            return run.end(signal.SIGINT).err
+        return {said_by(self.start(line.format(place), tarvellab, kernel=kernel)) for line in lines}
 
     def stranger(self, *acts):
         """A child that acts again and again; what fails now may work the next time."""
