@@ -1,11 +1,11 @@
 // Prints what is known of every table as one JSON document, for tests that are no C++.
 
-#include <cstdio>
-#include <map>
-#include <string>
+#include <unistd.h>
+
 #include <vector>
 
 #include "common/tables/tables.h"
+#include "common/text/output.h"
 
 namespace {
 
@@ -18,75 +18,61 @@ constexpr const char *kinds[] = {"unread", "identifier",  "number", "gauge",   "
 static_assert(std::size(types) == static_cast<std::size_t>(field_type::record) + 1);
 static_assert(std::size(kinds) == static_cast<std::size_t>(field_kind::nested) + 1);
 
-std::string said(std::string_view text) {
-  return '"' + std::string(text) + '"';
-}
-std::string said(std::size_t number) {
-  return std::to_string(number);
-}
-
-std::string list(const std::vector<std::string> &items) {
-  std::string text;
-  for (const std::string &item : items) text += (text.empty() ? "" : ", ") + item;
-  return '[' + text + ']';
-}
-
-std::string object(const std::vector<std::pair<std::string, std::string>> &members) {
-  std::string text;
-  for (const auto &[key, value] : members) text += (text.empty() ? "" : ", ") + said(key) + ": " + value;
-  return '{' + text + '}';
-}
-
-std::string described(const row &field) {
-  std::vector<std::pair<std::string, std::string>> values;
-  for (const auto &[number, name] : field.values)
-    values.emplace_back(std::to_string(number), said(name.view()));
-  for (std::size_t i = 0; field.flags && i < field.flags->count; ++i) {
-    const auto &[bit, name] = field.flags->entries[i];
-    values.emplace_back(std::to_string(bit), said(name.view()));
+template <class Items, class Print>
+void print_each(const Items &items, Print print_one) {
+  const char *comma = "";
+  for (const auto &item : items) {
+    print<"%s">(std::exchange(comma, ",\n"));
+    print_one(item);
   }
-  std::vector<std::string> names;
-  for (std::size_t i = 0; field.names && i < field.count; ++i) names.push_back(said(field.names[i].name()));
-  return object({{"field", said(field.field)},
-                 {"part", said(field.part)},
-                 {"offset", said(field.offset)},
-                 {"size", said(field.size)},
-                 {"count", said(field.count)},
-                 {"type", said(types[static_cast<int>(field.type)])},
-                 {"kind", said(kinds[static_cast<int>(field.kind)])},
-                 {"name", said(field.name)},
-                 {"meaning", said(field.meaning)},
-                 {"part_meaning", said(field.part_meaning)},
-                 {"unit", said(field.unit)},
-                 {"nested", said(field.nested ? field.nested->name : "")},
-                 {"values", object(values)},
-                 {"names", list(names)}});
 }
 
-void describe(const record_description &what, std::map<std::string, std::string> &records) {
-  std::vector<std::string> rows, followers;
-  for (const row &field : what.rows) {
-    rows.push_back(described(field));
-    if (field.nested) describe(*field.nested, records);
+constexpr auto print_value = [](const auto &value) {
+  const auto &[number, name] = value;
+  print<R"("%lld": "%s")">(std::int64_t{number}, name);
+};
+
+void print_row(const row &field) {
+  print<
+      R"({"field": "%s", "part": "%s", "name": "%s", "meaning": "%s", "part_meaning": "%s", "unit": "%s", )">(
+      field.field, field.part, field.name, field.meaning, field.part_meaning, field.unit);
+  print<R"("offset": %u, "size": %u, "count": %u, "type": "%s", "kind": "%s", "nested": "%s", "values": {)">(
+      field.offset, field.size, field.count, types[static_cast<int>(field.type)],
+      kinds[static_cast<int>(field.kind)], field.nested ? field.nested->name : "");
+  print_each(field.values, print_value);
+  if (field.flags) print_each(std::span(field.flags->entries, field.flags->count), print_value);
+  print<R"(}, "names": [)">();
+  if (field.names) {
+    print_each(std::span(field.names, field.count), [](auto &each) { print<R"("%s")">(each.name()); });
   }
-  for (const follower &each : what.followers) {
-    followers.push_back(object(
-        {{"name", said(each.name)}, {"at", said(each.count.offset)}, {"record", said(each.each->name)}}));
-    describe(*each.each, records);
+  print<"]}">();
+}
+
+// The records that it consists of and that follow it, and itself, behind a comma but for the first of all.
+void print_record(const record_description &record, const char *&comma) {
+  for (const row &field : record.rows) {
+    if (field.nested) print_record(*field.nested, comma);
   }
-  records[std::string(what.name)] =
-      object({{"size", said(what.size)}, {"rows", list(rows)}, {"followers", list(followers)}});
+  for (const follower &each : record.followers) print_record(*each.each, comma);
+  print<R"(%s"%s": {"size": %llu, "rows": [)">(std::exchange(comma, ",\n"), record.name, record.size);
+  print_each(record.rows, print_row);
+  print<R"(], "followers": [)">();
+  print_each(record.followers, [](const follower &each) {
+    print<R"({"name": "%s", "at": %u, "record": "%s"})">(each.name, each.count.offset, each.each->name);
+  });
+  print<"]}">();
 }
 
 }  // namespace
 
 int main() {
-  std::map<std::string, std::string> records;
-  std::vector<std::pair<std::string, std::string>> tables;
-  for (const table_description &table : all_tables) {
-    tables.emplace_back(table.node, said(table.record->name));
-    describe(*table.record, records);
-  }
-  std::printf("{\"tables\": %s,\n\"records\": %s}\n", object(tables).c_str(),
-              object({records.begin(), records.end()}).c_str());
+  report.attach(STDOUT_FILENO);
+  print<R"({"records": {)">();
+  const char *comma = "";
+  for (const table_description &table : all_tables) print_record(*table.record, comma);
+  print<R"(}, "tables": {)">();
+  print_each(all_tables,
+             [](const table_description &table) { print<R"("%s": "%s")">(table.node, table.record->name); });
+  print<"}}\n">();
+  report.close();
 }
