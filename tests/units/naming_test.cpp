@@ -3,6 +3,8 @@
 #include <arpa/inet.h>
 #include <netdb.h>
 
+#include <algorithm>
+#include <bit>
 #include <iostream>
 #include <map>
 #include <random>
@@ -72,12 +74,13 @@ std::string tell(host_naming &naming, const std::string &addresses, const char *
   for (std::string address; words >> address; names += " ") {
     ipv4_address ipv4;
     ipv6_address ipv6;
-    const bool is_ipv4 = inet_pton(AF_INET, address.c_str(), &ipv4) == 1;
-    if (!is_ipv4) inet_pton(AF_INET6, address.c_str(), &ipv6);
-    if (is_ipv4 && protocol) names += naming.ipv4_endpoint_name(ipv4, htons(port), protocol).view();
-    if (is_ipv4 && !protocol) names += naming.ipv4_host_name(ipv4).view();
-    if (!is_ipv4 && protocol) names += naming.ipv6_endpoint_name(ipv6, htons(port), protocol).view();
-    if (!is_ipv4 && !protocol) names += naming.ipv6_host_name(ipv6).view();
+    if (inet_pton(AF_INET, address.c_str(), &ipv4) == 1) {
+      names += protocol ? naming.ipv4_endpoint_name(ipv4, htons(port), protocol).view()
+                        : naming.ipv4_host_name(ipv4).view();
+    } else if (inet_pton(AF_INET6, address.c_str(), &ipv6) == 1) {
+      names += protocol ? naming.ipv6_endpoint_name(ipv6, htons(port), protocol).view()
+                        : naming.ipv6_host_name(ipv6).view();
+    }
   }
   return names + asked;
 }
@@ -108,14 +111,12 @@ TEST(naming, HostsAreAskedForByClassAndShownWithoutTheLocalDomain) {
 TEST(naming, ServicesAreAskedForByProtocol) {
   know("443/tcp https 443/tcp6 six 443/udp quic 80/tcp a-service-of-17-");
   host_naming naming(false);
-  EXPECT_EQ(tell(naming, "1.2.3.4", "tcp"), "1.2.3.4.https  | 1.2.3.4 443/tcp");
-  EXPECT_EQ(tell(naming, "1.2.3.4", "tcp6"), "1.2.3.4.six  | 1.2.3.4 443/tcp6");
-  EXPECT_EQ(tell(naming, "1.2.3.4", "udp6"), "1.2.3.4.443  | 1.2.3.4 443/udp6");
-  EXPECT_EQ(tell(naming, "1.2.3.4", "unk.", 65535), "1.2.3.4.65535  | 1.2.3.4 65535/unk.");
+  EXPECT_EQ(tell(naming, "1.2.3.4 ::", "tcp"), "1.2.3.4.https  *.https | 1.2.3.4 443/tcp 443/tcp");
+  EXPECT_EQ(tell(naming, "1.2.3.4 ::", "tcp6"), "1.2.3.4.six  *.https | 1.2.3.4 443/tcp6 443/tcp");
+  EXPECT_EQ(tell(naming, "1.2.3.4 ::", "udp6"), "1.2.3.4.443  *.quic | 1.2.3.4 443/udp6 443/udp");
+  EXPECT_EQ(tell(naming, "::", "udp", 65535), "*.65535 | 65535/udp");
   EXPECT_EQ(tell(naming, "1.2.3.4", "tcp", 80), "1.2.3.4.a-service-of-17  | 1.2.3.4 80/tcp");
   EXPECT_EQ(tell(naming, "1.2.3.4 ::", "tcp", 0), "1.2.3.4.*  *.* | 1.2.3.4");
-  for (const char *tcp : {"tcp", "tcp6"}) EXPECT_EQ(tell(naming, "::", tcp), "*.https | 443/tcp");
-  for (const char *udp : {"udp", "udp6"}) EXPECT_EQ(tell(naming, "::", udp), "*.quic | 443/udp");
 }
 
 TEST(naming, NumbersAreAskedOfNobodyButForScopesNotYetKnown) {
@@ -123,8 +124,7 @@ TEST(naming, NumbersAreAskedOfNobodyButForScopesNotYetKnown) {
   know("257 - 258 fe80::7%interface-of-15 259 fe80::7%interface-of-16c 260 fe80:104::7 261 " + cut +
        "i 262 fe80:0" + long_end + "%interface-of-15");
   host_naming naming(true);
-  EXPECT_EQ(tell(naming, "1.2.3.0 0.0.0.0 :: fd11:1111:2222:3333:4444:5555:6666:7777"),
-            "1.2.3.0 * * fd11:1111:2222:3333:4444:5555:6666:7777 |");
+  EXPECT_EQ(tell(naming, "1.2.3.0 0.0.0.0 ::"), "1.2.3.0 * * |");
   EXPECT_EQ(tell(naming, "1.2.3.4 0.0.0.0 :: fd11:1111:2222:3333:4444:5555:6666:7777", "tcp"),
             "1.2.3.4.443  *.443  *.443 fd11:1111:2222:3333:4444:5555:6666:77.443 |");
   EXPECT_EQ(tell(naming, "fe80:102::7 fe80:102::8 fe80:102" + long_end),
@@ -143,24 +143,25 @@ TEST(naming, NumericIpv6IsTheSystemsForm) {
   know("");
   for (unsigned i = 0; i < 1'000'000; ++i) {
     std::uint16_t groups[8];  // of one to four digits, or zero by a bit of `i`: every shape of zeros
-    for (std::uint16_t &group : groups)
-      group = static_cast<std::uint16_t>(random() >> 48 >> 4 * (random() & 3));
-    for (unsigned at = 0; at < 8; ++at) groups[at] = i >> at & 1 ? 0 : groups[at];
+    for (std::uint16_t &group : groups) {
+      group =
+          static_cast<std::uint16_t>(i >> (&group - groups) & 1 ? 0 : random() >> 48 >> 4 * (random() & 3));
+    }
     if (i % 7 == 0) groups[0] = special[random() % std::size(special)];
     if (i % 5 == 0) groups[1] &= 3;      // interfaces with a name
     if (i % 3 == 0) groups[5] = 0xFFFF;  // an IPv4 address, where all before it is zero
-    const bool is_multicast = (groups[0] & 0xFF0F) == 0xFF01 || (groups[0] & 0xFF0F) == 0xFF02;
-    const bool has_scope = is_multicast || (groups[0] & 0xFFC0) == 0xFE80;
+    const unsigned multicast = groups[0] & 0xFF0F;
+    const bool has_scope = multicast == 0xFF01 || multicast == 0xFF02 || (groups[0] & 0xFFC0) == 0xFE80;
     sockaddr_in6 socket{.sin6_family = AF_INET6, .sin6_scope_id = has_scope ? groups[1] : 0U};
-    for (std::uint16_t &group : groups) group = htons(group);
-    ipv6_address address;
-    std::memcpy(address.bytes, groups, sizeof groups);
-    if (has_scope) groups[1] = 0;
-    std::memcpy(&socket.sin6_addr, groups, sizeof groups);
+    std::transform(groups, groups + 8, groups, htons);
+    const auto address = std::bit_cast<ipv6_address>(groups);
+    std::copy_n(groups, 8, socket.sin6_addr.s6_addr16);
+    if (has_scope) socket.sin6_addr.s6_addr16[1] = 0;
     char text[1025] = "?";
     const auto *generic = reinterpret_cast<const sockaddr *>(&socket);
     __real_getnameinfo(generic, sizeof socket, text, sizeof text, nullptr, 0, NI_NUMERICHOST);
-    ASSERT_EQ(naming.ipv6_host_name(address).view(), text == "::"s ? "*" : std::string(text).substr(0, 49));
+    const std::string_view expected = text;
+    ASSERT_EQ(naming.ipv6_host_name(address).view(), expected == "::" ? "*" : expected.substr(0, 49));
   }
 }
 

@@ -16,7 +16,7 @@ namespace {
 using format::guard;
 
 // Watches the promise of its users to stay within the room that they asked for.
-struct watched_sink {
+struct {
   char *room(std::size_t size) {
     fence = chars + size + format::slack;
     *fence = '\x55';
@@ -29,13 +29,14 @@ struct watched_sink {
   guard reader_guard() const { return against; }
 
   guard against;
-  char *fence = nullptr, *end = nullptr;
+  char *fence, *end;
   char chars[4096];
-};
+} sink;
 
+// What a format gives, until the next call.
 template <format::text F, class... Args>
-std::string shown(guard against, const Args &...args) {
-  watched_sink sink{.against = against};
+std::string_view shown(guard against, const Args &...args) {
+  sink.against = against;
   format::print_to<F>(sink, args...);
   return {sink.chars, sink.end};
 }
@@ -45,7 +46,7 @@ template <format::text F, class... Args>
 void agree(const Args &...args) {
   char expected[1024];
   const int size = std::snprintf(expected, sizeof expected, F.chars, args...);
-  EXPECT_EQ(shown<F>(guard::none, args...), std::string(expected, expected + size)) << F.chars;
+  EXPECT_EQ(shown<F>(guard::none, args...), std::string_view(expected, expected + size)) << F.chars;
 }
 
 // Compares each format for a value that `make` makes anew in every round; stops at the first disagreement.
@@ -99,34 +100,16 @@ TEST(format, DoublesAgreeWithPrintf) {
 }
 
 TEST(format, ExtremesAgreeWithPrintf) {
-  agree<"%d %d %u %lld %lld %llu">(INT_MIN, INT_MAX, UINT_MAX, LLONG_MIN, LLONG_MAX, ULLONG_MAX);
-  for (unsigned byte = 0; byte < 256; ++byte) {
-    agree<"%02x:%u">(static_cast<std::uint8_t>(byte), static_cast<std::uint8_t>(byte));
-  }
   EXPECT_EQ(shown<"">(guard::none), "");
-  agree<"100%%\n\tPort[%2u] %-8s (fd %d)\t%%%c">(7U, "en0", -1, '!');
-  unsigned long long power = 1;
-  for (int digits = 1; digits <= 20; ++digits, power *= 10) {
-    agree<"%llu %llu %llu %lld">(power - 1, power, power + 1, -static_cast<long long>(power));
-  }
+  agree<"100%%\n\tPort[%2u] %-8s (fd %d)\t%%%c %02x">(7U, "en0", -1, '!', std::uint8_t{255});
+  agree<"%d %d %u %lld %lld %llu">(INT_MIN, INT_MAX, UINT_MAX, LLONG_MIN, LLONG_MAX, ULLONG_MAX);
+  for (unsigned long long power = 1; power < ULLONG_MAX / 10; power *= 10)
+    agree<"%llu %llu">(power - 1, power);
   for (const double value :
-       {0.0,     0.005,        0.015,       0.125,    0.375,       0.994999, 0.995,        1.005,
-        2.675,   9.995,        1e-5,        1e-4,     999999.5,    1e6,      1e22,         1e300,
-        0x1p52,  0x1p52 + 0.5, 0x1p53 - 1,  0x1p53,   0x1p53 + 2,  0x1p63,   1e15 + 0.125, DBL_MAX,
-        DBL_MIN, DBL_TRUE_MIN, DBL_EPSILON, HUGE_VAL, std::nan("")}) {
-    agree<"%.2f %5.2f %7.2f %g">(value, value, value, value);
-    agree<"%.2f %5.2f %7.2f %g">(-value, -value, -value, -value);
+       {0.0, 0.125, 0.375, 0.994999, 0.995, 9.995, 1e-5, 1e-4, 999999.5, 1e6, 0x1p52 + 0.5, 0x1p53 - 1,
+        0x1p53, DBL_MAX, DBL_MIN, DBL_TRUE_MIN, HUGE_VAL, std::nan("")}) {
+    agree<"%.2f %5.2f %7.2f %g %.2f %g">(value, value, value, value, -value, -value);
   }
-}
-
-TEST(format, ForeignTextsAreGuardedWhenTheyAreCut) {
-  const foreign_text text{"\033[1m\u20ac"};
-  EXPECT_EQ((shown<"%12s|%-9.5s|%.2s">(guard::bytes, text, text, text)),
-            "     ?[1m\xe2?\xac|?[1m\xe2    |?[");
-  EXPECT_EQ((shown<"%9s|%-9.6s|%.5s">(guard::utf8, text, text, text)), "  ?[1m\u20ac|?[1m??   |?[1m?");
-  EXPECT_EQ((shown<"%s">(guard::none, text)), text.text);
-  EXPECT_EQ((shown<"%s">(guard::utf8, "\033[36mcyan\033[0m")), "\033[36mcyan\033[0m");
-  EXPECT_EQ((shown<"%s">(guard::bytes, foreign_text{"\x1f\x20\x7e\x7f\x80\x9f\xa0\xff"})), "? ~???\xa0\xff");
 }
 
 TEST(format, Utf8HidesControlsAndWhatIsNoCharacter) {
@@ -139,6 +122,8 @@ TEST(format, Utf8HidesControlsAndWhatIsNoCharacter) {
     EXPECT_EQ((shown<"%sz">(guard::utf8, foreign_text{hidden})), std::string(std::strlen(hidden), '?') + "z");
   }
   EXPECT_EQ((shown<"%s">(guard::utf8, foreign_text{"\xf0\x9f\x98\xc3\xa4\xe2(\xa1"})), "???\u00e4?(?");
+  const foreign_text text{"\033[1m\u20ac"};
+  EXPECT_EQ((shown<"%9s|%-9.6s|%.5s">(guard::utf8, text, text, text)), "  ?[1m\u20ac|?[1m??   |?[1m?");
 }
 
 }  // namespace
