@@ -119,7 +119,8 @@ TEST(output, AbandonedItGoesOnUpToItsLastWholeLine) {
   format::print_to<"one\ntwo\n">(diagnostics);
   format::print_to<"thr">(diagnostics);
   writes = {EINTR, EAGAIN, -5, EINTR};
-  EXPECT_EQ(std::to_string(diagnostics.abandon()) + captured.written(), "0one\ntwo\n");
+  EXPECT_EQ(diagnostics.abandon(), 0);
+  EXPECT_EQ(captured.written(), "one\ntwo\n");
   EXPECT_TRUE(writes.empty());
 }
 
@@ -128,7 +129,7 @@ TEST(output, AbandonedInAFlushOfHalfALineWritesNothing) {
   const capture captured(report);
   print<"unfinished">();
   writes = {-2};
-  behind_writes = [&] { EXPECT_EQ(std::to_string(report.abandon()) + captured.written(), "0un"); };
+  behind_writes = [] { EXPECT_EQ(report.abandon(), 0); };
   EXPECT_EQ(captured.text(), "unfinished");
   EXPECT_FALSE(behind_writes);
 }

@@ -108,7 +108,8 @@ TEST(format, ExtremesAgreeWithPrintf) {
   for (const double value :
        {0.0, 0.125, 0.375, 0.994999, 0.995, 9.995, 1e-5, 1e-4, 999999.5, 1e6, 0x1p52 + 0.5, 0x1p53 - 1,
         0x1p53, DBL_MAX, DBL_MIN, DBL_TRUE_MIN, HUGE_VAL, std::nan("")}) {
-    agree<"%.2f %5.2f %7.2f %g %.2f %g">(value, value, value, value, -value, -value);
+    agree<"%.2f %7.2f">(value, -value);
+    agree<"%g %g">(value, -value);
   }
 }
 
