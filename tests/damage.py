@@ -22,16 +22,8 @@ CUT = Result("", SHORT, 0)
 TREES = "tree", "show", "channel-stats"
 
 
-def nothing(_):
-    return ""
-
-
 def title(report):
     return report[:report.find("\n") + 1]
-
-
-def no_channels(_):
-    return "No channels\n"
 
 
 def in_any_order(report):
@@ -43,9 +35,10 @@ def in_any_order(report):
 # Commands, their table, how they end where it is damaged, and what they show then of the report of the whole records.
 CASES = [(command, *case) for commands, *case in (
     (("provider", "list-providers -D", *TREES), "nexus_provider_list", CUT, str),
-    (("channel",), "nexus_channel_list", CUT, no_channels),
+    (("channel",), "nexus_channel_list", CUT, lambda _: "No channels\n"),
     (TREES, "nexus_channel_list", CUT, in_any_order),
-    (TREES, "stats/flow", aborted("scrape_flows", 223, "(length % sizeof (*sf)) == 0", file="common/mib"), nothing),
+    (TREES, "stats/flow", aborted("scrape_flows", 223, "(length % sizeof (*sf)) == 0", file="common/mib"),
+     lambda _: ""),
     (("flow", "netstat -an"), "stats/flow", aborted("cmd_flow", 689, "(length % sizeof (*sf)) == 0"), title),
     (("flow-adv", "netstat --flow-adv"), "stats/flow_adv", aborted("cmd_flow_adv", 766, SCAN), str),
     (("flow-owner", "netstat --flow-owner"), "stats/flow_owner",
@@ -54,9 +47,9 @@ CASES = [(command, *case) for commands, *case in (
     (("netstat -s", "netstat -sp ip6 --show-zeros", "netstat -s --global"), "stats/userstack",
      aborted("cmd_userstack", 1038, SCAN), str),
     (("interface", "netstat --netif", "netstat --netif --global"), "stats/net_if",
-     aborted("cmd_interface", 1073, WIDTH), nothing),
+     aborted("cmd_interface", 1073, WIDTH), lambda _: ""),
     (("flow-switch", "netstat --flowswitch", "netstat --flowswitch --global"), "stats/flow_switch",
-     aborted("cmd_flow_switch", 1138, WIDTH), nothing),
+     aborted("cmd_flow_switch", 1138, WIDTH), lambda _: ""),
     (("memory",), "stats/arena", aborted("__memory_arena_stats", 1620, SCAN), str),
     (("netns -a", "netns -i global -p tcp", "netns -i 10.255.255.255 -p tcp"), "stats/netns", CUT, str))
     for command in commands]
@@ -79,7 +72,7 @@ def whole_part(records, table, cut):
     return left
 
 
-def damages(driver, records, table):
+def damages(records, table):
     """Damaged tables, as (what is wrong, the table, where one with the same end would be cut)."""
     last = records[-2:]
     cuts = {place + step for record in last for each in all_of(record) for field in each.fields
@@ -106,7 +99,7 @@ def empty_report(command, report):
     return title(report) if re.match("Proto|NetIf|Local", report) else ""
 
 
-def damage_case(driver, kernel, command, name, ending, shown):
+def damage_case(kernel, command, name, ending, shown):
     table, records = kernel.table(name), kernel.records(name)
     intact = driver.run(kernel, command)
 
@@ -117,7 +110,7 @@ def damage_case(driver, kernel, command, name, ending, shown):
         kernel.put(name, contents)
         return driver.run(kernel, command)
 
-    for what, damaged, cut in damages(driver, records, table):
+    for what, damaged, cut in damages(records, table):
         left = whole_part(records, table, cut)
         expected = whole(left)
         if left != damaged and not ("netns -i" in command and expected.out):
@@ -142,12 +135,11 @@ REORDERING = "LRE", "RLE", "PDF", "LRO", "RLO", "LRI", "RLI", "FSI", "PDI"
 HARMLESS = b"~"  # a character in every locale, and nowhere else in a report
 
 
-def texts(driver):
+def texts():
     """Texts of 16 bytes, of which a process name takes 15."""
     alphabet = bytes([*range(1, 256), 0])
     yield from (alphabet[at:at + 15].ljust(15, b".") + b"x" for at in range(0, 256, 15))
-    for _ in range(1000 if driver.long else 12):
-        yield b"".join(driver.random.choices(PIECES, k=16))[:16]
+    yield from (b"".join(driver.random.choices(PIECES, k=16))[:16] for _ in range(1000 if driver.long else 12))
     yield from (bytes([value]) for value in (alphabet if driver.long else b"\x1b\x9b"))
 
 
@@ -183,7 +175,7 @@ SINKS = {("terminal", "C"): lambda shown: hidden(shown, "latin-1"),
          ("terminal", "C.UTF-8"): lambda shown: hidden(shown, "utf-8"), ("pipe", "C"): bytes}
 
 
-def hostile_texts(driver):
+def hostile_texts():
     kernel = driver.make_kernel("--providers", 2, "--channels", 6, "--flows", 2, "--arenas", 1, "--processes", 2)
     kernel.environment.update(name_services())
     tables = {name: kernel.records(name) for name in TABLES}
@@ -193,7 +185,7 @@ def hostile_texts(driver):
         return seen.out.encode("utf-8", "surrogateescape"), seen.status
 
     harmless = {}
-    for hostile in texts(driver):
+    for hostile in texts():
         shown = hostile.split(b"\0")[0]
         if len(shown) not in harmless:
             fill(kernel, tables, HARMLESS * len(shown))
@@ -210,16 +202,11 @@ def hostile_texts(driver):
             driver.expect(line, f"the text {hostile!r} to {sink}", report(line, *sink), (expected, status))
 
 
-def main():
-    driver = Driver(__doc__)
-    small = "--providers", 2, "--channels", 6, "--flows", 2, "--arenas", 1, "--namespaces", 2, "--processes", 1
-    for sizes in (small, ()) if driver.long else (small,):
-        kernel = driver.make_kernel(*sizes)
-        for case in CASES:
-            damage_case(driver, kernel, *case)
-    hostile_texts(driver)
-    driver.end()
-
-
-if __name__ == "__main__":
-    main()
+driver = Driver(__doc__)
+small = "--providers", 2, "--channels", 6, "--flows", 2, "--arenas", 1, "--namespaces", 2, "--processes", 1
+for sizes in (small, ()) if driver.long else (small,):
+    made = driver.make_kernel(*sizes)
+    for each in CASES:
+        damage_case(made, *each)
+hostile_texts()
+driver.end()
