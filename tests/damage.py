@@ -3,14 +3,13 @@
 
 Cuts are at and right behind every field of the last two records, or at every byte in the long form; counts say one more
 than there are, what is out of any proportion, and what wraps in 32 bits. Each ending is that of a table below, behind
-the report of the whole records. On a terminal each byte that it might obey shows as "?" and nothing else moves, while a
-pipe gets the bytes as they are. Which bytes these are follows from what Python knows of characters, in UTF-8 or where
-each byte is one; the expectation is a report in which the same texts are harmless, with the bytes put in.
+the report of the whole records. On a terminal each byte that it might obey shows as "?" and nothing else moves, in
+UTF-8 or where each byte is a character, while a pipe gets the bytes as they are: what is expected is a report in which
+the same texts are harmless, with the bytes put in.
 """
 import functools
 import os
 import re
-import unicodedata
 
 from driver import Driver
 from records import RECORDS, TABLES, encoded
@@ -131,7 +130,8 @@ SHOWING = {"channel": 3, "flow": 4, "flow-adv": 2, "flow-owner": 2, "flow-route 
 # What UTF-8 is made of, and what comes near it.
 PIECES = (*(character.encode() for character in "a\u0085\u00e4\u20ac\u2027\u2028\u202e\u2066\u206a\U0001f9ed"),
           *(bytes([value]) for value in b"\x80\x9f\xa0\xbf\xc2\xe0\xe2\xed\xf0\xf4\xf8"))
-REORDERING = "LRE", "RLE", "PDF", "LRO", "RLO", "LRI", "RLI", "FSI", "PDI"
+# Controls, separators of lines and paragraphs, what reorders a text, and strays, which Python makes surrogates of.
+OBEYED = re.compile("[\0-\x1f\x7f-\x9f\u2028-\u202e\u2066-\u2069\udc80-\udcff]")
 HARMLESS = b"~"  # a character in every locale, and nowhere else in a report
 
 
@@ -161,13 +161,9 @@ def fill(kernel, tables, hostile):
 
 
 def hidden(shown, charset):
-    """Without controls, separators of lines, what reorders a text, and strays, which Python makes surrogates of."""
-    def show(character):
-        is_obeyed = (unicodedata.category(character) in ("Cc", "Cs", "Zl", "Zp")
-                     or unicodedata.bidirectional(character) in REORDERING)
-        whole = character.encode(charset, "surrogateescape")
-        return b"?" * len(whole) if is_obeyed else whole
-    return b"".join(map(show, shown.decode(charset, "surrogateescape")))
+    text = shown.decode(charset, "surrogateescape")
+    return OBEYED.sub(lambda found: "?" * len(found[0].encode(charset, "surrogateescape")), text).encode(
+        charset, "surrogateescape")
 
 
 # What a text becomes, by where the output leads and the locale.

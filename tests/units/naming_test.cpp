@@ -3,7 +3,6 @@
 #include <arpa/inet.h>
 #include <netdb.h>
 
-#include <algorithm>
 #include <bit>
 #include <iostream>
 #include <map>
@@ -114,8 +113,8 @@ TEST(naming, ServicesAreAskedForByProtocol) {
   EXPECT_EQ(tell(naming, "1.2.3.4 ::", "tcp"), "1.2.3.4.https  *.https | 1.2.3.4 443/tcp 443/tcp");
   EXPECT_EQ(tell(naming, "1.2.3.4 ::", "tcp6"), "1.2.3.4.six  *.https | 1.2.3.4 443/tcp6 443/tcp");
   EXPECT_EQ(tell(naming, "1.2.3.4 ::", "udp6"), "1.2.3.4.443  *.quic | 1.2.3.4 443/udp6 443/udp");
-  EXPECT_EQ(tell(naming, "::", "udp", 65535), "*.65535 | 65535/udp");
   EXPECT_EQ(tell(naming, "1.2.3.4", "tcp", 80), "1.2.3.4.a-service-of-17  | 1.2.3.4 80/tcp");
+  EXPECT_EQ(tell(naming, "::", "udp", 65535), "*.65535 | 65535/udp");
   EXPECT_EQ(tell(naming, "1.2.3.4 ::", "tcp", 0), "1.2.3.4.*  *.* | 1.2.3.4");
 }
 
@@ -142,24 +141,23 @@ TEST(naming, NumericIpv6IsTheSystemsForm) {
   host_naming naming(true);
   know("");
   for (unsigned i = 0; i < 1'000'000; ++i) {
-    std::uint16_t groups[8];  // of one to four digits, or zero by a bit of `i`: every shape of zeros
-    for (std::uint16_t &group : groups) {
-      group =
-          static_cast<std::uint16_t>(i >> (&group - groups) & 1 ? 0 : random() >> 48 >> 4 * (random() & 3));
-    }
+    std::uint64_t groups[8];  // of one to four digits, or zero by a bit of `i`: every shape of zeros
+    for (unsigned at = 0; at < 8; ++at) groups[at] = i >> at & 1 ? 0 : random() >> 48 >> 4 * (random() & 3);
     if (i % 7 == 0) groups[0] = special[random() % std::size(special)];
     if (i % 5 == 0) groups[1] &= 3;      // interfaces with a name
     if (i % 3 == 0) groups[5] = 0xFFFF;  // an IPv4 address, where all before it is zero
-    const unsigned multicast = groups[0] & 0xFF0F;
-    const bool has_scope = multicast == 0xFF01 || multicast == 0xFF02 || (groups[0] & 0xFFC0) == 0xFE80;
-    sockaddr_in6 socket{.sin6_family = AF_INET6, .sin6_scope_id = has_scope ? groups[1] : 0U};
-    std::transform(groups, groups + 8, groups, htons);
-    const auto address = std::bit_cast<ipv6_address>(groups);
-    std::copy_n(groups, 8, socket.sin6_addr.s6_addr16);
-    if (has_scope) socket.sin6_addr.s6_addr16[1] = 0;
+    sockaddr_in6 socket{.sin6_family = AF_INET6};
+    for (unsigned at = 0; at < 8; ++at) {
+      socket.sin6_addr.s6_addr16[at] = htons(static_cast<std::uint16_t>(groups[at]));
+    }
+    const auto address = std::bit_cast<ipv6_address>(socket.sin6_addr);
+    if (IN6_IS_ADDR_LINKLOCAL(&socket.sin6_addr) || IN6_IS_ADDR_MC_NODELOCAL(&socket.sin6_addr) ||
+        IN6_IS_ADDR_MC_LINKLOCAL(&socket.sin6_addr)) {
+      socket.sin6_scope_id = ntohs(std::exchange(socket.sin6_addr.s6_addr16[1], 0));
+    }
     char text[1025] = "?";
-    const auto *generic = reinterpret_cast<const sockaddr *>(&socket);
-    __real_getnameinfo(generic, sizeof socket, text, sizeof text, nullptr, 0, NI_NUMERICHOST);
+    __real_getnameinfo(reinterpret_cast<const sockaddr *>(&socket), sizeof socket, text, sizeof text, nullptr,
+                       0, NI_NUMERICHOST);
     const std::string_view expected = text;
     ASSERT_EQ(naming.ipv6_host_name(address).view(), expected == "::" ? "*" : expected.substr(0, 49));
   }

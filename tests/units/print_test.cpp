@@ -103,13 +103,11 @@ TEST(format, ExtremesAgreeWithPrintf) {
   EXPECT_EQ(shown<"">(guard::none), "");
   agree<"100%%\n\tPort[%2u] %-8s (fd %d)\t%%%c %02x">(7U, "en0", -1, '!', std::uint8_t{255});
   agree<"%d %d %u %lld %lld %llu">(INT_MIN, INT_MAX, UINT_MAX, LLONG_MIN, LLONG_MAX, ULLONG_MAX);
-  for (unsigned long long power = 1; power < ULLONG_MAX / 10; power *= 10)
-    agree<"%llu %llu">(power - 1, power);
   for (const double value :
        {0.0, 0.125, 0.375, 0.994999, 0.995, 9.995, 1e-5, 1e-4, 999999.5, 1e6, 0x1p52 + 0.5, 0x1p53 - 1,
         0x1p53, DBL_MAX, DBL_MIN, DBL_TRUE_MIN, HUGE_VAL, std::nan("")}) {
-    agree<"%.2f %7.2f">(value, -value);
-    agree<"%g %g">(value, -value);
+    agree<"%.2f %g">(value, value);
+    agree<"%.2f %g">(-value, -value);
   }
 }
 
