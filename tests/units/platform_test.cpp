@@ -150,21 +150,15 @@ TEST_F(kernel_files, LiveMachineIsSeenOnlyWithoutARoot) {
 }
 
 TEST_F(kernel_files, NameOfAProcessIsItsTextUpToTheLineEndCutToTheBuffer) {
-  const std::tuple<int, const char *, const char *> names[] = {{-1, "x\n", "<unknown>.-1"},
-                                                               {0, "x\n", "<unknown>.0"},
-                                                               {1, "init\n", "init"},
-                                                               {2, "no end", "no end"},
-                                                               {3, " two  words \n", " two  words "},
-                                                               {4, "two\nlines\n", "two\nlines"},
-                                                               {5, "", "<unknown>.5"},
-                                                               {6, "exactly-fifteen", "exactly-fifteen"},
-                                                               {7, "exactly-fifteen\n", "exactly-fifteen"},
-                                                               {8, "sixteen-letters!\n", "sixteen-letters"}};
-  for (const auto &[pid, comm, name] : names) {
+  std::string names, cut;
+  for (int pid = -1; const char *comm : {"x\n", "x\n", "init\n", "no end", " two  words \n", "two\nlines\n",
+                                         "exactly-fifteen", "exactly-fifteen\n", "sixteen-letters!\n", ""}) {
     put(std::to_string(pid) + "/comm", comm);
-    EXPECT_EQ(name_of(pid), name);
+    names += name_of(pid++) + ",";
   }
-  std::string cut;
+  EXPECT_EQ(names,
+            "<unknown>.-1,<unknown>.0,init,no end, two  words ,two\nlines,exactly-fifteen,"
+            "exactly-fifteen,sixteen-letters,<unknown>.8,");
   for (std::size_t size = 1; size < 8; ++size) cut += name_of(1, size, true) + "," + name_of(1, size) + " ";
   EXPECT_EQ(cut, ", i,i in,in ini,ini init,init init.,init init.1,init ");
   EXPECT_EQ(name_of(9, 11, true) + name_of(9, 12, true), "<unknown>.<unknown>.9");
