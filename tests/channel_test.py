@@ -1,6 +1,4 @@
-#!/usr/bin/env python3
 """channel: the listing, the ring table, the watch loop of its own."""
-import unittest
 
 from records import make
 from runs import MISSING, Case, Result
@@ -101,7 +99,3 @@ RX[1]              0.00     0.00            0     0.00     0.00            0    
         seen = self.watch("channel -w 1", first, {}, {LIST: None}, {}, second, {}, {LIST: None})
         self.assertEqual(seen, Result(f"\n<time>\n{listing}No channels\n{listing}No channels\n",
                                       2 * sleep + 2 * (MISSING + sleep) + 2 * sleep + MISSING + sleep, 0))
-
-
-if __name__ == "__main__":
-    unittest.main()

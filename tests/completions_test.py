@@ -1,31 +1,22 @@
-#!/usr/bin/env python3
-"""Tests of the completions, typed into those shells that are here.
-
-usage: completions_test.py BUILD [unittest options]
-"""
+"""Tests of the completions, typed into those shells that are here."""
 import os
-import pathlib
 import pty
 import select
 import shlex
 import shutil
 import subprocess
-import sys
-import tempfile
-import unittest
 import uuid
 
-build = pathlib.Path(sys.argv.pop(1)).resolve()
+from records import make
+from runs import Case, build
 
 # Beside its two providers, the kernel has names that would like to be commands, or to be taken for other lines.
 ids = [str(uuid.UUID(int=0xABCDEF << 100 | number)).upper() for number in range(4)]
 names = ["$(touch hurt)`touch hurt`;touch hurt\n\tinstance $(touch hurt)",
          f'x",\n"uuid":"$(touch hurt)",\n"uuid":"{ids[0]}'[:64]]
-providers = b"".join(uuid.UUID(provider).bytes + bytes(48) + name.encode().ljust(64, b"\0") + b"\x40" + bytes(127) +
-                     b"\1" + bytes(7) + uuid.UUID(instance).bytes
+providers = b"".join(make("nexus_provider_record", provider_uuid=provider, name=name, name_length=64,
+                          instances=[uuid.UUID(instance).bytes])
                      for provider, instance, name in zip(ids, ids[2:], names))
-files = {"work/with blanks.log": b"", "proc/sys/kern/tarvel/nexus_provider_list": providers,
-         "proc/sys/kern/tarvel/nexus_channel_list": b"", "proc/sys/kern/tarvel/stats/flow": b""}
 
 commands = ("channel flow flow-adv flow-owner flow-route flow-switch interface memory netns provider show tree "
             "channel-stats list-providers netstat").split()
@@ -70,15 +61,16 @@ zstyle ':completion:all-matches::::' completer _all_matches _complete"""),
 }
 
 
-class Completions(unittest.TestCase):
+class Completions(Case):
     def setUp(self):
-        self.top = pathlib.Path(self.enterContext(tempfile.TemporaryDirectory()))
-        for name, contents in files.items():
-            (self.top / name).parent.mkdir(parents=True, exist_ok=True)
-            (self.top / name).write_bytes(contents)
+        super().setUp()
+        self.top = self.directory
+        self.put({"nexus_provider_list": providers, "nexus_channel_list": b"", "stats/flow": b""})
+        (self.top / "work").mkdir()
+        (self.top / "work/with blanks.log").touch()
         self.options = {"cwd": self.top / "work", "env": {
             "PATH": f"{self.top}:{build}:{os.environ['PATH']}", "MADE": str(build / "completions"), "TERM": "dumb",
-            "HOME": str(self.top), "TARVEL_ROOT": str(self.top), "LC_ALL": "C.UTF-8"}}
+            "HOME": str(self.top), "TARVEL_ROOT": str(self.kernel.root), "LC_ALL": "C.UTF-8"}}
 
     def typed(self, shell, lines):
         """What a shell on a terminal makes of each line."""
@@ -122,7 +114,3 @@ class Completions(unittest.TestCase):
         (self.top / "tarvelctl").write_text("#!/bin/sh\nexec sleep 100\n")
         (self.top / "tarvelctl").chmod(0o755)
         self.check([("tree ", [])])
-
-
-if __name__ == "__main__":
-    unittest.main()

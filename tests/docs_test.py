@@ -1,7 +1,4 @@
-#!/usr/bin/env python3
 """Runs what the pages show and compares it with what they say, so that a reader who types it along sees the same.
-
-usage: docs_test.py BUILD [unittest options]
 
 In a console block a line behind "$ " is a command, which "> " goes on with, and the lines below it are what it prints:
   ...      stands for lines left out, or inside a line for text left out
@@ -15,12 +12,12 @@ import pathlib
 import re
 import signal
 import subprocess
-import sys
 import tempfile
 import time
 import unittest
 
-top, build = pathlib.Path(__file__).resolve().parent.parent, pathlib.Path(sys.argv.pop(1)).resolve()
+from runs import build, tarvellab, top
+
 pages = [top / "README.md", top / "CONTRIBUTING.md", *sorted((top / "docs").glob("*.*"))]
 number = r" *\b\d+(?:\.\d+)?[KMGT]?B?\b"
 
@@ -69,7 +66,7 @@ class Docs(unittest.TestCase):
         env = {**os.environ, "PATH": f"{build}:{os.environ['PATH']}", "TMPDIR": f"{folder}/tmp", "LC_ALL": "C.UTF-8"}
         env.pop("TARVEL_ROOT", None)
         if page.suffix != ".md":
-            subprocess.run([build / "tarvellab", "generate", folder / "kernel"], check=True)
+            subprocess.run([tarvellab, "generate", folder / "kernel"], check=True)
             env["TARVEL_ROOT"] = str(folder / "kernel")
         for command, shown in commands(page):
             if export := re.fullmatch(r"(?:export )?(\w+)=([\w/]+)", command):
@@ -94,7 +91,3 @@ class Docs(unittest.TestCase):
                     titles = re.findall(r"^#+ (.*)$", (page.parent / target if target else page).read_text(), re.M)
                     slugs = [re.sub(r"[^\w -]", "", title.lower()).replace(" ", "-") for title in titles]
                     self.assertIn(heading, ["", *slugs])
-
-
-if __name__ == "__main__":
-    unittest.main()

@@ -1,6 +1,4 @@
-#!/usr/bin/env python3
 """flow, flow-adv, flow-owner, flow-route."""
-import unittest
 
 from records import make
 from runs import Case, Result, aborted, name_services
@@ -159,7 +157,3 @@ class Flow(Case):
                                   (by_nexus + "--pid 43", rows[2:])):
                 self.expect({f"stats/{name}": b"".join(records)}, f"netstat --{name.replace('_', '-')} {options}",
                             header + "".join(left))
-
-
-if __name__ == "__main__":
-    unittest.main()

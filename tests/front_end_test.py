@@ -1,9 +1,7 @@
-#!/usr/bin/env python3
 """The command line: usage, global options, the watch loop, the ways out; and what the commands have in common."""
 import os
 import signal
 import time
-import unittest
 
 from records import TABLES, make
 from runs import MISSING, SHORT, TIME, Case, tarvelctl, wait_for
@@ -123,7 +121,3 @@ class FrontEnd(Case):
         run = self.start("provider", to=pipe, preexec_fn=lambda: signal.signal(signal.SIGPIPE, signal.SIG_IGN))
         os.close(reader)
         self.assertEqual(run.end(), ("", "", -signal.SIGPIPE))
-
-
-if __name__ == "__main__":
-    unittest.main()

@@ -1,11 +1,9 @@
-#!/usr/bin/env python3
 """capture, and run on a capture: what is saved, shown again, refused and hidden."""
 import os
 import re
 import shutil
 import signal
 import time
-import unittest
 
 from records import RECORDS, TABLES, Kernel, make, walk
 from runs import LabCase, files, generate, limit_files, preloaded, remove, tarvellab, top, wait_for
@@ -333,7 +331,3 @@ class Redact(CaptureCase):
             self.assertEqual((len(seen), b"secret" in seen), (kept, False), name)
             self.capture()
             self.assertEqual(self.saved.table(name), table)
-
-
-if __name__ == "__main__":
-    unittest.main()

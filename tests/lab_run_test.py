@@ -1,4 +1,3 @@
-#!/usr/bin/env python3
 """generate, simulate and run: what tables hold and how they move, what a command gets, and what is left behind."""
 import hashlib
 import itertools
@@ -9,7 +8,6 @@ import resource
 import shlex
 import shutil
 import signal
-import unittest
 
 from records import TABLES
 from runs import LabCase, files, generate, limit_files, preloaded, remove, tarvellab, wait_for
@@ -239,7 +237,3 @@ class Run(LabCase):
         run.process.kill()
         os.kill(int(run.out), signal.SIGKILL)
         self.assertEqual(run.end().status, -signal.SIGKILL)
-
-
-if __name__ == "__main__":
-    unittest.main()

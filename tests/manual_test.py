@@ -1,20 +1,13 @@
-#!/usr/bin/env python3
-"""Tests that the manual says what the programs and the record formats are.
-
-usage: manual_test.py BUILD [unittest options]
-"""
-import pathlib
+"""Tests that the manual says what the programs and the record formats are."""
 import re
 import subprocess
-import sys
 import unittest
 
-tests, build = pathlib.Path(__file__).resolve().parent, pathlib.Path(sys.argv.pop(1)).resolve()
-from records import RECORDS, TABLES, load
+from records import RECORDS, TABLES
+from runs import build, tarvellab, top
 
-load(build / "tests/describe")
 tool, lab, tables, readme = (
-    (tests.parent / name).read_text().replace(r"\&", "").replace(r"\-", "-")
+    (top / name).read_text().replace(r"\&", "").replace(r"\-", "-")
     for name in ("docs/tarvelctl.1", "docs/tarvellab.1", "docs/tarvel-tables.5", "README.md"))
 
 
@@ -86,7 +79,7 @@ class Manual(unittest.TestCase):
         self.assertEqual([command for command in program if f"`{command}`" not in readme], [])
 
     def test_LabHasItsCommandsAndOptionsAndNoOthers(self):
-        usage = subprocess.run([build / "tarvellab"], capture_output=True, text=True).stderr
+        usage = subprocess.run([tarvellab], capture_output=True, text=True).stderr
         commands, options = re.findall(r"^  tarvellab (\w+)", usage, re.M), set(re.findall(r"--[a-z]+", usage))
         self.assertTrue(commands and options)
         self.assertEqual((re.findall(r"^\.It Cm (\w+)", lab, re.M), options_in(lab)), (commands, options))
@@ -103,7 +96,3 @@ class Manual(unittest.TestCase):
             letters = re.findall(r"\b([a-z]) (0x\d+)", sections(tool)[command])
             known = RECORDS["tv_stats_" + command.replace("-", "_")]["fields"][field]["values"]
             self.assertEqual({str(int(bit, 0)): letter for letter, bit in letters}, known)
-
-
-if __name__ == "__main__":
-    unittest.main()

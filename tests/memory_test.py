@@ -1,7 +1,5 @@
-#!/usr/bin/env python3
 """memory: arenas, their regions, the summary of all regions."""
 import re
-import unittest
 
 from records import make
 from runs import Case
@@ -96,7 +94,3 @@ class Memory(Case):
         seen = self.watch("memory -w 1", {ARENAS: arena(region(1, mem_total=1024))}, {ARENAS: later})
         self.assertEqual([part[part.index("+"):] for part in seen.out.split("\n<time>\n")[1:]],
                          [summary("0.00", "0.00", SCHEMA=(1, 0)), summary("0.00", "0.00", SCHEMA=(3, 1))])
-
-
-if __name__ == "__main__":
-    unittest.main()

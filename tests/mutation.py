@@ -107,7 +107,8 @@ def make_copy(copy):
     subprocess.check_call(["sh", "-c", refill, copy], cwd=TOP)
     subprocess.check_call(["cmake", "-S", copy, "-B", copy / "build", "-G", "Ninja", "-DCMAKE_BUILD_TYPE=Debug",
                            f"-DCMAKE_CXX_COMPILER_LAUNCHER={shutil.which('ccache') or ''}",
-                           "-DTARVELCTL_BENCH=OFF", "-DCMAKE_CXX_FLAGS_DEBUG=-O0"], stdout=subprocess.DEVNULL)
+                           "-DTARVELCTL_BENCH=OFF", "-DCMAKE_UNITY_BUILD=ON",
+                           "-DCMAKE_CXX_FLAGS_DEBUG=-O0"], stdout=subprocess.DEVNULL)
     subprocess.check_call(["cmake", "--build", copy / "build"], stdout=subprocess.DEVNULL)
     healthy, failed = run_tests(copy)
     if failed:

@@ -1,6 +1,4 @@
-#!/usr/bin/env python3
 """netns: one port namespace, or all of them."""
-import unittest
 
 from records import make
 from runs import Case
@@ -70,7 +68,3 @@ class Netns(Case):
                 ("", f"netns: option '--proto' requires an argument{options}", "-a --proto")):
             self.expect(TABLE, [f"netns {line}" for line in lines], out, err)
             self.expect(TABLE, [f"-w 60 netns {line}" for line in lines], "\n<time>\n" + out, err)
-
-
-if __name__ == "__main__":
-    unittest.main()

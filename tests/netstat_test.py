@@ -1,8 +1,6 @@
-#!/usr/bin/env python3
 """netstat and its counter reports, interface, flow-switch."""
 import itertools
 import re
-import unittest
 
 from records import RECORDS, make
 from runs import MISSING, Case
@@ -110,7 +108,3 @@ class Netstat(Case):
             self.expect({}, f"netstat {option} --pid 7 --uuid {B}", title + en1)
             self.expect({}, f"netstat {option} --uuid {A.replace('A', '0')}", title)
             self.expect({}, f"netstat {option} --global --uuid {A}", title + lines.format(2, 5))
-
-
-if __name__ == "__main__":
-    unittest.main()

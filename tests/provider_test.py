@@ -1,6 +1,4 @@
-#!/usr/bin/env python3
 """provider, also called list-providers."""
-import unittest
 
 from records import make
 from runs import Case, text
@@ -40,7 +38,3 @@ class Provider(Case):
         for locale, shown in ("C.UTF-8", "\u00c4nd gr\u00f6\u00dfe\u20ac?[31m???"), ("no_WHERE.UTF-8", by_byte):
             self.expect({LIST: provider(name, len(name))}, "provider", f"user-pipe {shown} {ID}\n", to="terminal",
                         environment={"LC_ALL": locale})
-
-
-if __name__ == "__main__":
-    unittest.main()

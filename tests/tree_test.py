@@ -1,8 +1,6 @@
-#!/usr/bin/env python3
 """tree; show, also called channel-stats."""
 import json
 import textwrap
-import unittest
 
 from records import make
 from runs import MISSING, SHORT, Case, aborted
@@ -147,7 +145,3 @@ class Tree(Case):
         self.expect(tables, ("show", "channel-stats", "show -x ignored"), report)
         self.expect({}, "show", report.replace("defunct", "\033[31mdefunct\033[0m"), to="terminal")
         self.expect({"stats/flow": flows + flow("A", 12, 9)}, "channel-stats", aborted("cmd_show", 2030, "0", report))
-
-
-if __name__ == "__main__":
-    unittest.main()

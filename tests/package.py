@@ -1,21 +1,18 @@
 #!/usr/bin/env python3
-"""Makes the Debian package, installs it below an empty directory, shows everything from there, and removes it.
-
-usage: package_test.py BUILD
-"""
+"""Makes the Debian package, installs it below an empty directory, shows everything from there, and removes it."""
 import os
 import pathlib
 import re
 import subprocess
-import sys
 import tempfile
+
+from runs import build, top
 
 expected = """bin/tarvelctl bin/tarvellab share/bash-completion/completions/tarvelctl
     share/doc/tarvelctl/changelog.Debian.gz share/doc/tarvelctl/copyright
     share/doc/tarvelctl/from-symptom-to-command.md share/fish/vendor_completions.d/tarvelctl.fish
     share/man/man1/tarvelctl.1.gz share/man/man1/tarvellab.1.gz share/man/man5/tarvel-tables.5.gz
     share/zsh/vendor-completions/_tarvelctl""".split()
-sources, build = pathlib.Path(__file__).resolve().parent.parent, pathlib.Path(sys.argv[1]).resolve()
 
 
 def run(*words):
@@ -47,7 +44,7 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     os.environ.pop("TARVEL_ROOT", None)
     os.environ["CDPATH"] = str(scratch)  # has such a folder too
     (scratch / "scripts").mkdir()
-    os.chdir(sources)
+    os.chdir(top)
     check_has(run("scripts/demo", root / "usr/bin"), f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14",
               "Proto Local Address", "LISTENER")
     assert not (scratch / "build").exists()
