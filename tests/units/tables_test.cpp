@@ -1,8 +1,9 @@
 // What finds and holds things in memory.
 
 #include "common/mib.h"
-#include "common/tables/description.h"
+#include "common/tables/channel.h"
 #include "common/tables/key_index.h"
+#include "common/tables/table_walk.h"
 #include "common/text/memory.h"
 #include "tests/units/units.h"
 
@@ -19,6 +20,15 @@ TEST(description, NumbersAreReadAsTheyLie) {
        {std::pair{u8, 1L}, {u16, 0xff01}, {net16, 0x1ff}, {u32, 0xffffff01}, {i32, -255}, {u64, -255}}) {
     EXPECT_EQ((number_at{1, type}.in(table)), number);
   }
+}
+
+TEST(description, NoNumberIsTakenForASmallerOne) {
+  const field_condition is_30{{0, field_type::u8}, UINT64_MAX, std::uint64_t{1} << 30};
+  EXPECT_FALSE(is_30.holds(std::as_bytes(std::span("^"))));  // 94
+  std::string table(24 + 48, '\0');
+  table[16] = 1;                // channel,
+  table[24 + 32 + 3] = '\x20';  // whose rings take a multiple of 2^32 bytes
+  EXPECT_FALSE(walk_table(channel_header_description, std::as_bytes(std::span(table)), [](const auto &) {}));
 }
 
 TEST(key_index, FindsWhatWasAddedFirst) {
