@@ -6,8 +6,6 @@
 #include <bit>
 #include <iostream>
 #include <map>
-#include <random>
-#include <sstream>
 
 #include "common/names/host_naming.h"
 #include "tests/units/units.h"
@@ -128,10 +126,10 @@ TEST(naming, NumbersAreAskedOfNobodyButForScopesNotYetKnown) {
             "1.2.3.4.443  *.443  *.443 fd11:1111:2222:3333:4444:5555:6666:77.443 |");
   EXPECT_EQ(tell(naming, "fe80:102::7 fe80:102::8 fe80:102" + long_end),
             "fe80::7%interface-of-15 fe80::8%interface-of-15 fe80:0" + long_end + "%interface-of | 258");
+  std::string all = "? fe80::7%interface-of-16c fe80:104::7 ";
+  all.append(cut).append(" fe80:0").append(long_end).append("%interface-of | 257 259 260 261 262");
   for (int times = 0; times < 2; ++times) {  // what can be of use for no other address
-    EXPECT_EQ(tell(naming, "fe80:101::7 fe80:103::7 fe80:104::7 fe80:105::7 fe80:106" + long_end),
-              "? fe80::7%interface-of-16c fe80:104::7 " + cut + " fe80:0" + long_end +
-                  "%interface-of | 257 259 260 261 262");
+    EXPECT_EQ(tell(naming, "fe80:101::7 fe80:103::7 fe80:104::7 fe80:105::7 fe80:106" + long_end), all);
   }
 }
 

@@ -1,14 +1,11 @@
 // The buffered output: whole rows, whatever their length, whoever reads them and whenever it is abandoned;
 // and what commands print with.
 
-#include <limits.h>
 #include <pty.h>
 #include <signal.h>
 #include <sys/wait.h>
 
 #include <deque>
-#include <fstream>
-#include <sstream>
 
 #include "common/text/output_helpers.h"
 #include "tests/units/units.h"

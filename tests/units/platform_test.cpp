@@ -1,12 +1,9 @@
 // Kernel variables and process names as files; what else the system is asked for.
 
-#include <limits.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
 
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 
 #include "common/channel_snapshot.h"
 #include "common/text/output_helpers.h"

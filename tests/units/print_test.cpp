@@ -2,14 +2,11 @@
 
 #include "common/text/print.h"
 
-#include <gtest/gtest.h>
-
 #include <cfloat>
-#include <climits>
 #include <cmath>
-#include <random>
 
 #include "common/text/text.h"
+#include "tests/units/units.h"
 
 namespace {
 

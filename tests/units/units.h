@@ -9,7 +9,11 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <cstring>
+#include <fstream>
+#include <random>
+#include <sstream>
 #include <string>
 
 #include "common/text/output.h"
