@@ -36,9 +36,8 @@ OPERATORS = [(re.compile(pattern), replacement) for pattern, replacement in [
 # What nobody meets who runs the programs: comments, inclusions, what the compiler checks, hints, sizes of buffers.
 LEFT_OUT = re.compile(r"^\s*(//|#|static_assert|char \w+\[)|prefetch|reserve\(")
 
-# Tests of what is written and packed are asked about faults in these folders only, and at first those that are named.
-PAPERS = "docs|manual|completions|package"
-FIRST = {"lab": "lab_", "completions": PAPERS}
+# Tests of these names are asked first about a fault in the folder; the names of the others do not matter.
+FIRST = {"lab": "lab", "completions": "completions"}
 VERDICT = re.compile(r"Test +#(\d+): (\S+) \.* *(\S.*?) +([\d.]+) sec")
 
 
@@ -78,7 +77,7 @@ def run_tests(copy, *options):
 def groups(healthy, folder):
     """The numbers of the tests to ask, by the dozen, as ctest takes them."""
     tests = sorted((not re.search(FIRST.get(folder, ""), name), float(seconds), number)
-                   for number, name, _, seconds in healthy if folder in FIRST or not re.search(PAPERS, name))
+                   for number, name, _, seconds in healthy)
     return [",".join(["0,0,0", *(number for *_, number in tests[i:i + 12])]) for i in range(0, len(tests), 12)]
 
 

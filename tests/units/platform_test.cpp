@@ -7,7 +7,6 @@
 
 #include "common/channel_snapshot.h"
 #include "common/text/output_helpers.h"
-#include "platform/memory.h"
 #include "platform/sysctl.h"
 #include "tests/units/units.h"
 
@@ -159,19 +158,6 @@ TEST_F(kernel_files, NameOfAProcessIsItsTextUpToTheLineEndCutToTheBuffer) {
   for (std::size_t size = 1; size < 8; ++size) cut += name_of(1, size, true) + "," + name_of(1, size) + " ";
   EXPECT_EQ(cut, ", i,i in,in ini,ini init,init init.,init init.1,init ");
   EXPECT_EQ(name_of(9, 11, true) + name_of(9, 12, true), "<unknown>.<unknown>.9");
-}
-
-// The first and the last page hold other things too.
-TEST(memory, ProvidedPagesAreThoseOfTheBlock) {
-  const auto page = static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
-  void *const block = mmap(nullptr, 4 * page, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
-  auto *const pages = static_cast<char *>(block);
-  if (madvise(pages, page, MADV_POPULATE_WRITE) != 0) GTEST_SKIP() << "the system cannot";
-  madvise(pages, page, MADV_DONTNEED);
-  for (const std::size_t size : {page, 3 * page}) platform::provide_pages(pages + 1, size);
-  unsigned char resident[4];
-  mincore(pages, 4 * page, resident);
-  EXPECT_EQ(std::string(resident, resident + 4), "\0\1\1\0"s);
 }
 
 }  // namespace
