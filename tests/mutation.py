@@ -54,10 +54,11 @@ def places():
                 yield faults
 
 
-def run(log, *words):
+def run(log, *words, seconds=1200):
     """Whether a command succeeds within bounds that only a fault meets. Nothing that it started is left behind."""
     with open(log, "w") as file:
-        status = subprocess.call(["prlimit", "--as=8000000000", "timeout", "1200", *words], stdout=file, stderr=file)
+        words = ["prlimit", "--as=8000000000", "timeout", str(seconds), *words]
+        status = subprocess.call(words, stdout=file, stderr=file)
     while left := pathlib.Path(f"/proc/self/task/{os.getpid()}/children").read_text().split():
         for child in map(int, left):
             os.kill(child, signal.SIGKILL)
@@ -65,20 +66,22 @@ def run(log, *words):
     return status == 0
 
 
-def run_tests(copy, *options):
+def run_tests(copy, *options, seconds=1200):
     """What the tests said, as (number, name, verdict, seconds), and one that failed in the end."""
     log = copy / "tests.log"
-    passed = run(log, "ctest", "--test-dir", copy / "build", f"-j{os.cpu_count()}", "--timeout", "300", *options)
+    passed = run(log, "ctest", "--test-dir", copy / "build", f"-j{os.cpu_count()}", *options, seconds=seconds)
     verdicts = VERDICT.findall(log.read_text(errors="replace"))
     failed = [f"{name} ({verdict})" for _, name, verdict, _ in verdicts if verdict not in ("Passed", "***Skipped")]
     return verdicts, None if passed else ["ctest", *failed][-1]
 
 
 def groups(healthy, folder):
-    """The numbers of the tests to ask, by the dozen, as ctest takes them."""
+    """The tests to ask, half a dozen at a time: their numbers as ctest takes them, and the seconds that they get."""
     tests = sorted((not re.search(FIRST.get(folder, ""), name), float(seconds), number)
                    for number, name, _, seconds in healthy)
-    return [",".join(["0,0,0", *(number for *_, number in tests[i:i + 12])]) for i in range(0, len(tests), 12)]
+    for i in range(0, len(tests), 6):
+        _, seconds, numbers = zip(*tests[i:i + 6])
+        yield ",".join(["0,0,0", *numbers]), 30 + 4 * sum(seconds)
 
 
 def noticed_by(copy, healthy, fault):
@@ -93,8 +96,8 @@ def noticed_by(copy, healthy, fault):
     path.write_text("\n".join(lines))
     test = False
     if run(*make, "--target", "tarvelctl", "tarvellab", "generate_completions"):
-        failures = (run_tests(copy, "--stop-on-failure", "--repeat", "until-pass:2", "-I", group)[1]
-                    for group in groups(healthy, fault["file"].split("/")[0]))
+        failures = (run_tests(copy, "--stop-on-failure", "--repeat", "until-pass:2", "-I", group, seconds=seconds)[1]
+                    for group, seconds in groups(healthy, fault["file"].split("/")[0]))
         test = next(filter(None, failures), None) if run(*make) else "the build"
     path.write_text(original)
     return test
