@@ -72,7 +72,6 @@ class Interrupts(Driver):
 
         def written():
             return TIME.sub("<time>", run.out + text(self.file.read_bytes()))
-
         while not catches_interrupts(run.process):
             pass
         if state == "asleep":
