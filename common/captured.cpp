@@ -53,6 +53,12 @@ bool holds_only_files(const own_directory &directory, int depth) {
   });
 }
 
+// Of what no capture lasts, as many as fit.
+std::int64_t nanoseconds(std::int64_t milliseconds) {
+  constexpr std::int64_t in_one = 1'000'000;
+  return std::min(milliseconds, INT64_MAX / in_one) * in_one;
+}
+
 // Adds the later moments, in order.
 bool find_moments(const own_directory &top, captured &found) {
   if (faccessat(top.fd(), moments_name, F_OK, 0) != 0) return true;
@@ -116,6 +122,20 @@ std::optional<captured> look_into(const std::string &directory) {
   found.is_capture = found.note.is_understood(path) && holds_only_files(top, 0) && find_moments(top, found);
   if (!found.is_capture) return {};
   return found;
+}
+
+moment read_captured(const captured &of, const captured_moment &which,
+                     std::span<const table_description *const> wanted) {
+  if (!platform::show_root(which.root))
+    return {};  // GCOVR_EXCL_BR_LINE: no test has more rights than its caller
+  moment made = read_moment(wanted);
+  if (!of.is_capture) return made;
+  for (table_reading &table : made.tables) {
+    table.monotonic = nanoseconds(which.offset);
+    table.wall = nanoseconds(of.note.began.value_or(0) + which.offset);
+  }
+  made.host = of.note.is_redacted ? capture_note::redacted_host : of.note.host;
+  return made;
 }
 
 std::optional<std::int64_t> parse_offset(std::string_view name) {

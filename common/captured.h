@@ -12,11 +12,13 @@
 
 #include <cstdint>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "common/capture_note.h"
+#include "common/moment.h"
 
 // Where the later moments are.
 inline constexpr char moments_name[] = "moments";
@@ -41,6 +43,14 @@ struct captured {
 // capture, or else the kernel, holds more than files and directories, or directories below those of the
 // tables, or files that are nothing but large.
 std::optional<captured> look_into(const std::string &directory);
+
+// Reads these tables as they were at a moment of a capture. By the capture's own clock: each table has the
+// moment's time, `monotonic` from the first moment on, `wall` where the note says when that was; else it is
+// `monotonic`, too. Its host is the note's. Of what is no capture the time is now and the host the kernel's
+// own. From here on everything in this process that asks for the kernel in sight gets this one. Nothing is
+// read where that cannot be (platform/root.h).
+moment read_captured(const captured &of, const captured_moment &which,
+                     std::span<const table_description *const> wanted);
 
 // Whether the kernel in sight is that of a redacted capture, as a note says that the caller owns.
 bool shows_redacted_capture();
