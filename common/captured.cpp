@@ -9,6 +9,7 @@
 #include <charconv>
 #include <cstdio>
 #include <filesystem>
+#include <tuple>
 
 #include "common/own_directory.h"
 #include "common/tables/tables.h"
@@ -65,13 +66,13 @@ bool find_moments(const own_directory &top, captured &found) {
   const own_directory moments = top.enter(moments_name);
   const bool listed = moments.for_each([&](const std::string &name) {
     const std::optional<std::int64_t> offset = parse_offset(name);
-    struct stat status {};
-    const bool is_moment = offset && fstatat(moments.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
-                           S_ISDIR(status.st_mode);
-    if (is_moment) found.moments.push_back({*offset, moments.path_of(name)});
+    struct stat status {};  // what cannot say what it is, is no moment
+    fstatat(moments.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW);
+    if (offset && S_ISDIR(status.st_mode)) found.moments.push_back({*offset, moments.path_of(name)});
     return true;
   });
-  std::ranges::sort(found.moments);
+  std::ranges::sort(found.moments, {},
+                    [](const captured_moment &each) { return std::tie(each.offset, each.root); });
   return listed;
 }
 
@@ -79,12 +80,9 @@ bool find_moments(const own_directory &top, captured &found) {
 
 bool shows_redacted_capture() {
   std::error_code error;
-  std::filesystem::path top = std::filesystem::canonical(platform::given_root(), error);
-  if (error) return false;
+  std::filesystem::path top = std::filesystem::canonical(platform::given_root(), error);  // empty: none
   // A later moment lies two directories below the note.
-  const bool is_moment =
-      top.parent_path().filename() == moments_name && parse_offset(top.filename().native());
-  if (is_moment) top = top.parent_path().parent_path();
+  if (top.parent_path().filename() == moments_name) top = top.parent_path().parent_path();
   const int fd = open(top.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
   struct stat status {};
   fstat(fd, &status);
@@ -96,7 +94,6 @@ bool shows_redacted_capture() {
 
 bool is_mostly_holes(std::string_view node) {
   std::string path = platform::given_root();
-  if (path.empty()) return false;
   path += "/proc/sys/";
   for (const char c : node) path += c == '.' ? '/' : c;
   struct stat status {};
@@ -119,15 +116,15 @@ std::optional<captured> look_into(const std::string &directory) {
   }
   const std::string path = top.path_of(capture_note::file_name);
   if (error) return complain_about(path, error), std::nullopt;
-  found.is_capture = found.note.is_understood(path) && holds_only_files(top, 0) && find_moments(top, found);
+  found.is_capture = found.note.is_understood(path) && holds_only_files(top, 0);
   if (!found.is_capture) return {};
+  if (!find_moments(top, found)) return {};  // GCOVR_EXCL_BR_LINE: all directories have just been listed
   return found;
 }
 
 moment read_captured(const captured &of, const captured_moment &which,
                      std::span<const table_description *const> wanted) {
-  if (!platform::show_root(which.root))
-    return {};  // GCOVR_EXCL_BR_LINE: no test has more rights than its caller
+  if (!platform::show_root(which.root)) return {};  // GCOVR_EXCL_BR_LINE: tests have no rights to give away
   moment made = read_moment(wanted);
   if (!of.is_capture) return made;
   for (table_reading &table : made.tables) {

@@ -26,8 +26,6 @@ inline constexpr char moments_name[] = "moments";
 struct captured_moment {
   std::int64_t offset;  // milliseconds after the first moment
   std::string root;     // the directory that stands for the machine
-
-  friend auto operator<=>(const captured_moment &, const captured_moment &) = default;
 };
 
 // What a directory has of a capture; of a kernel that is none, one moment and no more to say.
@@ -55,8 +53,7 @@ moment read_captured(const captured &of, const captured_moment &which,
 // Whether the kernel in sight is that of a redacted capture, as a note says that the caller owns.
 bool shows_redacted_capture();
 
-// Whether the file of this node is large but for holes, below a root that was given: it would fill the
-// memory.
+// Whether the file of this node is large but for holes: it would fill the memory. None of a live kernel is.
 bool is_mostly_holes(std::string_view node);
 
 // The milliseconds in the name of a later moment, such as "1.000". Nothing for any other form, and beyond

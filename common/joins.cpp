@@ -220,10 +220,9 @@ record_bytes joins::arena_of(const tv_stats_flow &flow) {
     const record_bytes named = arenas().nexus_by_name.first(name_key(name, flow.sf_pid));
     if (!named.empty()) return named;
   }
-  const bool is_clear = arenas().nexus_by_pid.is_single(flow.sf_pid) &&
-                        channels().by_pid.is_single(flow.sf_pid) &&
-                        channels().by_pid.first(flow.sf_pid).entry == channel_of(flow).entry;
-  return is_clear ? arenas().nexus_by_pid.first(flow.sf_pid) : record_bytes();
+  const channel_ref only = channels().by_pid.only(flow.sf_pid);
+  if (!only.entry || only.entry != channel_of(flow).entry) return {};
+  return arenas().nexus_by_pid.only(flow.sf_pid);
 }
 
 joins::memory joins::memory_of(std::int32_t pid) {

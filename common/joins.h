@@ -44,10 +44,10 @@ class lists_by_key {
     return at == key_index::none ? Value{} : links_[at].value;
   }
 
-  // Whether there is just one.
-  bool is_single(const index_key &key) const {
+  // The only one; an empty one where there is none, or several.
+  Value only(const index_key &key) const {
     const std::uint32_t at = first_.find(key);
-    return at != key_index::none && links_[at].next == key_index::none;
+    return at == key_index::none || links_[at].next != key_index::none ? Value{} : links_[at].value;
   }
 
  private:

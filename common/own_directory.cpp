@@ -110,7 +110,8 @@ bool own_directory::for_each(const std::function<bool(const std::string &name)> 
 }
 
 bool own_directory::rename(const std::string &from, const std::string &to) const {
-  return renameat(fd_, from.c_str(), fd_, to.c_str()) == 0 || complain_about(path_of(to), errno);
+  if (renameat(fd_, from.c_str(), fd_, to.c_str()) == 0) return true;
+  return complain_about(path_of(to), errno);
 }
 
 void own_directory::remove(const std::string &name) const {

@@ -2,7 +2,10 @@
 
 #include "common/joins.h"
 
+#include <sys/resource.h>
+
 #include "common/captured.h"
+#include "common/own_directory.h"
 #include "tests/units/units.h"
 
 namespace {
@@ -18,6 +21,7 @@ TEST_F(captures, MomentsComeInOrderWithTheirOwnTimes) {
     put("../moments/" + name + "/proc/sys/kern/tarvel/stats/flow", name);
   }
   const captured found = look_into(root + "/.").value();
+  EXPECT_FALSE(shows_redacted_capture());
   std::string seen;
   for (const captured_moment &each : found.moments) {
     const moment read = read_captured(found, each, flows_only);
@@ -52,7 +56,27 @@ TEST_F(captures, OnlyATimeIsTakenForOne) {
     const std::int64_t expected = time[0] == '9' ? 253402300799000 : time.starts_with("1970") ? 0 : -1;
     EXPECT_EQ(found.note.began.value_or(-1), expected) << time;
     EXPECT_EQ(read_captured(found, found.moments[0], {}).host, "redacted");
+    EXPECT_TRUE(shows_redacted_capture());
   }
+}
+
+TEST_F(captures, DirectoriesSayWhatFails) {
+  fs::create_directory(root + "/kept");
+  const own_directory top = own_directory::open(root);
+  const capture said(diagnostics);
+  EXPECT_FALSE(own_directory::make("/proc/none").is_open() || top.make_below("a/b").is_open() ||
+               top.rename("a", "b"));
+  rlimit usual;
+  getrlimit(RLIMIT_NOFILE, &usual);
+  const rlimit none{0, usual.rlim_max};
+  setrlimit(RLIMIT_NOFILE, &none);
+  EXPECT_FALSE(top.for_each([](const std::string &) { return true; }));
+  top.remove("kept");
+  setrlimit(RLIMIT_NOFILE, &usual);
+  EXPECT_TRUE(fs::exists(root + "/kept"));
+  const std::string missing = ": No such file or directory\n?: " + root;
+  EXPECT_EQ(said.text(),
+            "?: /proc/none" + missing + "/a/b" + missing + "/b" + missing + ": Too many open files\n");
 }
 
 // A line is a record: its size, and what is at its offsets, a 'letter 16 times, a number=, or a :text.
@@ -109,7 +133,7 @@ TEST_F(joined, NexusesHaveProvidersAndInterfaces) {
                                          "290 64:cut 128=3 256=2 264'P"));
   put_table("stats/net_if", table("320 0'I 16:en0\n319 0'M 16:en1"));
   put_table("stats/flow_switch", table("448 0'I 16:en2\n448 0'N 16:sixteen_bytes_.."));
-  std::string seen = found("");
+  std::string seen = found("") + std::string(joins(moment()).interface_of({}));
   for (const char letter : "NMOPI"s) {
     uuid nexus;
     std::memset(nexus.bytes, letter, sizeof nexus.bytes);

@@ -5,6 +5,7 @@
 
 #include "common/channel_snapshot.h"
 #include "common/text/output_helpers.h"
+#include "platform/root.h"
 #include "platform/sysctl.h"
 #include "tests/units/units.h"
 
@@ -109,6 +110,7 @@ TEST_F(kernel_files, LiveMachineIsSeenOnlyWithoutARoot) {
   EXPECT_EQ(ask("kernel.ostype"), "ENOENT");
   EXPECT_EQ(name_of(getpid()), "<unknown>." + std::to_string(getpid()));
   unsetenv("TARVEL_ROOT");
+  EXPECT_EQ(platform::given_root(), "");
   prctl(PR_SET_NAME, "a tarvel test");
   EXPECT_EQ(name_of(getpid()), "a tarvel test");
   EXPECT_EQ(ask("kernel.ostype") + ask("kernel.ostype", 6) + ask("kernel.ostype", 5), "6Linux\nENOMEM");
