@@ -39,11 +39,11 @@ bool is_hollow(const struct stat &status) {
 bool holds_only_files(const own_directory &directory, int depth) {
   return directory.for_each([&](const std::string &name) {
     struct stat status {};
-    // GCOVR_EXCL_BR_START: what moves on between two calls is rare
+    // GCOVR_EXCL_START: what moves on between two calls is rare
     if (fstatat(directory.fd(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) < 0) {
       return errno == ENOENT || complain_about(directory.path_of(name), errno);  // a simulation may move on
     }
-    // GCOVR_EXCL_BR_STOP
+    // GCOVR_EXCL_STOP
     if (S_ISDIR(status.st_mode) && depth < deepest) {
       const own_directory below = directory.enter(name);
       return below.is_open() && holds_only_files(below, depth + 1);
