@@ -4,7 +4,9 @@
 #define TARVELCTL_LAB_COMMAND_LINE_H
 
 #include <cstdint>
+#include <span>
 #include <string>
+#include <string_view>
 
 #include "lab/world.h"
 
@@ -31,6 +33,30 @@ int generate(const options &asked);
 int simulate(const options &asked);
 int run(const options &asked);
 int capture(const options &asked);
+
+enum command_bit : std::uint8_t { in_generate = 1, in_simulate = 2, in_run = 4, in_capture = 8 };
+
+// A command, as its help and its completions tell of it.
+struct command {
+  command_bit bit;
+  std::string_view name;
+  std::string_view arguments;
+  std::string_view purpose;
+  int (*handler)(const options &);
+};
+
+// An option, and all that follows from it.
+struct option_row {
+  unsigned in;                // the bits of the commands that take it
+  std::string_view name;      // with its dashes
+  std::string_view argument;  // what help calls the word behind it; empty: it takes none
+  std::string_view values;    // what that word may be, for messages
+  std::string_view meaning;
+  bool (*take)(std::string_view value, options &asked);  // false: it is no such value
+};
+
+extern const std::span<const command> commands;
+extern const std::span<const option_row> known_options;
 
 }  // namespace lab
 

@@ -4,6 +4,7 @@ import itertools
 import os
 import pathlib
 import pty
+import re
 import resource
 import shlex
 import shutil
@@ -78,15 +79,39 @@ class Kernels(LabCase):
         wrong += [f"capture a --count 2 --every {each}" for each in "0 0.009 3600.01 -1 nan inf 1e1 1s ''".split()]
         for words in wrong:
             seen = self.lab(words)
-            self.assertEqual((seen.out, seen.err[:7], seen.status), ("", "usage:\n", 64), words)
+            self.assertEqual((seen.out, seen.status), ("", 64), words)
+            self.assertRegex(seen.err, "^tarvellab: .*; see tarvellab --help\n$")
         self.assertEqual([path.name for path in self.directory.iterdir()], ["kernel"])
         # Diagnostics do without a descriptor of their own.
         few = self.lab("nope", preexec_fn=lambda: [os.close(0), resource.setrlimit(resource.RLIMIT_NOFILE, (3, 3))])
-        self.assertEqual(few, seen)
+        self.assertEqual(few, self.lab("nope"))
         for words in ("generate a --seed 0", "generate a --seed 18446744073709551615", "generate a --rings 1024",
                       "generate a --channels 0 --flows 10000000", "run --interval 3600000 -- true",
                       "capture b --every 0.01 --count 1", "capture c --every 3600 --count 10000000"):
             self.assertNotEqual(self.lab(words).status, 64, words)
+
+    def test_AUsageErrorNamesWhatIsWrongAndHelpIsNone(self):
+        for words, said in (("", "a command is missing"), ("'n\x1bpe'", "there is no command 'n\x1bpe'"),
+                            ("capture a --seed 1", "capture has no option --seed"),
+                            ("generate a --rings 1025", "--rings takes 0 to 1024, not '1025'"),
+                            ("generate a --flows", "--flows takes 0 to 10000000"),
+                            ("generate a -v", "generate has no option -v"), ("generate", "generate takes a directory"),
+                            ("generate a b", "generate takes one directory, and 'b' cannot be it"),
+                            ("capture a --count 2", "--count and --every go together"),
+                            ("run --flows 1", "run takes a command, behind --"),
+                            ("run a --flows 1 -- true", "--flows is for a kernel to be made, and a is there")):
+            self.assertEqual(self.lab(words), ("", f"tarvellab: {said}; see tarvellab --help\n", 64))
+        terminal = self.lab(["n\x1bpe"], to="terminal", merged=True).out
+        self.assertEqual(terminal, "tarvellab: there is no command 'n?pe'; see tarvellab --help\n")
+        whole, own = self.lab("--help"), self.lab("capture k --count --help x")
+        self.assertEqual((whole.err, own.err, whole.status, own.status), ("", "", 0, 0))
+        self.assertTrue({*own.out.splitlines()} < {*whole.out.splitlines()})
+        self.assertEqual(re.findall("--[a-z]+", own.out), ["--help", "--version", "--every", "--count", "--redact"])
+        self.assertEqual(re.findall("options of (.*):", whole.out), ["generate simulate run", "simulate run", "capture"])
+        self.assertEqual(self.lab("run -- sh -c 'echo $0' --help").out, "--help\n")
+        self.assertRegex(self.lab("--version").out, r"^tarvellab \d+\.\d+\.\d+\n$")
+        for words in "--help", "--version":
+            self.assertEqual(self.lab(words, to="/dev/full").status, 74)
 
     def test_WhatCannotBeWrittenIsNamed(self):
         made, flow, comm = self.kernel.root, NODES + "stats/flow", "proc/94/comm"
