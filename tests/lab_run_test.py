@@ -107,7 +107,8 @@ class Kernels(LabCase):
         self.assertEqual((whole.err, own.err, whole.status, own.status), ("", "", 0, 0))
         self.assertTrue({*own.out.splitlines()} < {*whole.out.splitlines()})
         self.assertEqual(re.findall("--[a-z]+", own.out), ["--help", "--version", "--every", "--count", "--redact"])
-        self.assertEqual(re.findall("options of (.*):", whole.out), ["generate simulate run", "simulate run", "capture"])
+        headings = re.findall("options of (.*):", whole.out)
+        self.assertEqual(headings, ["generate simulate run", "simulate run", "capture"])
         self.assertEqual(self.lab("run -- sh -c 'echo $0' --help").out, "--help\n")
         self.assertRegex(self.lab("--version").out, r"^tarvellab \d+\.\d+\.\d+\n$")
         for words in "--help", "--version":
@@ -156,6 +157,22 @@ class Kernels(LabCase):
             return min(len(sizes), len(moments), len(names)) > 3  # no two new files have one name
         wait_for(has_moved)
         self.assertEqual((run.end(signal.SIGINT).status, hidden(self.kernel.root)), (0, []))
+
+    def test_ATerminalSeesLongWorkAndNothingOfItStays(self):
+        def made(line, to="terminal", **clock):
+            return self.lab(line.format("--flows 100000"), to=to, merged=True,
+                            environment=preloaded("no_entropy", WAITS="3", **{"TICK": "1000", **clock}))
+        wipe, line = "\r" + " " * 39 + "\r", r"(?:making flow \d+ of 100000|writing \w+: \d+ MB)\r"
+        out = made("generate{} k", TICK="100").out
+        self.assertRegex(out, f"^({line}{wipe})+$")
+        self.assertIn("writing flow", out)
+        first, second = [int(each) // 4096 for each in re.findall(r"making flow (\d+)", out)]
+        self.assertEqual((first, second - first), (19, 3))  # 2 s, and 0.25 s with a look at the clock more
+        self.assertRegex(made("simulate{} k").out, f"^({line}{wipe})+simulating in k\n$")
+        self.assertEqual([made("generate{} k", "pipe"), made("run {} -- true")], [("", "", 0)] * 2)
+        seen = made("generate{} k", LOOKS="9")
+        self.assertRegex(seen.out, f"^({line}{wipe})+$")
+        self.assertEqual(seen.status, -signal.SIGINT)
 
     def test_EndsWhereItCannotGoOn(self):
         self.assertEqual(self.lab("simulate made", to="/dev/full"), ("", "write error: No space left on device\n", 74))
