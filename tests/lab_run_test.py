@@ -163,14 +163,14 @@ class Kernels(LabCase):
             return self.lab(line.format("--flows 100000"), to=to, merged=True,
                             environment=preloaded("no_entropy", WAITS="3", **{"TICK": "1000", **clock}))
         wipe, line = "\r" + " " * 39 + "\r", r"(?:making flow \d+ of 100000|writing \w+: \d+ MB)\r"
-        out = made("generate{} k", TICK="100").out
+        out = made("generate {} k", TICK="100").out
         self.assertRegex(out, f"^({line}{wipe})+$")
         self.assertIn("writing flow", out)
         first, second = [int(each) // 4096 for each in re.findall(r"making flow (\d+)", out)]
         self.assertEqual((first, second - first), (19, 3))  # 2 s, and 0.25 s with a look at the clock more
-        self.assertRegex(made("simulate{} k").out, f"^({line}{wipe})+simulating in k\n$")
-        self.assertEqual([made("generate{} k", "pipe"), made("run {} -- true")], [("", "", 0)] * 2)
-        seen = made("generate{} k", LOOKS="9")
+        self.assertRegex(made("simulate {} k").out, f"^({line}{wipe})+simulating in k\n$")
+        self.assertEqual([made("generate {} k", "pipe"), made("run {} -- true")], [("", "", 0)] * 2)
+        seen = made("generate {} k", LOOKS="9")
         self.assertRegex(seen.out, f"^({line}{wipe})+$")
         self.assertEqual(seen.status, -signal.SIGINT)
 
