@@ -29,12 +29,11 @@ _tarvellab() {
   done
   local option="$command ${COMP_WORDS[COMP_CWORD - 1]}"
   if ((COMP_CWORD == 1)); then
-    values="${!_tarvellab_options[*]} --help --version"
+    [[ $current == -* ]] && values='--help --version' || values=${!_tarvellab_options[*]}
   elif [[ ${_tarvellab_values[$option]+known} ]]; then
     values=${_tarvellab_values[$option]}
   elif [[ $current == -* ]]; then
     values=${_tarvellab_options[$command]}
-    [[ $command != run ]] || values+=--
   else
     # Readline completes names of directories where nothing is offered.
     compopt -o dirnames

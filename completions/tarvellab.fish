@@ -19,7 +19,7 @@ end
 function __tarvellab_command
     set -l words (commandline -opc)
     set -l end (contains -i -- -- $words)
-    complete -C (string join ' ' (string escape -- $words[(math $end + 1)..]) (commandline -ct))
+    complete -C (string join -- ' ' (string escape -- $words[(math $end + 1)..]) (commandline -ct))
 end
 
 complete -c tarvellab -f

@@ -18,7 +18,6 @@ case $state in
   command) compadd -- ${(ko)specs} ;;
   arguments)
     local -a known=(${(Q)${(z)specs[$words[1]]}})
-    [[ $words[1] == run ]] && known+=('--')
     _arguments $known '1:directory:_files -/'
     ;;
 esac

@@ -9,10 +9,12 @@ import tempfile
 from runs import build, top
 
 expected = """bin/tarvelctl bin/tarvellab share/bash-completion/completions/tarvelctl
+    share/bash-completion/completions/tarvellab
     share/doc/tarvelctl/changelog.Debian.gz share/doc/tarvelctl/copyright
     share/doc/tarvelctl/from-symptom-to-command.md share/fish/vendor_completions.d/tarvelctl.fish
+    share/fish/vendor_completions.d/tarvellab.fish
     share/man/man1/tarvelctl.1.gz share/man/man1/tarvellab.1.gz share/man/man5/tarvel-tables.5.gz
-    share/zsh/vendor-completions/_tarvelctl""".split()
+    share/zsh/vendor-completions/_tarvelctl share/zsh/vendor-completions/_tarvellab""".split()
 
 
 def run(*words):
