@@ -10,37 +10,12 @@
 #include <vector>
 
 #include "common/tables/values.h"
+#include "completions/live_lists.h"
 #include "lab/command_line.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 
 namespace {
-
-// What the kernel in sight has, by the report that tells it and the awk program that finds it there: words,
-// each with what it is behind a tab, if that is known.
-constexpr struct {
-  const char *name;
-  const char *report;
-  const char *always;  // what there is in any kernel
-  const char *program;
-} live_lists[] = {
-    {"objects", "tree", "", R"(BEGIN { FS = "\"" } { v = $4 $3; gsub(/[^A-Za-z0-9._-]/, "", v) }
-    function done() { if (id !~ /^0*-0*-0*-0*-0*$/) print id "\t" what }
-    $2 == "uuid" { done(); id = v; what = "" }
-    $2 == "type" { what = v }
-    $2 == "name" { on = v; what = what " " v }
-    $2 == "type" && v == "nexus" { what = what " of " on }
-    $2 == "pid" { pid = v }
-    $2 == "proc_name" { what = what " of " v "." pid " on " on }
-    END { done() })"},
-    {"nexuses", "provider", "", R"(/^\tinstance / { print $2 "\t" what; next }
-    match($0, / [0-9A-F]+-[0-9A-F]+-[0-9A-F]+-[0-9A-F]+-/) {
-      what = substr($0, 1, RSTART - 1); gsub(/[^A-Za-z0-9._ -]/, "", what) })"},
-    {"addresses", "netns -a", "global", R"($2 == "port" && $5 != "global" { print $5 })"},
-};
-
-// Reports hold texts of strangers: nothing but a UUID or an address gets through, and words behind a tab.
-constexpr char harmless[] = "^([0-9A-F]{8}(-[0-9A-F]{4}){3}-[0-9A-F]{12}|[0-9a-f.:]+)(\t[A-Za-z0-9._ -]*)?$";
 
 template <class Words>
 std::string names_of(const Words &words) {
@@ -134,18 +109,6 @@ completed_program tarvellab() {
     program.commands.push_back({std::string(row.name), row.purpose, "", std::move(options)});
   }
   return program;
-}
-
-// The functions that print the live lists, in what the three shells have in common.
-void print_live_lists(const char *head, const char *tail) {
-  for (const auto &list : live_lists) {
-    std::printf(head, list.name);
-    if (*list.always) std::printf("  echo %s\n", list.always);
-    std::printf(
-        "  command timeout 1 tarvelctl %s </dev/null 2>/dev/null | command env LC_ALL=C awk '%s' |\n"
-        "    command env LC_ALL=C sed -nE '/%s/p' | command sort -u\n%s\n",
-        list.report, list.program, harmless, tail);
-  }
 }
 
 void print_bash(const completed_program &program) {
