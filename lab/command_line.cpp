@@ -16,23 +16,13 @@ namespace {
 constexpr std::uint32_t most_records = 10'000'000;
 constexpr char records[] = "0 to 10000000";
 
-template <class Number>
-bool parse_number(std::string_view text, Number least, Number most, Number &number) {
-  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-  return error == std::errc() && end == text.data() + text.size() && number >= least && number <= most;
-}
-
-template <auto Size, std::uint32_t Most = most_records>
-bool take_size(std::string_view value, options &asked) {
-  return parse_number(value, 0U, Most, asked.size.*Size);
-}
-
-bool take_seed(std::string_view value, options &asked) {
-  return parse_number<std::uint64_t>(value, 0, UINT64_MAX, asked.seed);
-}
-
-bool take_interval(std::string_view value, options &asked) {
-  return parse_number(value, 10U, 3'600'000U, asked.interval);
+template <auto Field, std::uint64_t Most = most_records, std::uint64_t Least = 0>
+bool take_number(std::string_view value, options &asked) {
+  std::uint64_t number = 0;
+  const auto [end, error] = std::from_chars(value.data(), value.data() + value.size(), number);
+  if (error != std::errc() || end != value.data() + value.size()) return false;
+  asked.*Field = static_cast<std::remove_reference_t<decltype(asked.*Field)>>(number);
+  return number >= Least && number <= Most;
 }
 
 // Seconds, with decimals or without.
@@ -45,10 +35,6 @@ bool take_every(std::string_view value, options &asked) {
   if (!(seconds * 1000 >= 10 && seconds * 1000 <= 3'600'000)) return false;
   asked.every = static_cast<std::uint32_t>(std::lround(seconds * 1000));
   return true;
-}
-
-bool take_count(std::string_view value, options &asked) {
-  return parse_number(value, 1U, most_records, asked.count);
 }
 
 bool take_redact(std::string_view /*value*/, options &asked) {
@@ -65,22 +51,24 @@ constexpr command command_rows[] = {
 constexpr unsigned in_worlds = in_generate | in_simulate | in_run;
 
 constexpr option_row option_rows[] = {
-    {in_worlds, "--providers", "N", records, "nexus providers (9)", take_size<&sizes::providers>},
-    {in_worlds, "--nexuses", "N", records, "nexus instances (about 3 for 2 providers)",
-     take_size<&sizes::nexuses>},
-    {in_worlds, "--channels", "N", records, "channels (28)", take_size<&sizes::channels>},
-    {in_worlds, "--rings", "N", "0 to 1024", "rings of each channel (2)", take_size<&sizes::rings, 1024>},
-    {in_worlds, "--flows", "N", records, "flows (60)", take_size<&sizes::flows>},
-    {in_worlds, "--stacks", "N", records, "user-space stacks (one per flow channel and switch)",
-     take_size<&sizes::stacks>},
-    {in_worlds, "--arenas", "N", records, "memory arenas (10)", take_size<&sizes::arenas>},
-    {in_worlds, "--namespaces", "N", records, "port namespaces (14)", take_size<&sizes::namespaces>},
-    {in_worlds, "--processes", "N", records, "processes (13)", take_size<&sizes::processes>},
-    {in_worlds, "--seed", "N", "0 to 18446744073709551615", "what chance begins with (1)", take_seed},
+    {in_worlds, "--providers", "N", records, "nexus providers (9)", take_number<&sizes::providers>},
+    {in_worlds, "--nexuses", "N", records, "nexus instances (3 for 2 providers)",
+     take_number<&sizes::nexuses>},
+    {in_worlds, "--channels", "N", records, "channels (28)", take_number<&sizes::channels>},
+    {in_worlds, "--rings", "N", "0 to 1024", "rings of each channel (2)", take_number<&sizes::rings, 1024>},
+    {in_worlds, "--flows", "N", records, "flows (60)", take_number<&sizes::flows>},
+    {in_worlds, "--stacks", "N", records, "user-space stacks (as fit the flows)",
+     take_number<&sizes::stacks>},
+    {in_worlds, "--arenas", "N", records, "memory arenas (10)", take_number<&sizes::arenas>},
+    {in_worlds, "--namespaces", "N", records, "port namespaces (14)", take_number<&sizes::namespaces>},
+    {in_worlds, "--processes", "N", records, "processes (13)", take_number<&sizes::processes>},
+    {in_worlds, "--seed", "N", "0 to 18446744073709551615", "what chance begins with (1)",
+     take_number<&options::seed, UINT64_MAX>},
     {in_simulate | in_run, "--interval", "MS", "10 to 3600000", "milliseconds between two snapshots (1000)",
-     take_interval},
+     take_number<&options::interval, 3'600'000, 10>},
     {in_capture, "--every", "SECONDS", "0.01 to 3600", "the time between two moments", take_every},
-    {in_capture, "--count", "N", "1 to 10000000", "how many moments", take_count},
+    {in_capture, "--count", "N", "1 to 10000000", "how many moments",
+     take_number<&options::count, most_records, 1>},
     {in_capture, "--redact", "", "", "put substitutes for addresses and names", take_redact},
 };
 
@@ -118,26 +106,17 @@ int help(unsigned of) {
   return EXIT_SUCCESS;
 }
 
-int version() {
-  print<"tarvellab %s\n">(TARVELCTL_VERSION);
-  report.flush();
-  return EXIT_SUCCESS;
-}
-
-// Takes an option, with the word behind it where it wants one. Returns the last word that was taken, or null
-// after a message.
-char **take_option(const command &of, char **argument, options &asked) {
+// Takes an option, with the word behind it where it wants one; `argument` is then the last word that was
+// taken.
+bool take_option(const command &of, char **&argument, options &asked) {
   const std::string name = *argument;
   const auto *known = std::ranges::find(option_rows, name, &option_row::name);
-  if (known == std::end(option_rows) || !(known->in & of.bit)) {
-    refuse(std::string(of.name) + " has no option " + name);
-    return nullptr;
-  }
+  if (known == std::end(option_rows) || !(known->in & of.bit))
+    return refuse(std::string(of.name) + " has no option " + name);
   if (!known->argument.empty()) ++argument;
-  if (*argument && known->take(*argument, asked)) return argument;
+  if (*argument && known->take(*argument, asked)) return true;
   const std::string seen = *argument ? ", not '" + std::string(*argument) + "'" : "";
-  refuse(name + " takes " + std::string(known->values) + seen);
-  return nullptr;
+  return refuse(name + " takes " + std::string(known->values) + seen);
 }
 
 // Whether what is asked for is complete and goes together. `shape` is the last option, if there was one.
@@ -162,8 +141,7 @@ bool parse(const command &row, char **argument, options &asked) {
     }
     if (word.starts_with('-')) {
       shape = word;
-      argument = take_option(row, argument, asked);
-      if (!argument) return false;
+      if (!take_option(row, argument, asked)) return false;
     } else if (word.empty() || !asked.directory.empty()) {
       return refuse(std::string(row.name) + " takes one directory, and '" + *argument + "' cannot be it");
     } else {
@@ -173,30 +151,30 @@ bool parse(const command &row, char **argument, options &asked) {
   return is_whole(row, asked, shape);
 }
 
-// Whether help is asked for, in front of what is another command's.
-bool asks_for_help(char **argument) {
-  const std::string_view help = "--help", end = "--";
-  while (*argument && *argument != end && *argument != help) ++argument;
-  return *argument && *argument == help;
-}
-
 }  // namespace
 
 const std::span<const command> commands = command_rows;
 const std::span<const option_row> known_options = option_rows;
 
 int run_command_line(int argc, char **argv) {
-  const std::string_view word = argc > 1 ? argv[1] : "";
+  const std::string_view word = argc > 1 ? argv[1] : "--";
   if (word == "--help") return help(~0U);
-  if (word == "--version") return version();
-  for (const command &row : command_rows) {
-    if (row.name != word) continue;
-    if (asks_for_help(argv + 2)) return help(row.bit);
-    options asked;
-    return parse(row, argv + 2, asked) ? row.handler(asked) : exit_status::usage;
+  if (word == "--version") {
+    print<"tarvellab %s\n">(TARVELCTL_VERSION);
+    report.flush();
+    return EXIT_SUCCESS;
   }
-  refuse(argc > 1 ? "there is no command '" + std::string(word) + "'" : "a command is missing");
-  return exit_status::usage;
+  const auto *row = std::ranges::find(command_rows, word, &command::name);
+  if (row == std::end(command_rows)) {
+    refuse(argc > 1 ? "there is no command '" + std::string(word) + "'" : "a command is missing");
+    return exit_status::usage;
+  }
+  // In front of what is another command's.
+  for (char **each = argv + 2; *each && *each != std::string_view("--"); ++each) {
+    if (*each == std::string_view("--help")) return help(row->bit);
+  }
+  options asked;
+  return parse(*row, argv + 2, asked) ? row->handler(asked) : exit_status::usage;
 }
 
 }  // namespace lab

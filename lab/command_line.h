@@ -13,8 +13,7 @@
 namespace lab {
 
 // What the user asked for.
-struct options {
-  sizes size;
+struct options : sizes {
   std::uint64_t seed = 1;
   std::uint32_t interval = 1000;  // milliseconds between two snapshots
   std::uint32_t every = 0;        // milliseconds between two captured moments; 0: there is one

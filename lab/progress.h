@@ -1,8 +1,8 @@
 // A line that says how far long work has come, for who waits at a terminal.
 //
 // It is on standard error, is rewritten some times a second, and is gone when the work is done, when
-// anything else is said, and when SIGINT or SIGTERM ends the process. Work that is done within two seconds
-// has none, nor has work in the background, or whose standard error is no terminal.
+// anything else is said, and when SIGINT or SIGTERM ends the process. Work has none in its first two seconds,
+// in the background, or where standard error is no terminal.
 
 #ifndef TARVELCTL_LAB_PROGRESS_H
 #define TARVELCTL_LAB_PROGRESS_H
@@ -16,8 +16,6 @@ class progress {
  public:
   progress();
   ~progress();
-  progress(const progress &) = delete;
-  progress &operator=(const progress &) = delete;
 
   // Says where the work under way is, if there is any and it is time to say so again; at most 39 columns.
   template <format::text F, class... Args>
