@@ -19,17 +19,15 @@ std::int64_t next_due = INT64_MAX;
 
 void wipe_and_end(int number) {
   diagnostics.write_at_once(wipe.view());
-  raise(number);  // whose own effect is restored
+  signal(number, SIG_DFL);
+  raise(number);
 }
 
 void wipe_at_signals() {
   for (const int number : {SIGINT, SIGTERM}) {
     struct sigaction action {};
     sigaction(number, nullptr, &action);
-    if (action.sa_handler != SIG_DFL) continue;
-    action.sa_handler = wipe_and_end;
-    action.sa_flags = SA_RESETHAND;
-    sigaction(number, &action, nullptr);
+    if (action.sa_handler == SIG_DFL) signal(number, wipe_and_end);
   }
 }
 
