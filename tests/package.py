@@ -48,7 +48,8 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     (scratch / "scripts").mkdir()
     os.chdir(top)
     shown = run("scripts/demo", root / "usr/bin")
-    check_has(shown, f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14", "Proto Local Address", "LISTENER")
+    check_has(shown, f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14", "Proto Local Address",
+              "LISTENER")
     three_screens, lines = 3 * 24, shown.splitlines()
     assert len(lines) <= three_screens and max(map(len, lines[1:])) <= 120, shown
     check_has((top / "build/demo/netstat_-a_-n.txt").read_text(), "MULTIPLE")
