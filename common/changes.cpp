@@ -42,7 +42,7 @@ class table_comparison {
       changed.bytes = record;
       changed.place = place;
       for (counter_change &each : each_[kind].counters) each.difference.reset();
-      changed.became = compare(kind, record);
+      changed.became = compare(kind);
       visitor_(to_, changed);
     });
     if (before_ && now_.is_whole) visit_gone();
@@ -55,7 +55,7 @@ class table_comparison {
     std::vector<std::byte> bytes;  // of what is put back
   };
 
-  fate compare(std::size_t kind, record_bytes record) {
+  fate compare(std::size_t kind) {
     const kept_record own = now_.records.at(own_at_);
     own_at_ = own.next;
     if (!before_) return fate::unknown;
@@ -68,15 +68,16 @@ class table_comparison {
     before_->records.mark(at);
     likely_ = found.next;
     if (own.is_ambiguous || found.is_ambiguous) return fate::ambiguous;
-    return subtract(kind, record, found.counters) ? fate::same : fate::restarted;
+    return subtract(kind, found.counters, own.counters) ? fate::same : fate::restarted;
   }
 
   // False, and no difference, where a counter has restarted.
-  bool subtract(std::size_t kind, record_bytes record, record_bytes counters) {
+  bool subtract(std::size_t kind, record_bytes before, record_bytes now) {
     for (counter_change &each : each_[kind].counters) {
-      const std::optional<std::uint64_t> before = take_counter(each.counter, counters);
-      if (!before || !each.counter.holds(record)) continue;
-      each.difference = each.counter.in(record) - *before;
+      const std::optional<std::uint64_t> from = take_counter(each.counter, before);
+      const std::optional<std::uint64_t> to = take_counter(each.counter, now);
+      if (!from || !to) continue;
+      each.difference = *to - *from;
       if (*each.difference < most_progress) continue;
       for (counter_change &other : each_[kind].counters) other.difference.reset();
       return false;

@@ -30,6 +30,18 @@ std::byte *put(const Value &value, std::byte *to) {
   return to + sizeof value;
 }
 
+// A copy of constant size needs no call, and most fields are of either.
+std::byte *put_bytes(const std::byte *from, std::size_t size, std::byte *to) {
+  if (size == sizeof(std::uint32_t)) {
+    std::memcpy(to, from, sizeof(std::uint32_t));
+  } else if (size == sizeof(uuid)) {
+    std::memcpy(to, from, sizeof(uuid));
+  } else {
+    std::memcpy(to, from, size);
+  }
+  return to + size;
+}
+
 // In as few bytes as it needs, because most counters are small.
 std::byte *put_number(std::uint64_t number, std::byte *to) {
   for (; number >> seven_bits; number >>= seven_bits) *to++ = static_cast<std::byte>(number | 0x80);
@@ -58,8 +70,7 @@ std::byte *put_key(const record_kind &kind, std::uint64_t above, std::size_t pla
     if (field->depends() && !field->holds(record)) continue;
     const std::size_t size = field->size_in(record);
     if (field->type == field_type::text) *to++ = static_cast<std::byte>(size);
-    std::memcpy(to, record.data() + field->offset, size);
-    to += size;
+    to = put_bytes(record.data() + field->offset, size, to);
   }
   return to;
 }
@@ -122,33 +133,50 @@ std::size_t put_back(const record_kind &kind, const kept_record &kept, std::span
 }
 
 bool kept_records::keep(const record_kinds &kinds, record_bytes table) {
-  std::size_t count = 0;
-  kinds.walk(table, [&](std::size_t, std::size_t, record_bytes) { ++count; });
-  slots_.assign(count + count / 2 + 1, 0);
-  std::vector<std::byte> room(room_for(kinds));
-  std::vector<std::uint64_t> hashes(kinds.size());
+  const std::size_t most = room_for(kinds);
+  std::vector<std::uint64_t> hashes;
+  std::vector<std::uint64_t> last(kinds.size());  // by kind
   const bool is_whole = kinds.walk(table, [&](std::size_t kind, std::size_t place, record_bytes record) {
-    std::byte *const start = room.data();
+    if (room_ - end_ < most) resize(2 * room_ + most);
+    std::byte *const start = bytes_.get() + end_;
     std::byte *const key = start + kind_offset;
-    const std::byte *const key_end =
-        put_key(kinds[kind], hashes[kinds[kind].above], place, record, start + sizeof(kept_head));
-    std::byte *const end = put_counters(kinds[kind], record, start + (key_end - start));
+    std::byte *const key_end =
+        put_key(kinds[kind], last[kinds[kind].above], place, record, start + sizeof(kept_head));
+    std::byte *const end = put_counters(kinds[kind], record, key_end);
     put(kept_head{static_cast<std::uint32_t>(end - start),
                   static_cast<std::uint16_t>(key_end - key),
                   {},
                   static_cast<std::uint8_t>(kind)},
         start);
-    hashes[kind] = keyed_hash({key, key_end});
-    add({start, end}, {key, key_end}, hashes[kind]);
+    end_ += static_cast<std::size_t>(end - start);
+    hashes.push_back(last[kind] = keyed_hash({key, key_end}));
   });
-  bytes_ = std::vector<std::byte>(bytes_.begin(), bytes_.end());  // without room for more
+  resize(end_);
+  index(hashes);
   return is_whole;
 }
 
-void kept_records::add(record_bytes record, record_bytes key, std::uint64_t hash) {
-  const std::size_t position = bytes_.size();
-  bytes_.insert(bytes_.end(), record.begin(), record.end());
-  std::uint64_t &slot = slots_[slot_of(key, hash)];
+void kept_records::resize(std::size_t room) {
+  void *const resized = xrealloc(bytes_.get(), room);
+  static_cast<void>(bytes_.release());
+  bytes_.reset(static_cast<std::byte *>(resized));
+  room_ = room;
+}
+
+// Slots are waited for unless they are asked for ahead.
+void kept_records::index(std::span<const std::uint64_t> hashes) {
+  constexpr std::size_t ahead = 16;
+  slots_.assign(hashes.size() + hashes.size() / 2 + 1, 0);
+  std::size_t position = 0;
+  for (std::size_t i = 0; i < hashes.size(); ++i) {
+    if (i + ahead < hashes.size()) __builtin_prefetch(&slots_[first_slot_of(hashes[i + ahead])]);
+    enter(position, hashes[i]);
+    position = at(position).next;
+  }
+}
+
+void kept_records::enter(std::size_t position, std::uint64_t hash) {
+  std::uint64_t &slot = slots_[slot_of(at(position).key, hash)];
   if (slot) {
     marks_of((slot & position_mask) - 1) |= ambiguous;
     marks_of(position) |= ambiguous;
@@ -158,8 +186,9 @@ void kept_records::add(record_bytes record, record_bytes key, std::uint64_t hash
 }
 
 kept_record kept_records::at(std::size_t position) const {
-  const auto head = record_at<kept_head>(record_bytes(bytes_).subspan(position), 0);
-  const record_bytes record = record_bytes(bytes_).subspan(position, head.size);
+  kept_head head;
+  std::memcpy(&head, bytes_.get() + position, sizeof head);
+  const record_bytes record(bytes_.get() + position, head.size);
   return {.position = position,
           .next = position + head.size,
           .kind = head.kind,
@@ -170,7 +199,7 @@ kept_record kept_records::at(std::size_t position) const {
 }
 
 std::byte &kept_records::marks_of(std::size_t position) {
-  return bytes_[position + offsetof(kept_head, marks)];
+  return bytes_.get()[position + offsetof(kept_head, marks)];
 }
 
 bool kept_records::has_key(std::size_t position, record_bytes key) const {
@@ -178,9 +207,13 @@ bool kept_records::has_key(std::size_t position, record_bytes key) const {
   return own.size() == key.size() && std::memcmp(own.data(), key.data(), key.size()) == 0;
 }
 
+std::size_t kept_records::first_slot_of(std::uint64_t hash) const {
+  return high_product(hash, slots_.size());
+}
+
 // The slot that has this key, or the free one where it belongs. There is a free one.
 std::size_t kept_records::slot_of(record_bytes key, std::uint64_t hash) const {
-  std::size_t at = high_product(hash, slots_.size());
+  std::size_t at = first_slot_of(hash);
   const auto is_other = [&](std::uint64_t slot) {
     return (slot ^ hash << position_bits) >> position_bits || !has_key((slot & position_mask) - 1, key);
   };

@@ -6,11 +6,13 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <span>
 #include <vector>
 
 #include "common/record_kinds.h"
+#include "common/text/memory.h"
 
 // A record as it is kept.
 struct kept_record {
@@ -38,7 +40,7 @@ class kept_records {
   bool keep(const record_kinds &kinds, record_bytes table);
 
   // The records by position: from 0, each leads to the next, up to end(). There is one at `position`.
-  std::size_t end() const { return bytes_.size(); }
+  std::size_t end() const { return end_; }
   kept_record at(std::size_t position) const;
 
   // The position of the first record with this key, or none. It is asked for at `likely` before all others,
@@ -49,17 +51,22 @@ class kept_records {
   void mark(std::size_t position) { marks_of(position) |= seen; }
 
   // Bytes of memory.
-  std::size_t size() const { return bytes_.capacity() + slots_.capacity() * sizeof slots_[0]; }
+  std::size_t size() const { return end_ + slots_.size() * sizeof slots_[0]; }
 
  private:
   static constexpr std::byte seen{1}, ambiguous{2};  // marks
 
-  void add(record_bytes head, record_bytes counters, std::uint64_t hash);
-  std::byte &marks_of(std::size_t position);
-  bool has_key(std::size_t position, record_bytes key) const;
+  void resize(std::size_t room);
+  void index(std::span<const std::uint64_t> hashes);
+  void enter(std::size_t position, std::uint64_t hash);
+  std::size_t first_slot_of(std::uint64_t hash) const;
   std::size_t slot_of(record_bytes key, std::uint64_t hash) const;
+  bool has_key(std::size_t position, record_bytes key) const;
+  std::byte &marks_of(std::size_t position);
 
-  std::vector<std::byte> bytes_;
+  std::unique_ptr<std::byte, c_free> bytes_;
+  std::size_t end_ = 0;
+  std::size_t room_ = 0;              // bytes that there are
   std::vector<std::uint64_t> slots_;  // of a position and a part of its hash each, 0 where it is free
 };
 

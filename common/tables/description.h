@@ -12,6 +12,7 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <optional>
 #include <span>
 #include <string_view>
@@ -53,7 +54,26 @@ struct number_at {
   field_type type = field_type::u8;
 
   // The number, sign extended.
-  std::int64_t in(record_bytes record) const;
+  std::int64_t in(record_bytes record) const {
+    const auto read = [&]<class Number>(Number value) {
+      std::memcpy(&value, record.data() + offset, sizeof value);
+      return value;
+    };
+    switch (type) {
+      case field_type::u8:
+        return read(std::uint8_t{});
+      case field_type::u16:
+        return read(std::uint16_t{});
+      case field_type::net16:
+        return std::rotl(read(std::uint16_t{}), 8);
+      case field_type::u32:
+        return read(std::uint32_t{});
+      case field_type::i32:
+        return read(std::int32_t{});
+      default:
+        return read(std::int64_t{});
+    }
+  }
 };
 
 // On what a field says anything: that a number of the record is, masked, one of some small ones or, inverted,
@@ -107,7 +127,9 @@ struct row {
 
   // How many bytes of its only element say anything: of a text those in front of a NUL, of what has a length
   // those that count. An address of a length that no family has says nothing.
-  std::size_t size_in(record_bytes record) const;
+  std::size_t size_in(record_bytes record) const {
+    return length || type == field_type::text ? size_said_in(record) : size;
+  }
 
   // Whether it tells its record from others: an equal one, at another moment, is the same record.
   constexpr bool is_key() const {
@@ -166,6 +188,8 @@ struct row {
   }
 
  private:
+  std::size_t size_said_in(record_bytes record) const;
+
   constexpr row on(const field_condition &decisive) const { return with(&row::condition, decisive); }
 };
 
