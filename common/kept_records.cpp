@@ -118,8 +118,10 @@ std::size_t put_back(const record_kind &kind, const kept_record &kept, std::span
   if (kind.field) key.take(place);
   for (const row *field : kind.keys) {
     if (field->depends() && !field->holds(record)) continue;
-    std::size_t size = field->size_in(record);
-    if (std::uint8_t said = 0; field->type == field_type::text && key.take(said)) size = said;
+    const bool is_text = field->type == field_type::text;
+    std::uint8_t said = 0;
+    if (is_text) key.take(said);
+    const std::size_t size = is_text ? said : field->size_in(record);
     record_bytes value;
     key.take(size, value);
     std::ranges::copy(value, record.begin() + field->offset);
