@@ -128,10 +128,9 @@ TEST_F(changes, ARateNeedsAClockThatGoesOn) {
 TEST_F(changes, AFlowIsKnownByNexusInterfaceOwnerProtocolAndEnds) {
   enum { v4 = 2, v6 = 30, neither = 7 };
   const auto with = [](int family) { return flow(1).put(81, static_cast<unsigned>(family), 1); };
+  const std::vector<std::size_t> always{0, 15, 16, 18, 19, 68, 71, 81, 136};
   const std::pair<int, std::vector<std::size_t>> known_by[] = {
-      {v4, {0, 15, 16, 18, 19, 68, 71, 81, 82, 83, 84, 87, 110, 112, 115, 136}},
-      {v6, {0, 16, 68, 81, 82, 88, 103, 110, 116, 131, 136}},
-      {neither, {0, 16, 68, 81, 136}}};
+      {v4, {82, 83, 84, 87, 110, 112, 115}}, {v6, {82, 83, 88, 103, 110, 116, 131}}, {neither, {}}};
   for (const auto &[family, offsets] : known_by) {
     for (const std::size_t at :
          {0,  15, 16,  18,  19,  20,  31,  32,  36,  68,  71,  72,  76,  80,  81,  82,  83,  84,
@@ -140,7 +139,7 @@ TEST_F(changes, AFlowIsKnownByNexusInterfaceOwnerProtocolAndEnds) {
       flows(with(family));
       std::string other = with(family);
       other[at] = static_cast<char>(other[at] ^ 1);
-      const bool is_other = std::ranges::count(offsets, at);
+      const bool is_other = std::ranges::count(offsets, at) || std::ranges::count(always, at);
       EXPECT_EQ(flows(other), is_other ? "flow appeared -4;flow gone -4;" : "flow same;")
           << at << " " << family;
     }
@@ -166,7 +165,7 @@ TEST_F(changes, OfAnAddressCountAsManyBytesAsItIsLong) {
       const std::string told = next(table_of(netns_node), space(length, at));
       const bool is_other = at < first_of_no_use;
       EXPECT_EQ(told.starts_with(is_other ? "netns appeared;range" : "netns same;range"), true) << told;
-      if (is_other) EXPECT_EQ(last, record(32).put(0, 80, 2));
+      EXPECT_EQ(last, is_other ? record(32).put(0, 80, 2) : space(length, at).substr(32));
     }
   }
 }
@@ -250,9 +249,9 @@ TEST_F(changes, WhatIsNotReadIsNotGone) {
   kept.keep(read_moment());
   EXPECT_EQ(flows(""), "flow gone -4;flow gone -4;");
   EXPECT_EQ(flows(flow(1)), "flow appeared -4;");
-  EXPECT_EQ(next(table_of(ring_stat_enable_node), "12") + next(table_of(ring_stat_enable_node), "22"),
-            "ring_stat_enable unknown;ring_stat_enable same;");
-  EXPECT_GT(kept.size(), 100U);
+  EXPECT_EQ(next(table_of(ring_stat_enable_node), "12"), "ring_stat_enable unknown;");
+  EXPECT_EQ(next(table_of(ring_stat_enable_node), "22"), "ring_stat_enable same;");
+  EXPECT_GT(kept.size(), 50U);
 }
 
 TEST_F(changes, AMomentSaysWhatCouldNotBeReadAndWhen) {
