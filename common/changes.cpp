@@ -28,7 +28,7 @@ class table_comparison {
       : kinds_(kinds), before_(before), now_(now), visitor_(visitor), to_(to), each_(kinds.size()) {
     for (std::size_t kind = 0; kind < kinds.size(); ++kind) {
       const record_kind &of = kinds[kind];
-      for (const counter_at &counter : of.counters) each_[kind].counters.push_back({counter});
+      for (const counter_at &counter : of.counters) each_[kind].counters.push_back({counter, {}});
       changed_record &record = each_[kind].record;
       record = {.what = of.what, .part = of.part, .counters = each_[kind].counters};
       if (of.has_above()) record.above = &each_[of.above].record;
@@ -74,8 +74,8 @@ class table_comparison {
   // False, and no difference, where a counter has restarted.
   bool subtract(std::size_t kind, record_bytes before, record_bytes now) {
     for (counter_change &each : each_[kind].counters) {
-      const std::optional<std::uint64_t> from = take_counter(each.counter, before);
-      const std::optional<std::uint64_t> to = take_counter(each.counter, now);
+      const std::optional<std::uint64_t> from = take_counter(each, before);
+      const std::optional<std::uint64_t> to = take_counter(each, now);
       if (!from || !to) continue;
       each.difference = *to - *from;
       if (*each.difference < most_progress) continue;

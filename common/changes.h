@@ -30,8 +30,7 @@ enum class fate : std::uint8_t {
 // counter did not hold before or does not hold now. A counter that falls has restarted, unless it has gone on
 // modulo 2^64 by less than 2^48, which no counter does by restarting; one that has risen by more has not
 // counted up to there.
-struct counter_change {
-  counter_at counter;
+struct counter_change : counter_at {
   std::optional<std::uint64_t> difference{};
 };
 

@@ -17,7 +17,7 @@ std::size_t record_kinds::add(const record_description &what, std::string_view p
   const std::size_t kind = kinds_.size();
   record_kind made{&what, part, above, field, follower, {}, {}, {}};
   for (const row &each : what.rows) add_field(made, each);
-  std::ranges::stable_partition(made.keys, [](const row *each) { return !each->depends(); });
+  std::stable_partition(made.keys.begin(), made.keys.end(), [](const row *each) { return !each->depends(); });
   kinds_.push_back(std::move(made));
   const auto add_below = [&](const record_description &each, std::string_view name, const row *in,
                              std::size_t place) {

@@ -77,7 +77,7 @@ class changes : public testing::Test {
       for (const counter_change &counter : each.counters) {
         without += !counter.difference;
         if (counter.difference.value_or(0)) {
-          text << " " << counter.counter.field->name << "+" << *counter.difference;
+          text << " " << counter.field->name << "+" << *counter.difference;
         }
         if (!rate) rate = each.rate(counter);
       }
