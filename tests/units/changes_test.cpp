@@ -147,9 +147,11 @@ TEST_F(changes, AFlowIsKnownByNexusInterfaceOwnerProtocolAndEnds) {
 }
 
 TEST_F(changes, WhatIsGoneHasItsKeyAndCountersLeft) {
-  flows(flow(1, 500, UINT64_MAX).put(36, "curl").put(84, "\1\2\3\4") + flow(2));
-  EXPECT_EQ(flows(flow(2)), "flow same;flow gone -4;");
-  EXPECT_EQ(last, flow(1, 500, UINT64_MAX).put(84, "\1\2\3\4"));
+  const record left = flow(1, 500, UINT64_MAX).put(84, "\1\2\3\4");
+  flows(flow(3).put(16, "bridge100").put(112, "\1\2\3\4") + record(left).put(36, "curl").put(72, 1) +
+        flow(2));
+  EXPECT_EQ(flows(flow(2)), "flow same;flow gone -4;flow gone -4;");
+  EXPECT_EQ(last, left);
 }
 
 TEST_F(changes, OfAnAddressCountAsManyBytesAsItIsLong) {
@@ -170,15 +172,34 @@ TEST_F(changes, OfAnAddressCountAsManyBytesAsItIsLong) {
   }
 }
 
+TEST_F(changes, ARangeIsKnownByBothItsPorts) {
+  for (const std::size_t at : {32, 34, 36, 40, 48}) {
+    kept = {};
+    const record space = record(64).put(18, 1, 1);
+    next(table_of(netns_node), space);
+    const std::string told = next(table_of(netns_node), record(space).put(at, "x"));
+    EXPECT_EQ(told.find("appeared") != told.npos, at < 36) << at;
+  }
+}
+
 TEST_F(changes, RecordsMaySwapPlacesAndThoseThatAreEqualHaveNoRate) {
-  flows(flow(1, 10) + flow(2, 20) + flow(3, 30) + flow(4) + flow(4, 5) + flow(5) + flow(5));
+  flows(flow(1, 10) + flow(2, 20) + flow(3, 30) + flow(4) + flow(8) + flow(4, 5) + flow(5) + flow(5));
   EXPECT_EQ(
-      flows(flow(3, 33) + flow(1, 11) + flow(6) + flow(2, 22) + flow(2, 99) + flow(4, 7) + flow(4), second),
+      flows(flow(3, 33) + flow(1, 11) + flow(6) + flow(2, 22) + flow(2, 99) + flow(8) + flow(4, 7), second),
       "flow same bytes+3 3/s;flow same bytes+1 1/s;flow appeared -4;flow ambiguous -4;flow ambiguous -4;"
-      "flow ambiguous -4;flow ambiguous -4;flow gone -4;flow gone -4;");
-  EXPECT_EQ(flows(flow(7) + flow(7) + flow(4) + flow(2)),
-            "flow ambiguous -4;flow ambiguous -4;flow ambiguous -4;flow ambiguous -4;"
-            "flow gone -4;flow gone -4;flow gone -4;");
+      "flow same 0/s;flow ambiguous -4;flow gone -4;flow gone -4;");
+  EXPECT_EQ(flows(flow(7) + flow(7) + flow(4, 9) + flow(2)),
+            "flow ambiguous -4;flow ambiguous -4;flow same bytes+2;flow ambiguous -4;"
+            "flow gone -4;flow gone -4;flow gone -4;flow gone -4;");
+}
+
+// However their keys fall into the places where they are looked up.
+TEST_F(changes, TwoAreFoundWhoeverTheyAre) {
+  for (std::uint32_t pid = 1; pid < 200; pid += 2) {
+    kept = {};
+    flows(flow(pid) + flow(pid + 1));
+    EXPECT_EQ(flows(flow(pid) + flow(pid + 1)), "flow same;flow same;");
+  }
 }
 
 // As many as would take minutes if each were compared with all.
@@ -194,11 +215,12 @@ TEST_F(changes, RingsAreKnownByChannelAndDirection) {
   const auto &channels = table_of(channel_list_node);
   next(channels, nexus("A", 2) + channel("c", 1, 1) + ring(0, 10) + ring(0, 20) + channel("d", 0, 1) +
                      ring(1, 5) + nexus("B", 0));
-  EXPECT_EQ(next(channels, nexus("B", 1) + channel("d", 0, 1) + ring(1, 6) + nexus("A", 1) +
-                               channel("c", 1, 2) + ring(0, 11) + ring(1, 0) + ring(0, 22)),
-            "nexus same;channel channels0 of B appeared;ring rx0 of d appeared -9;nexus same;"
-            "channel channels0 of A same;ring tx0 of c same corrupted+1;ring rx0 of c appeared -9;"
-            "ring rx1 of c same corrupted+2;channel channels0 of A gone;ring rx0 of d gone -9;");
+  EXPECT_EQ(
+      next(channels, nexus("B", 1) + channel("d", 0, 1) + ring(1, 6) + nexus("A", 1) + channel("c", 1, 2) +
+                         ring(0, 11) + ring(1, 0) + ring(0, 22) + nexus("C", 0)),
+      "nexus same;channel channels0 of B appeared;ring rx0 of d appeared -9;nexus same;"
+      "channel channels0 of A same;ring tx0 of c same corrupted+1;ring rx0 of c appeared -9;"
+      "ring rx1 of c same corrupted+2;nexus appeared;channel channels0 of A gone;ring rx0 of d gone -9;");
   EXPECT_EQ(last, ring(1, 5));
 }
 
