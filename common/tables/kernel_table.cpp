@@ -26,25 +26,25 @@ void prepare(std::byte *block, std::size_t size) {
   platform::provide_pages(block + half, std::min(half, 64 * mebibyte));
 }
 
-}  // namespace
+// What a fetch failed at.
+enum class step : std::uint8_t { size, memory, contents };
 
-int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const void *new_value,
-                 std::size_t new_length) {
+// sysctl_fetch without a word.
+int fetch(const char *name, void **buffer, std::size_t *length, const void *new_value, std::size_t new_length,
+          step &failed) {
   *buffer = nullptr;
   int retries = 0;
   for (;;) {
+    failed = step::size;
     if (sysctlbyname(name, nullptr, length, new_value, new_length) != 0) {
       const int error = errno;
       if (error == ENOMEM && ++retries < last_retry) continue;
-      complain<"sysctl for len failed, %s\n">(strerror(error));
       return error;
     }
     if (*length == 0) return 0;
+    failed = step::memory;
     auto *block = static_cast<std::byte *>(std::malloc(*length));
-    if (!block) {
-      complain<"sysctl malloc failed\n">();
-      return ENOMEM;
-    }
+    if (!block) return ENOMEM;
     prepare(block, *length);
     if (sysctlbyname(name, block, length, new_value, new_length) == 0) {
       *buffer = block;
@@ -52,17 +52,42 @@ int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const voi
     }
     const int error = errno;
     std::free(block);
+    failed = step::contents;
     if (error == ENOMEM && ++retries < last_retry) continue;
-    complain<"sysctl for buf failed, %s\n">(strerror(error));
     return error;
   }
 }
 
+}  // namespace
+
+int sysctl_fetch(const char *name, void **buffer, std::size_t *length, const void *new_value,
+                 std::size_t new_length) {
+  step failed{};
+  const int error = fetch(name, buffer, length, new_value, new_length, failed);
+  if (!error) return 0;
+  if (failed == step::size) complain<"sysctl for len failed, %s\n">(strerror(error));
+  if (failed == step::memory) complain<"sysctl malloc failed\n">();
+  if (failed == step::contents) complain<"sysctl for buf failed, %s\n">(strerror(error));
+  return error;
+}
+
 int kernel_table::fetch(const char *name) {
   void *buffer = nullptr;
-  length_ = 0;
-  const int error = sysctl_fetch(name, &buffer, &length_, nullptr, 0);
+  std::size_t length = 0;
+  const int error = sysctl_fetch(name, &buffer, &length, nullptr, 0);
+  return hold(error, buffer, length);
+}
+
+int kernel_table::fetch_quietly(const char *name) {
+  void *buffer = nullptr;
+  std::size_t length = 0;
+  step failed{};
+  const int error = ::fetch(name, &buffer, &length, nullptr, 0, failed);
+  return hold(error, buffer, length);
+}
+
+int kernel_table::hold(int error, void *buffer, std::size_t length) {
   buffer_.reset(static_cast<std::byte *>(buffer));
-  if (error) length_ = 0;
+  length_ = error ? 0 : length;
   return error;
 }

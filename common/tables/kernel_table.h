@@ -29,12 +29,16 @@ class kernel_table {
   // Replaces what is held by a fresh snapshot of `name`. Returns the result of sysctl_fetch; the table is
   // empty after a failure.
   int fetch(const char *name);
+  // The same, without a line on standard error.
+  int fetch_quietly(const char *name);
 
   bool empty() const { return length_ == 0; }
   std::size_t size() const { return length_; }
   std::span<const std::byte> bytes() const { return {buffer_.get(), length_}; }
 
  private:
+  int hold(int error, void *buffer, std::size_t length);
+
   std::unique_ptr<std::byte, c_free> buffer_;
   std::size_t length_ = 0;
 };

@@ -1,8 +1,11 @@
 // What finds and holds things in memory.
 
+#include <algorithm>
+
 #include "common/mib.h"
 #include "common/tables/channel.h"
 #include "common/tables/key_index.h"
+#include "common/tables/provider.h"
 #include "common/tables/table_walk.h"
 #include "common/text/memory.h"
 #include "tests/units/units.h"
@@ -21,6 +24,16 @@ TEST(description, NumbersAreReadAsTheyLie) {
   for (const auto &[type, number] :
        {std::pair{u8, 1L}, {u16, 0xff01}, {net16, 0x1ff}, {u32, 0xffffff01}, {i32, -255}, {u64, -255}}) {
     EXPECT_EQ((number_at{1, type}.in(table)), number);
+  }
+}
+
+TEST(description, ATextEndsWhereItIsCut) {
+  std::string provider(264, '\0');
+  provider.replace(64, 5, "utun0");
+  const auto name = std::ranges::find(provider_rows, "name", &row::field);
+  for (const char length : {'\4', '\11'}) {
+    provider[128] = length;
+    EXPECT_EQ(name->size_in(std::as_bytes(std::span(provider))), length == '\4' ? 4U : 5U);
   }
 }
 
