@@ -11,6 +11,7 @@
 #include <utility>
 #include <vector>
 
+#include "common/captured.h"
 #include "common/tables/kernel_table.h"
 #include "common/tables/table_walk.h"
 #include "common/text/output.h"

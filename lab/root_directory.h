@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "lab/own_directory.h"
+#include "common/own_directory.h"
 #include "lab/table_file.h"
 #include "lab/world.h"
 

@@ -15,13 +15,15 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <optional>
+#include <span>
 #include <string_view>
 #include <system_error>
-#include <vector>
 
+#include "common/captured.h"
+#include "common/own_directory.h"
 #include "common/text/output.h"
 #include "common/text/text.h"
-#include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
 #include "lab/simulation.h"
@@ -123,13 +125,13 @@ bool show(const std::string &moment, const own_directory &directory) {
 // Shows the first moment and then the others, at the pace at which they were taken. All come a little earlier
 // after the first than they did, a quarter of the first interval: a watch that starts with the command and
 // has their interval reads each once, in the quarters that are left, though it comes later from read to read.
-bool start_replay(const std::string &first, const std::vector<captured_moment> &later,
-                  const temporary_directory &directory, mover &kernel) {
-  if (!show(first, directory.opened())) return false;
-  const std::int64_t began = monotonic_milliseconds() - later[0].offset / 4;
+bool start_replay(std::span<const captured_moment> moments, const temporary_directory &directory,
+                  mover &kernel) {
+  if (!show(moments[0].root, directory.opened())) return false;
+  const std::int64_t began = monotonic_milliseconds() - moments[1].offset / 4;
   return kernel.start(directory, [&](const sigset_t &stop) {
-    for (const captured_moment &moment : later) {
-      if (stopped_before(began + moment.offset, stop) || !show(moment.path, directory.opened())) return;
+    for (const captured_moment &later : moments.subspan(1)) {
+      if (stopped_before(began + later.offset, stop) || !show(later.root, directory.opened())) return;
     }
     complain<"tarvellab: the last moment is shown\n">();
     int signal;
@@ -215,17 +217,11 @@ int early_signal(const sigset_t &signals) {
   }
 }
 
-// Finds what there is in the directory that was named, says whose it is, and stores where it really lies.
-bool open_given(const std::string &name, std::string &root, captured &found) {
-  std::error_code error;
-  root = std::filesystem::canonical(name, error);
-  if (error) return complain_about(name, error.value());
-  const own_directory top = own_directory::open(root);
-  if (!top.is_open() || !look_into(top, found)) return false;
-  if (found.is_capture) {
-    complain<"tarvellab: this is %s at %s\n">(foreign_text{found.host}, foreign_text{found.time});
-  }
-  return true;
+// Says whose capture this is, if it is one.
+void announce(const captured &found) {
+  const auto said = [](std::string_view value) { return foreign_text{value.empty() ? "unknown" : value}; };
+  if (!found.is_capture) return;
+  complain<"tarvellab: this is %s at %s\n">(said(found.note.host), said(found.note.time));
 }
 
 }  // namespace
@@ -237,21 +233,24 @@ int run(const options &asked) {
   hold_file_size_signal();
   signal(SIGCHLD, SIG_DFL);  // a caller that ignores it would take the command's status with it
 
-  std::string root;
-  captured found;
+  std::optional<captured> found;
   if (!asked.directory.empty()) {
-    if (!open_given(asked.directory, root, found)) return EXIT_FAILURE;
-    if (found.later.empty()) return end_like(run_command(asked.command, root, signals, before));
+    found = look_into(asked.directory);
+    if (!found) return EXIT_FAILURE;
+    announce(*found);
+    if (found->moments.size() == 1) {
+      return end_like(run_command(asked.command, found->moments[0].root, signals, before));
+    }
   }
   int status;
   {
     const temporary_directory directory;
     if (!directory.opened().is_open()) return EXIT_FAILURE;
     mover kernel;
-    const bool started = root.empty() ? start_simulation(asked, directory, kernel)
-                                      : start_replay(root, found.later, directory, kernel);
+    const bool started =
+        found ? start_replay(found->moments, directory, kernel) : start_simulation(asked, directory, kernel);
     if (!started) return EXIT_FAILURE;
-    root = root.empty() ? directory.opened().path() : directory.opened().path_of(shown);
+    const std::string root = found ? directory.opened().path_of(shown) : directory.opened().path();
     const int early = early_signal(signals);
     status = early ? W_EXITCODE(0, early) : run_command(asked.command, root, signals, before);
   }

@@ -9,7 +9,7 @@
 #include <string>
 #include <type_traits>
 
-#include "lab/own_directory.h"
+#include "common/own_directory.h"
 
 namespace lab {
 

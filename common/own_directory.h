@@ -1,20 +1,23 @@
 // Directories that are the caller's alone.
 //
-// Whoever may write to a directory can put a link, a pipe or a file of their own where the lab is about to
-// read or write. So from the directory that a command names down, everything is reached through directories
-// that are held open, one name at a time: no link is followed, and a directory that belongs to someone else,
-// or that others may write to, is refused. How the named one is reached is its caller's choice.
+// Whoever may write to a directory can put a link, a pipe or a file of their own where a program is about
+// to read or write. So from the directory that a command names down, everything is reached through
+// directories that are held open, one name at a time: no link is followed, and a directory that belongs to
+// someone else, or that others may write to, is refused. How the named one is reached is its caller's choice.
 
-#ifndef TARVELCTL_LAB_OWN_DIRECTORY_H
-#define TARVELCTL_LAB_OWN_DIRECTORY_H
+#ifndef TARVELCTL_COMMON_OWN_DIRECTORY_H
+#define TARVELCTL_COMMON_OWN_DIRECTORY_H
 
 #include <functional>
 #include <string>
 #include <utility>
 
-namespace lab {
+// The program that messages name; its main() says so before anything else. Not tarvelctl, which has messages
+// of its own.
+extern const char *program_name;
 
-// Says on standard error what failed about `path`. Returns false.
+// Says on standard error what is wrong with `path`: "PROGRAM: PATH: REASON". Returns false.
+bool complain_about(const std::string &path, const char *reason);
 bool complain_about(const std::string &path, int error);
 
 // An open directory, or none: what fails says so on standard error, and nothing more comes of none.
@@ -59,7 +62,5 @@ class own_directory {
   std::string path_;
   int fd_ = -1;
 };
-
-}  // namespace lab
 
 #endif

@@ -1,4 +1,4 @@
-#include "lab/own_directory.h"
+#include "common/own_directory.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -12,8 +12,6 @@
 
 #include "common/text/output.h"
 #include "common/text/text.h"
-
-namespace lab {
 
 namespace {
 
@@ -58,16 +56,22 @@ void remove_in(int directory, const std::string &name) {
 
 }  // namespace
 
-bool complain_about(const std::string &path, int error) {
-  complain<"tarvellab: %s: %s\n">(foreign_text{path}, strerror(error));
+const char *program_name = "?";
+
+bool complain_about(const std::string &path, const char *reason) {
+  complain<"%s: %s: %s\n">(program_name, foreign_text{path}, reason);
   return false;
+}
+
+bool complain_about(const std::string &path, int error) {
+  return complain_about(path, strerror(error));
 }
 
 own_directory::own_directory(std::string path, int fd) : path_(std::move(path)), fd_(fd) {
   if (fd_ < 0) {
     complain_about(path_, errno);
   } else if (const char *weakness = weakness_of(fd_)) {
-    complain<"tarvellab: %s: %s\n">(foreign_text{path_}, weakness);
+    complain_about(path_, weakness);
     close(std::exchange(fd_, -1));
   }
 }
@@ -112,5 +116,3 @@ bool own_directory::rename(const std::string &from, const std::string &to) const
 void own_directory::remove(const std::string &name) const {
   remove_in(fd_, name);
 }
-
-}  // namespace lab
