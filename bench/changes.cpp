@@ -43,7 +43,10 @@ int main(int argc, char **argv) {
   kept.follow(later, [&](const changed_record &each) { ++fates[static_cast<std::size_t>(each.became)]; });
   const double end = cpu_seconds();
   std::size_t size = 0;
-  for (const table_reading &each : later.tables) size += each.content.size();
+  for (const table_reading &each : later.tables) {
+    if (each.error) return std::fprintf(stderr, "%s: no such table\n", each.what->node), 1;
+    size += each.content.size();
+  }
   std::printf("%.6f %.6f %zu %zu", end - start, end - read, size, kept.size());
   for (const unsigned long count : fates) std::printf(" %lu", count);
   std::printf("\n");

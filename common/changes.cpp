@@ -72,10 +72,10 @@ class table_comparison {
   }
 
   // False, and no difference, where a counter has restarted.
-  bool subtract(std::size_t kind, record_bytes before, record_bytes now) {
+  bool subtract(std::size_t kind, kept_counters before, kept_counters now) {
     for (counter_change &each : each_[kind].counters) {
-      const std::optional<std::uint64_t> from = take_counter(each, before);
-      const std::optional<std::uint64_t> to = take_counter(each, now);
+      const std::optional<std::uint64_t> from = before.take(each);
+      const std::optional<std::uint64_t> to = now.take(each);
       if (!from || !to) continue;
       each.difference = *to - *from;
       if (*each.difference < most_progress) continue;

@@ -1,5 +1,6 @@
 #include "common/kept_records.h"
 
+#include <bit>
 #include <cstring>
 
 #include "common/tables/key_index.h"
@@ -18,7 +19,7 @@ struct kept_head {
 constexpr std::size_t kind_offset = offsetof(kept_head, kind);
 static_assert(sizeof(kept_head) == kind_offset + 1);
 
-constexpr unsigned seven_bits = 7, ten_bytes = 10;  // of a number, and for one of 64 bits
+constexpr std::size_t most_bytes = sizeof(std::uint64_t);  // of a number
 
 // A slot has a position, from 1, below a part of the hash.
 constexpr unsigned position_bits = 40;
@@ -42,22 +43,13 @@ std::byte *put_bytes(const std::byte *from, std::size_t size, std::byte *to) {
   return to + size;
 }
 
-// In as few bytes as it needs, because most counters are small.
+// A number is kept as how many bytes it needs, because most counters are small, and as those. Eight are
+// copied each time, which needs no branch: they may belong to what comes behind.
 std::byte *put_number(std::uint64_t number, std::byte *to) {
-  for (; number >> seven_bits; number >>= seven_bits) *to++ = static_cast<std::byte>(number | 0x80);
-  *to++ = static_cast<std::byte>(number);
-  return to;
-}
-
-std::uint64_t take_number(record_bytes &from) {
-  std::uint64_t number = 0;
-  std::size_t at = 0;
-  for (bool is_last = false; !is_last; ++at) {
-    number |= (static_cast<std::uint64_t>(from[at]) & 0x7f) << (seven_bits * at);
-    is_last = (from[at] & std::byte{0x80}) == std::byte{};
-  }
-  from = from.subspan(at);
-  return number;
+  const auto size = static_cast<std::size_t>(std::bit_width(number) + 7) / 8;
+  *to = static_cast<std::byte>(size);
+  put(number, to + 1);
+  return to + 1 + size;
 }
 
 // What follows the kind in a key. Above a record there may be several that nothing tells apart, so it is
@@ -90,7 +82,7 @@ std::size_t room_for(const record_kinds &kinds) {
   for (std::size_t kind = 0; kind < kinds.size(); ++kind) {
     std::size_t room = sizeof(kept_head) + sizeof(std::uint64_t) + sizeof(std::uint16_t);
     for (const row *field : kinds[kind].keys) room += 1U + field->size;
-    most = std::max(most, room + kinds[kind].counters.size() * (1 + ten_bytes));
+    most = std::max(most, room + kinds[kind].counters.size() * (2 + most_bytes) + most_bytes);
   }
   return most;
 }
@@ -102,13 +94,12 @@ std::uint64_t high_product(std::uint64_t a, std::uint64_t b) {
 
 }  // namespace
 
-std::optional<std::uint64_t> take_counter(const counter_at &counter, record_bytes &counters) {
-  if (counter.field->depends()) {
-    const bool held = counters[0] != std::byte{};
-    counters = counters.subspan(1);
-    if (!held) return {};
-  }
-  return take_number(counters);
+std::uint64_t kept_counters::take_number() {
+  const auto size = static_cast<std::size_t>(*at_);
+  std::uint64_t number;
+  std::memcpy(&number, at_ + 1, sizeof number);
+  at_ += 1 + size;
+  return size ? number & UINT64_MAX >> 8 * (most_bytes - size) : 0;
 }
 
 std::size_t put_back(const record_kind &kind, const kept_record &kept, std::span<std::byte> record) {
@@ -126,9 +117,9 @@ std::size_t put_back(const record_kind &kind, const kept_record &kept, std::span
     key.take(size, value);
     std::ranges::copy(value, record.begin() + field->offset);
   }
-  record_bytes counters = kept.counters;
+  kept_counters counters = kept.counters;
   for (const counter_at &each : kind.counters) {
-    const std::uint64_t value = take_counter(each, counters).value_or(0);
+    const std::uint64_t value = counters.take(each).value_or(0);
     std::memcpy(record.data() + each.field->at(each.element).offset, &value, each.field->size);
   }
   return place;
@@ -153,7 +144,7 @@ bool kept_records::keep(const record_kinds &kinds, record_bytes table) {
     end_ += static_cast<std::size_t>(end - start);
     hashes.push_back(last[kind] = keyed_hash({key, key_end}));
   });
-  resize(end_);
+  resize(end_ + most_bytes);
   index(hashes);
   return is_whole;
 }
@@ -197,7 +188,7 @@ kept_record kept_records::at(std::size_t position) const {
           .is_ambiguous = (head.marks & ambiguous) != std::byte{},
           .is_marked = (head.marks & seen) != std::byte{},
           .key = record.subspan(kind_offset, head.key_size),
-          .counters = record.subspan(kind_offset + head.key_size)};
+          .counters = kept_counters(record.data() + kind_offset + head.key_size)};
 }
 
 std::byte &kept_records::marks_of(std::size_t position) {

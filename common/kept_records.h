@@ -14,6 +14,23 @@
 #include "common/record_kinds.h"
 #include "common/text/memory.h"
 
+// The counters of a kept record, in the order of its kind.
+class kept_counters {
+ public:
+  explicit kept_counters(const std::byte *first) : at_(first) {}
+
+  // The next one, which is this one; none where it did not hold.
+  std::optional<std::uint64_t> take(const counter_at &counter) {
+    if (counter.field->depends() && *at_++ == std::byte{}) return {};
+    return take_number();
+  }
+
+ private:
+  std::uint64_t take_number();
+
+  const std::byte *at_;
+};
+
 // A record as it is kept.
 struct kept_record {
   std::size_t position;
@@ -21,12 +38,9 @@ struct kept_record {
   std::size_t kind;   // among the kinds of its table
   bool is_ambiguous;  // others have the same key
   bool is_marked;
-  record_bytes key;       // equal for records that are the same
-  record_bytes counters;  // for take_counter
+  record_bytes key;  // equal for records that are the same
+  kept_counters counters;
 };
-
-// The next of a kept record's counters, which are in the order of its kind; none where it did not hold.
-std::optional<std::uint64_t> take_counter(const counter_at &counter, record_bytes &counters);
 
 // Makes a record of this kind from what is kept of it: all else is zero. Returns its place, 0 for one that
 // lies in no field.
@@ -51,7 +65,7 @@ class kept_records {
   void mark(std::size_t position) { marks_of(position) |= seen; }
 
   // Bytes of memory.
-  std::size_t size() const { return end_ + slots_.size() * sizeof slots_[0]; }
+  std::size_t size() const { return room_ + slots_.size() * sizeof slots_[0]; }
 
  private:
   static constexpr std::byte seen{1}, ambiguous{2};  // marks
