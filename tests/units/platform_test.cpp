@@ -4,8 +4,6 @@
 #include <sys/resource.h>
 #include <sys/stat.h>
 
-#include <filesystem>
-
 #include "common/channel_snapshot.h"
 #include "common/text/output_helpers.h"
 #include "platform/sysctl.h"
@@ -22,8 +20,6 @@ extern "C" int __wrap_open(const char *path, int flags) {
 
 namespace {
 
-namespace fs = std::filesystem;
-
 constexpr std::size_t no_buffer = SIZE_MAX;
 
 // The answer: an error's name, a size, or what a buffer holds, behind which nothing may change.
@@ -36,27 +32,6 @@ std::string ask(const std::string &name, std::size_t size = no_buffer) {
   if (result) return strerrorname_np(errno);
   return is_read ? data.substr(0, length) : std::to_string(length);
 }
-
-std::ptrdiff_t count_descriptors() {
-  ask("none");  // which closes a switch
-  return std::distance(fs::directory_iterator("/proc/self/fd"), {});
-}
-
-class kernel_files : public testing::Test {
- protected:
-  kernel_files() { setenv("TARVEL_ROOT", mkdtemp(root.data()), 1); }
-  ~kernel_files() override {
-    EXPECT_EQ(count_descriptors(), before);
-    unsetenv("TARVEL_ROOT");
-    fs::remove_all(root);
-  }
-  void put(const std::string &path, const std::string &text) const {
-    fs::create_directories(fs::path(root + "/proc/" + path).parent_path());
-    std::ofstream(root + "/proc/" + path) << text;
-  }
-  const std::ptrdiff_t before = count_descriptors();
-  std::string root = "/tmp/tarvelctl-test-XXXXXX";
-};
 
 TEST_F(kernel_files, VariableIsDeliveredWhereItFits) {
   for (const std::string &text : {"ten bytes."s, std::string(100'000, 'x'), ""s}) {

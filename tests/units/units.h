@@ -11,12 +11,14 @@
 #include <cerrno>
 #include <climits>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <random>
 #include <sstream>
 #include <string>
 
 #include "common/text/output.h"
+#include "platform/sysctl.h"
 
 using namespace std::string_literals;
 
@@ -37,6 +39,30 @@ struct capture {
 
   output &from;
   const int fd = memfd_create("capture", MFD_CLOEXEC);
+};
+
+namespace fs = std::filesystem;
+
+inline std::ptrdiff_t count_descriptors() {
+  sysctlbyname("none", nullptr, nullptr, nullptr, 0);  // which closes a switch
+  return std::distance(fs::directory_iterator("/proc/self/fd"), {});
+}
+
+// A directory that stands for a machine.
+class kernel_files : public testing::Test {
+ protected:
+  kernel_files() { setenv("TARVEL_ROOT", mkdtemp(root.data()), 1); }
+  ~kernel_files() override {
+    EXPECT_EQ(count_descriptors(), before);
+    unsetenv("TARVEL_ROOT");
+    fs::remove_all(root);
+  }
+  void put(const std::string &path, const std::string &text) const {
+    fs::create_directories(fs::path(root + "/proc/" + path).parent_path());
+    std::ofstream(root + "/proc/" + path) << text;
+  }
+  const std::ptrdiff_t before = count_descriptors();
+  std::string root = "/tmp/tarvelctl-test-XXXXXX";
 };
 
 // Whether the product finds anything below /proc.
