@@ -182,8 +182,7 @@ kept_record kept_records::at(std::size_t position) const {
   kept_head head;
   std::memcpy(&head, bytes_.get() + position, sizeof head);
   const record_bytes record(bytes_.get() + position, head.size);
-  return {.position = position,
-          .next = position + head.size,
+  return {.next = position + head.size,
           .kind = head.kind,
           .is_ambiguous = (head.marks & ambiguous) != std::byte{},
           .is_marked = (head.marks & seen) != std::byte{},

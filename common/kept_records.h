@@ -33,7 +33,6 @@ class kept_counters {
 
 // A record as it is kept.
 struct kept_record {
-  std::size_t position;
   std::size_t next;   // the position behind it
   std::size_t kind;   // among the kinds of its table
   bool is_ambiguous;  // others have the same key
