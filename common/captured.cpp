@@ -71,7 +71,7 @@ bool find_moments(const own_directory &top, captured &found) {
     if (is_moment) found.moments.push_back({*offset, moments.path_of(name)});
     return true;
   });
-  std::ranges::sort(found.moments);
+  std::ranges::sort(found.moments, {}, &captured_moment::offset);
   return listed;
 }
 

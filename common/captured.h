@@ -26,8 +26,6 @@ inline constexpr char moments_name[] = "moments";
 struct captured_moment {
   std::int64_t offset;  // milliseconds after the first moment
   std::string root;     // the directory that stands for the machine
-
-  friend auto operator<=>(const captured_moment &, const captured_moment &) = default;
 };
 
 // What a directory has of a capture; of a kernel that is none, one moment and no more to say.
