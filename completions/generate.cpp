@@ -1,6 +1,7 @@
-// Writes a completion script: its body, with the program's own tables in place of the line "# TABLES".
+// Writes a completion script: its body, with the programs' own tables in place of the line "# TABLES".
 //
-// usage: generate_completions bash|zsh|fish BODY, or, for tests, generate_completions words
+// usage: generate_completions bash|zsh|fish tarvelctl|tarvellab BODY, or, for tests, generate_completions
+// words
 
 #include <cstdio>
 #include <fstream>
@@ -9,23 +10,12 @@
 #include <vector>
 
 #include "common/tables/values.h"
+#include "completions/live_lists.h"
+#include "lab/command_line.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 
 namespace {
-
-#define UUID_PATTERN "[0-9A-F]{8}(-[0-9A-F]{4}){3}-[0-9A-F]{12}"
-
-// UUIDs of the kernel in sight, by the report that tells them and the sed command that finds them there.
-// Reports hold texts of strangers: nothing but a UUID gets through.
-constexpr struct {
-  const char *name;
-  const char *report;
-  const char *filter;
-} live_lists[] = {
-    {"objects", "tree", "/\"0{8}-0{4}-0{4}-0{4}-0{12}\"/!s/^ *\"uuid\":\"(" UUID_PATTERN ")\".*$/\\1/p"},
-    {"nexuses", "provider", "s/^[[:blank:]]instance (" UUID_PATTERN ")$/\\1/p"},
-};
 
 template <class Words>
 std::string names_of(const Words &words) {
@@ -41,7 +31,7 @@ const struct {
   std::string_view option;
   std::string values;
 } known_values[] = {
-    {cmd_netns, "ip", "global"},
+    {cmd_netns, "ip", "@addresses"},
     {cmd_netns, "proto", names_of(ip_protocols.rows)},
     {cmd_netstat, "per-protocol", names_of(netstat_protocols)},
     {cmd_netstat, "uuid", "@nexuses"},
@@ -60,6 +50,7 @@ struct completed_option {
   std::string name;    // or empty
   bool takes_value;
   std::string values;
+  std::string_view meaning = {};  // or empty
 
   std::vector<std::string> spellings() const {
     std::vector<std::string> all;
@@ -67,6 +58,19 @@ struct completed_option {
     if (!name.empty()) all.push_back(std::string("--").append(name));
     return all;
   }
+};
+
+struct completed_command {
+  std::string name;
+  std::string_view purpose;  // or empty
+  std::string values;        // of its argument
+  std::vector<completed_option> options;
+};
+
+struct completed_program {
+  const char *name;
+  bool joins_values;  // "--option=value" is one, too
+  std::vector<completed_command> commands;
 };
 
 // The long options of a command, each with its letter if the handler takes it, then the other letters.
@@ -84,44 +88,48 @@ std::vector<completed_option> options_of(const command_entry &row) {
   return all;
 }
 
-template <class Action>
-void for_each_command(Action action) {
-  for (const command_entry *row = command_table; row->name; ++row) action(*row);
-}
-
-// The functions that print the live lists, in what the three shells have in common.
-void print_live_lists(const char *head, const char *tail) {
-  for (const auto &list : live_lists) {
-    std::printf(head, list.name);
-    std::printf(
-        "  command timeout 1 tarvelctl %s </dev/null 2>/dev/null |\n"
-        "    command env LC_ALL=C sed -nE '%s' | command sort -u\n%s\n",
-        list.report, list.filter, tail);
+completed_program tarvelctl() {
+  completed_program program{"tarvelctl", true, {}};
+  for (const command_entry *row = command_table; row->name; ++row) {
+    program.commands.push_back({row->name, "", values_of(row->handler, ""), options_of(*row)});
   }
+  return program;
 }
 
-void print_bash() {
-  std::printf("declare -gA _tarvelctl_options=(\n");
-  for_each_command([](const command_entry &row) {
-    std::printf("  [%s]='", row.name);
-    for (const completed_option &each : options_of(row)) {
+completed_program tarvellab() {
+  completed_program program{"tarvellab", false, {}};
+  for (const lab::command &row : lab::commands) {
+    std::vector<completed_option> options;
+    for (const lab::option_row &each : lab::known_options) {
+      if (!(each.in & row.bit)) continue;
+      const std::string name(each.name.substr(2));
+      options.push_back({"", name, !each.argument.empty(), "", each.meaning});
+    }
+    options.push_back({"", "help", false, "", "what there is to know"});
+    program.commands.push_back({std::string(row.name), row.purpose, "", std::move(options)});
+  }
+  return program;
+}
+
+void print_bash(const completed_program &program) {
+  std::printf("declare -gA _%s_options=(\n", program.name);
+  for (const completed_command &row : program.commands) {
+    std::printf("  [%s]='", row.name.c_str());
+    for (const completed_option &each : row.options) {
       for (const std::string &word : each.spellings()) std::printf("%s ", word.c_str());
     }
-    std::printf("-f -w'\n");
-  });
-  std::printf(")\ndeclare -gA _tarvelctl_values=(\n");
-  for_each_command([](const command_entry &row) {
-    if (const std::string values = values_of(row.handler, ""); !values.empty()) {
-      std::printf("  [%s]='%s'\n", row.name, values.c_str());
-    }
-    for (const completed_option &each : options_of(row)) {
+    std::printf("'\n");
+  }
+  std::printf(")\ndeclare -gA _%s_values=(\n", program.name);
+  for (const completed_command &row : program.commands) {
+    if (!row.values.empty()) std::printf("  [%s]='%s'\n", row.name.c_str(), row.values.c_str());
+    for (const completed_option &each : row.options) {
       if (!each.takes_value) continue;
       for (const std::string &word : each.spellings())
-        std::printf("  ['%s %s']='%s'\n", row.name, word.c_str(), each.values.c_str());
+        std::printf("  ['%s %s']='%s'\n", row.name.c_str(), word.c_str(), each.values.c_str());
     }
-  });
+  }
   std::printf(")\n");
-  print_live_lists("_tarvelctl_%s() {\n", "}");
 }
 
 // A message and an action as _arguments wants them behind an option or an argument.
@@ -133,65 +141,76 @@ std::string zsh_action(std::string_view message, std::string_view values) {
   return action.append("(").append(values).append(")");
 }
 
-void print_zsh() {
-  std::printf("local -A specs=(\n");
-  for_each_command([](const command_entry &row) {
-    std::printf("  %s \"", row.name);
-    for (const completed_option &each : options_of(row)) {
-      for (const std::string &word : each.spellings()) {
-        if (!each.takes_value) std::printf(" %s", word.c_str());
-        if (each.takes_value)
-          std::printf(" '*%s%s%s'", word.c_str(), word.size() > 2 ? "=" : "+",
-                      zsh_action(each.name, each.values).c_str());
-      }
-    }
-    if (const std::string values = values_of(row.handler, ""); !values.empty()) {
-      std::printf(" '1%s'", zsh_action("argument", values).c_str());
-    }
-    std::printf("\"\n");
-  });
-  std::printf(")\n");
-  print_live_lists("_tarvelctl_%s() {\n", "}");
+// An option in one of its spellings, as _arguments wants it.
+std::string zsh_option(const completed_option &each, std::string_view word, bool joins_values) {
+  std::string spec(each.takes_value ? "*" : "");
+  spec.append(word);
+  if (each.takes_value && joins_values) spec.append(word.size() > 2 ? "=" : "+");
+  if (!each.meaning.empty()) spec.append("[").append(each.meaning).append("]");
+  return each.takes_value ? spec.append(zsh_action(each.name, each.values)) : spec;
 }
 
-void print_fish() {
-  print_live_lists("function __tarvelctl_%s\n", "end");
-  for_each_command([](const command_entry &row) {
-    std::printf("complete -c tarvelctl -n __tarvelctl_wants_command -a %s\n", row.name);
-    const auto print_values = [](const std::string &values) {
+void print_zsh(const completed_program &program) {
+  std::printf("local -A specs=(\n");
+  for (const completed_command &row : program.commands) {
+    std::printf("  %s \"", row.name.c_str());
+    for (const completed_option &each : row.options) {
+      for (const std::string &word : each.spellings())
+        std::printf(" '%s'", zsh_option(each, word, program.joins_values).c_str());
+    }
+    if (!row.values.empty()) std::printf(" '1%s'", zsh_action("argument", row.values).c_str());
+    std::printf("\"\n");
+  }
+  std::printf(")\n");
+}
+
+void print_fish(const completed_program &program) {
+  for (const completed_command &row : program.commands) {
+    const auto print_head = [&](const char *when) {
+      std::printf("complete -c %s -n '__%s_%s'", program.name, program.name, when);
+    };
+    const auto print_tail = [](const std::string &values, std::string_view meaning) {
       if (values.starts_with('@')) std::printf(" -a '(__tarvelctl_%s)'", values.c_str() + 1);
       if (!values.empty() && !values.starts_with('@')) std::printf(" -a '%s'", values.c_str());
-    };
-    if (const std::string values = values_of(row.handler, ""); !values.empty()) {
-      std::printf("complete -c tarvelctl -n '__tarvelctl_runs %s'", row.name);
-      print_values(values);
+      if (!meaning.empty()) std::printf(" -d '%s'", std::string(meaning).c_str());
       std::printf("\n");
+    };
+    const std::string runs = "runs " + row.name;
+    print_head("wants_command");
+    print_tail(row.name, row.purpose);
+    if (!row.values.empty()) {
+      print_head(runs.c_str());
+      print_tail(row.values, "");
     }
-    for (const completed_option &each : options_of(row)) {
-      std::printf("complete -c tarvelctl -n '__tarvelctl_runs %s'", row.name);
+    for (const completed_option &each : row.options) {
+      print_head(runs.c_str());
       if (!each.letter.empty()) std::printf(" -s %s", each.letter.c_str());
       if (!each.name.empty()) std::printf(" -l %s", each.name.c_str());
       if (each.takes_value) std::printf(" -x");
-      print_values(each.values);
-      std::printf("\n");
+      print_tail(each.values, each.meaning);
     }
-  });
+  }
 }
 
 // A line for each command, and one for each of its options in each spelling.
-void print_words() {
-  for_each_command([](const command_entry &row) {
-    std::printf("%s\n", row.name);
-    for (const completed_option &each : options_of(row)) {
-      for (const std::string &word : each.spellings()) std::printf("%s %s\n", row.name, word.c_str());
+void print_words(const completed_program &program) {
+  for (const completed_command &row : program.commands) {
+    std::printf("%s\n", row.name.c_str());
+    for (const completed_option &each : row.options) {
+      for (const std::string &word : each.spellings()) std::printf("%s %s\n", row.name.c_str(), word.c_str());
     }
-  });
+  }
 }
 
 constexpr struct {
   std::string_view name;
-  void (*print)();
-} forms[] = {{"bash", print_bash}, {"zsh", print_zsh}, {"fish", print_fish}, {"words", print_words}};
+  void (*print)(const completed_program &);
+  const char *head = nullptr;  // of a function in the shell, and its end
+  const char *tail = nullptr;
+} forms[] = {{"bash", print_bash, "_tarvelctl_%s() {\n", "}"},
+             {"zsh", print_zsh, "_tarvelctl_%s() {\n", "}"},
+             {"fish", print_fish, "function __tarvelctl_%s\n", "end"},
+             {"words", print_words}};
 
 // Says on standard error what is wrong. Returns false.
 bool complain(const char *about, const char *what) {
@@ -200,7 +219,8 @@ bool complain(const char *about, const char *what) {
 }
 
 // Copies the body to standard output. False, after a message, where it has no place for the tables.
-bool print_script(const char *body, void (*print_tables)()) {
+template <class Print>
+bool print_script(const char *body, Print print_tables) {
   bool placed = false;
   std::ifstream in(body);
   for (std::string line; std::getline(in, line);) {
@@ -218,12 +238,18 @@ bool print_script(const char *body, void (*print_tables)()) {
 
 int main(int argc, char **argv) {
   for (const auto &form : forms) {
-    if (argc < 2 || form.name != argv[1]) continue;
-    if (argc == 2) form.print();
-    const bool made = argc == 2 || print_script(argv[2], form.print);
+    if (argc != (form.head ? 4 : 2) || form.name != argv[1]) continue;
+    const bool is_lab = form.head && argv[2] == std::string_view("tarvellab");
+    const completed_program program = is_lab ? tarvellab() : tarvelctl();
+    if (!form.head) form.print(program);
+    const bool made = !form.head || print_script(argv[3], [&] {
+      if (!is_lab) print_live_lists(form.head, form.tail);
+      form.print(program);
+    });
     const bool written = std::fflush(stdout) == 0 && !std::ferror(stdout);
     return (written || complain("standard output", "write error")) && made ? 0 : 1;
   }
-  std::fprintf(stderr, "usage: generate_completions bash|zsh|fish|words [BODY]\n");
+  std::fprintf(stderr,
+               "usage: generate_completions bash|zsh|fish PROGRAM BODY, or generate_completions words\n");
   return 64;
 }

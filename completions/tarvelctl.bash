@@ -49,15 +49,18 @@ _tarvelctl() {
   if [[ ${_tarvelctl_values["$command $previous"]+known} ]]; then
     values=${_tarvelctl_values["$command $previous"]}
   elif [[ $current == -* ]]; then
-    values=${_tarvelctl_options[$command]}
+    values="${_tarvelctl_options[$command]}-f -w"
   else
     values=${_tarvelctl_values[$command]}
   fi
   if [[ $values == @* ]]; then
-    current=${current^^}
-    values=$("_tarvelctl_${values#@}")
+    [[ $values == @addresses ]] || current=${current^^}
+    mapfile -t words < <("_tarvelctl_${values#@}")
+    values=${words[*]%%$'\t'*}
   fi
   mapfile -t COMPREPLY < <(compgen -W "$values" -- "$current")
+  # Of an address, Bash replaces what stands behind the last ":".
+  [[ $COMP_WORDBREAKS != *:* ]] || COMPREPLY=("${COMPREPLY[@]#"${current%"${current##*:}"}"}")
 }
 
 complete -o default -F _tarvelctl tarvelctl

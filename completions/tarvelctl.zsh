@@ -3,11 +3,12 @@
 
 # TABLES
 
-# Offers the live list that the last argument names, in upper case as it is printed.
+# Offers the live list that the last argument names, in upper case as it is printed, and says what each is.
 _tarvelctl_offer() {
-  local -a uuids=(${(f)"$(_tarvelctl_$argv[-1])"})
+  local -a lines=(${(f)"$(_tarvelctl_$argv[-1])"})
+  local -a names=(${lines%%$'\t'*}) shown=(${lines/$'\t'/  })
   shift -p
-  compadd -M 'm:{a-f}={A-F}' "$@" -a uuids
+  compadd -M 'm:{a-f}={A-F}' -l -d shown "$@" -a names
 }
 
 local curcontext=$curcontext state line

@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <optional>
 #include <unordered_set>
 #include <utility>
 #include <vector>
@@ -18,6 +19,7 @@
 #include "lab/capture_directory.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
+#include "lab/progress.h"
 #include "lab/redacted_tables.h"
 #include "lab/root_directory.h"
 #include "lab/tables.h"
@@ -132,6 +134,17 @@ bool save(const snapshot &taken, own_directory top, substitutes *by, tally &save
   return true;
 }
 
+// Waits for a moment that is due, and says so meanwhile. True where a signal in `stop` arrives.
+bool stopped_before_moment(std::uint32_t number, std::uint32_t count, std::int64_t due,
+                           const sigset_t &stop) {
+  for (;;) {
+    const std::int64_t now = monotonic_milliseconds();
+    progress::tell<"moment %u of %u in %lld s">(number, count, (due - now + 999) / 1000);
+    if (stopped_before(std::min(due, now + 1000), stop)) return true;
+    if (due <= now + 1000) return false;
+  }
+}
+
 // Takes the moments behind the first, which was taken at `began`, each at its time on the clock, so that none
 // drifts. Those that the machine is too slow for come later, in time with the rest.
 void capture_later_moments(const options &asked, const own_directory &top, std::int64_t began,
@@ -140,7 +153,7 @@ void capture_later_moments(const options &asked, const own_directory &top, std::
   for (std::uint32_t taken = 1; taken < asked.count; ++taken) {
     const std::int64_t late = std::max<std::int64_t>(monotonic_milliseconds() - due, 0);
     due += (1 + late / asked.every) * asked.every;
-    if (stopped_before(due, stop)) return;
+    if (stopped_before_moment(taken + 1, asked.count, due, stop)) return;
     const std::int64_t offset = monotonic_milliseconds() - began;
     const snapshot next = fetch(saved);
     if (next.tables.empty()) continue;
@@ -164,6 +177,7 @@ int capture(const options &asked) {
   substitutes *const by = asked.redact ? &redaction : nullptr;
   own_directory top;
   bool goes_on = false;
+  std::optional<progress> shown(std::in_place);
   {
     const snapshot first = fetch(saved);
     if (first.tables.empty()) return EXIT_FAILURE;
@@ -177,6 +191,7 @@ int capture(const options &asked) {
         foreign_text{asked.directory});
   }
   if (goes_on) capture_later_moments(asked, top, began, by, stop, saved);
+  shown.reset();
   const std::uint32_t moments = std::max(asked.count, 1U);
   const std::uint64_t expected = saved.moments * tables.size();
   print<"saved in %s: moments %u of %u, tables %u of %llu, names %u, bytes %llu\n">(

@@ -1,158 +1,180 @@
 #include "lab/command_line.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
-#include <string_view>
+#include <cstdlib>
+#include <utility>
 
 #include "common/text/output.h"
+#include "common/text/text.h"
 
 namespace lab {
 
 namespace {
 
 constexpr std::uint32_t most_records = 10'000'000;
+constexpr char records[] = "0 to 10000000";
 
-struct number_option {
-  std::string_view name;
-  std::uint32_t sizes::*size;  // or null: the interval
-  std::uint32_t least;
-  std::uint32_t most;
-  const char *meaning;
-};
-
-constexpr number_option number_options[] = {
-    {"--providers", &sizes::providers, 0, most_records, "nexus providers (9)"},
-    {"--nexuses", &sizes::nexuses, 0, most_records, "nexus instances (about 3 for 2 providers)"},
-    {"--channels", &sizes::channels, 0, most_records, "channels (28)"},
-    {"--rings", &sizes::rings, 0, 1024, "rings of each channel (2)"},
-    {"--flows", &sizes::flows, 0, most_records, "flows (60)"},
-    {"--stacks", &sizes::stacks, 0, most_records, "user-space stacks (one per flow channel and switch)"},
-    {"--arenas", &sizes::arenas, 0, most_records, "memory arenas (10)"},
-    {"--namespaces", &sizes::namespaces, 0, most_records, "port namespaces (14)"},
-    {"--processes", &sizes::processes, 0, most_records, "processes (13)"},
-    {"--interval", nullptr, 10, 3'600'000, "milliseconds between two snapshots (1000)"},
-};
-
-struct command {
-  std::string_view name;
-  const char *synopsis;
-  const char *purpose;
-  int (*handler)(const options &);
-  bool needs_directory = false;
-  bool makes_world = false;  // takes sizes and a seed
-  bool moves_world = false;  // takes an interval
-  bool runs_command = false;
-  bool captures = false;  // takes the times of moments and a wish to redact
-};
-
-constexpr command commands[] = {
-    {.name = "generate",
-     .synopsis = "DIR [sizes] [--seed N]",
-     .purpose = "make one snapshot",
-     .handler = generate,
-     .needs_directory = true,
-     .makes_world = true},
-    {.name = "simulate",
-     .synopsis = "DIR [sizes] [--seed N] [--interval MS]",
-     .purpose = "make one and keep it moving until interrupted",
-     .handler = simulate,
-     .needs_directory = true,
-     .makes_world = true,
-     .moves_world = true},
-    {.name = "run",
-     .synopsis = "[DIR | [sizes] [--seed N] [--interval MS]] -- COMMAND...",
-     .purpose = "run COMMAND on DIR, or on a simulation of its own",
-     .handler = run,
-     .makes_world = true,
-     .moves_world = true,
-     .runs_command = true},
-    {.name = "capture",
-     .synopsis = "DIR [--every SECONDS --count N] [--redact]",
-     .purpose = "save the tables of the kernel in sight, once or N times",
-     .handler = capture,
-     .needs_directory = true,
-     .captures = true},
-};
-
-int usage() {
-  complain<"usage:\n">();
-  for (const command &row : commands) {
-    complain<"  tarvellab %s %s\n\t%s\n">(row.name, row.synopsis, row.purpose);
-  }
-  complain<"sizes and their defaults:\n">();
-  for (const number_option &row : number_options) complain<"  %-12s N  %s\n">(row.name, row.meaning);
-  return exit_status::usage;
+template <auto Field, std::uint64_t Most = most_records, std::uint64_t Least = 0>
+bool take_number(std::string_view value, options &asked) {
+  std::uint64_t number = 0;
+  const auto [end, error] = std::from_chars(value.data(), value.data() + value.size(), number);
+  if (error != std::errc() || end != value.data() + value.size()) return false;
+  asked.*Field = static_cast<std::remove_reference_t<decltype(asked.*Field)>>(number);
+  return number >= Least && number <= Most;
 }
 
-template <class Number>
-bool parse_number(const char *text, Number least, Number most, Number &number) {
-  const std::string_view view = text ? text : "";
-  const auto [end, error] = std::from_chars(view.data(), view.data() + view.size(), number);
-  return error == std::errc() && end == view.data() + view.size() && number >= least && number <= most;
-}
-
-// Seconds, with decimals or without, in milliseconds.
-bool parse_seconds(const char *text, std::uint32_t least, std::uint32_t most, std::uint32_t &milliseconds) {
-  const std::string_view view = text ? text : "";
+// Seconds, with decimals or without.
+bool take_every(std::string_view value, options &asked) {
   double seconds = 0;
   const auto [end, error] =
-      std::from_chars(view.data(), view.data() + view.size(), seconds, std::chars_format::fixed);
-  if (error != std::errc() || end != view.data() + view.size()) return false;
+      std::from_chars(value.data(), value.data() + value.size(), seconds, std::chars_format::fixed);
+  if (error != std::errc() || end != value.data() + value.size()) return false;
   // In this order a number that is none is refused.
-  if (!(seconds * 1000 >= least && seconds * 1000 <= most)) return false;
-  milliseconds = static_cast<std::uint32_t>(std::lround(seconds * 1000));
+  if (!(seconds * 1000 >= 10 && seconds * 1000 <= 3'600'000)) return false;
+  asked.every = static_cast<std::uint32_t>(std::lround(seconds * 1000));
   return true;
 }
 
-// Takes one option with its value. False where the command does not know it or the value is no such number.
-bool take_option(const command &row, std::string_view name, const char *value, options &asked) {
-  if (name == "--seed")
-    return row.makes_world && parse_number<std::uint64_t>(value, 0, UINT64_MAX, asked.seed);
-  if (name == "--every") return row.captures && parse_seconds(value, 10, 3'600'000, asked.every);
-  if (name == "--count") return row.captures && parse_number(value, 1U, most_records, asked.count);
-  for (const number_option &known : number_options) {
-    if (known.name != name) continue;
-    if (known.size ? !row.makes_world : !row.moves_world) return false;
-    return parse_number(value, known.least, known.most, known.size ? asked.size.*known.size : asked.interval);
-  }
+bool take_redact(std::string_view /*value*/, options &asked) {
+  return asked.redact = true;
+}
+
+constexpr command command_rows[] = {
+    {in_generate, "generate", "DIR", "make one snapshot", generate},
+    {in_simulate, "simulate", "DIR", "make one and keep it moving until interrupted", simulate},
+    {in_run, "run", "[DIR] -- COMMAND...", "run COMMAND on DIR, or on a simulation of its own", run},
+    {in_capture, "capture", "DIR", "save the tables of the kernel in sight, once or N times", capture},
+};
+
+constexpr unsigned in_worlds = in_generate | in_simulate | in_run;
+
+constexpr option_row option_rows[] = {
+    {in_worlds, "--providers", "N", records, "nexus providers (9)", take_number<&sizes::providers>},
+    {in_worlds, "--nexuses", "N", records, "nexus instances (3 for 2 providers)",
+     take_number<&sizes::nexuses>},
+    {in_worlds, "--channels", "N", records, "channels (28)", take_number<&sizes::channels>},
+    {in_worlds, "--rings", "N", "0 to 1024", "rings of each channel (2)", take_number<&sizes::rings, 1024>},
+    {in_worlds, "--flows", "N", records, "flows (60)", take_number<&sizes::flows>},
+    {in_worlds, "--stacks", "N", records, "user-space stacks (as fit the flows)",
+     take_number<&sizes::stacks>},
+    {in_worlds, "--arenas", "N", records, "memory arenas (10)", take_number<&sizes::arenas>},
+    {in_worlds, "--namespaces", "N", records, "port namespaces (14)", take_number<&sizes::namespaces>},
+    {in_worlds, "--processes", "N", records, "processes (13)", take_number<&sizes::processes>},
+    {in_worlds, "--seed", "N", "0 to 18446744073709551615", "what chance begins with (1)",
+     take_number<&options::seed, UINT64_MAX>},
+    {in_simulate | in_run, "--interval", "MS", "10 to 3600000", "milliseconds between two snapshots (1000)",
+     take_number<&options::interval, 3'600'000, 10>},
+    {in_capture, "--every", "SECONDS", "0.01 to 3600", "the time between two moments", take_every},
+    {in_capture, "--count", "N", "1 to 10000000", "how many moments",
+     take_number<&options::count, most_records, 1>},
+    {in_capture, "--redact", "", "", "put substitutes for addresses and names", take_redact},
+};
+
+// Says what is wrong with the command line. Returns false.
+bool refuse(const std::string &what) {
+  complain<"tarvellab: %s; see tarvellab --help\n">(foreign_text{what});
   return false;
 }
 
+// The options of some commands, those of the same ones below one heading.
+void print_options(unsigned of) {
+  unsigned above = 0;
+  for (const option_row &row : option_rows) {
+    if (!(row.in & of)) continue;
+    if (std::exchange(above, row.in) != row.in) {
+      print<"options of">();
+      for (const command &each : command_rows) {
+        if (each.bit & row.in) print<" %s">(each.name);
+      }
+      print<":\n">();
+    }
+    print<"  %-12s %-8s %s\n">(row.name, row.argument, row.meaning);
+  }
+}
+
+// Prints what there is to know about some commands. Returns the exit status.
+int help(unsigned of) {
+  print<"usage:\n">();
+  for (const command &row : command_rows) {
+    if (row.bit & of) print<"  tarvellab %s [OPTION...] %s\n\t%s\n">(row.name, row.arguments, row.purpose);
+  }
+  print<"  tarvellab [COMMAND] --help\n  tarvellab --version\n">();
+  print_options(of);
+  report.flush();
+  return EXIT_SUCCESS;
+}
+
+// Takes an option, with the word behind it where it wants one; `argument` is then the last word that was
+// taken.
+bool take_option(const command &of, char **&argument, options &asked) {
+  const std::string name = *argument;
+  const auto *known = std::ranges::find(option_rows, name, &option_row::name);
+  if (known == std::end(option_rows) || !(known->in & of.bit))
+    return refuse(std::string(of.name) + " has no option " + name);
+  if (!known->argument.empty()) ++argument;
+  if (*argument && known->take(*argument, asked)) return true;
+  const std::string seen = *argument ? ", not '" + std::string(*argument) + "'" : "";
+  return refuse(name + " takes " + std::string(known->values) + seen);
+}
+
+// Whether what is asked for is complete and goes together. `shape` is the last option, if there was one.
+bool is_whole(const command &row, const options &asked, const std::string &shape) {
+  const std::string name(row.name);
+  if (row.bit != in_run && asked.directory.empty()) return refuse(name + " takes a directory");
+  if ((asked.count == 0) != (asked.every == 0)) return refuse("--count and --every go together");
+  if (row.bit != in_run) return true;
+  if (!asked.command || !*asked.command) return refuse(name + " takes a command, behind --");
+  if (shape.empty() || asked.directory.empty()) return true;
+  return refuse(shape + " is for a kernel to be made, and " + asked.directory + " is there");
+}
+
+// Reads the words behind a command's name. False, after a message, where they are wrong.
 bool parse(const command &row, char **argument, options &asked) {
-  bool shaped = false;
+  std::string shape;
   for (; *argument; ++argument) {
     const std::string_view word = *argument;
-    if (word == "--" && row.runs_command) {
+    if (word == "--" && row.bit == in_run) {
       asked.command = argument + 1;
       break;
     }
-    if (word == "--redact" && row.captures) {
-      asked.redact = true;
-    } else if (word.starts_with("--")) {
-      if (!take_option(row, word, argument[1], asked)) return false;
-      shaped = true;
-      ++argument;
+    if (word.starts_with('-')) {
+      shape = word;
+      if (!take_option(row, argument, asked)) return false;
     } else if (word.empty() || !asked.directory.empty()) {
-      return false;
+      return refuse(std::string(row.name) + " takes one directory, and '" + *argument + "' cannot be it");
     } else {
       asked.directory = word;
     }
   }
-  if (row.needs_directory && asked.directory.empty()) return false;
-  if (!row.runs_command) return (asked.count == 0) == (asked.every == 0);
-  // A directory is there already: nothing is left to choose about it.
-  return asked.command && *asked.command && !(shaped && !asked.directory.empty());
+  return is_whole(row, asked, shape);
 }
 
 }  // namespace
 
+const std::span<const command> commands = command_rows;
+const std::span<const option_row> known_options = option_rows;
+
 int run_command_line(int argc, char **argv) {
-  if (argc < 2) return usage();
-  for (const command &row : commands) {
-    options asked;
-    if (row.name == argv[1]) return parse(row, argv + 2, asked) ? row.handler(asked) : usage();
+  const std::string_view word = argc > 1 ? argv[1] : "--";
+  if (word == "--help") return help(~0U);
+  if (word == "--version") {
+    print<"tarvellab %s\n">(TARVELCTL_VERSION);
+    report.flush();
+    return EXIT_SUCCESS;
   }
-  return usage();
+  const auto *row = std::ranges::find(command_rows, word, &command::name);
+  if (row == std::end(command_rows)) {
+    refuse(argc > 1 ? "there is no command '" + std::string(word) + "'" : "a command is missing");
+    return exit_status::usage;
+  }
+  // In front of what is another command's.
+  for (char **each = argv + 2; *each && *each != std::string_view("--"); ++each) {
+    if (*each == std::string_view("--help")) return help(row->bit);
+  }
+  options asked;
+  return parse(*row, argv + 2, asked) ? row->handler(asked) : exit_status::usage;
 }
 
 }  // namespace lab

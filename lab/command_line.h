@@ -4,15 +4,16 @@
 #define TARVELCTL_LAB_COMMAND_LINE_H
 
 #include <cstdint>
+#include <span>
 #include <string>
+#include <string_view>
 
 #include "lab/world.h"
 
 namespace lab {
 
 // What the user asked for.
-struct options {
-  sizes size;
+struct options : sizes {
   std::uint64_t seed = 1;
   std::uint32_t interval = 1000;  // milliseconds between two snapshots
   std::uint32_t every = 0;        // milliseconds between two captured moments; 0: there is one
@@ -31,6 +32,30 @@ int generate(const options &asked);
 int simulate(const options &asked);
 int run(const options &asked);
 int capture(const options &asked);
+
+enum command_bit : std::uint8_t { in_generate = 1, in_simulate = 2, in_run = 4, in_capture = 8 };
+
+// A command, as its help and its completions tell of it.
+struct command {
+  command_bit bit;
+  std::string_view name;
+  std::string_view arguments;
+  std::string_view purpose;
+  int (*handler)(const options &);
+};
+
+// An option, and all that follows from it.
+struct option_row {
+  unsigned in;                // the bits of the commands that take it
+  std::string_view name;      // with its dashes
+  std::string_view argument;  // what help calls the word behind it; empty: it takes none
+  std::string_view values;    // what that word may be, for messages
+  std::string_view meaning;
+  bool (*take)(std::string_view value, options &asked);  // false: it is no such value
+};
+
+extern const std::span<const command> commands;
+extern const std::span<const option_row> known_options;
 
 }  // namespace lab
 

@@ -5,6 +5,7 @@
 #include "common/tables/flow.h"
 #include "lab/flow_states.h"
 #include "lab/programs.h"
+#include "lab/progress.h"
 #include "lab/world_parts.h"
 
 namespace lab {
@@ -189,6 +190,7 @@ void open_flows(world &state) {
                 static_cast<std::uint32_t>(std::clamp<std::size_t>(per_switch / 2, 10, 4096)));
   }
   for (std::uint32_t i = 0; i < state.size.flows; ++i) {
+    if (i % 4096 == 0) progress::tell<"making flow %u of %u">(i, state.size.flows);
     const wish wanted = rare[i / 4 % std::size(rare)];
     const service *use = nullptr;
     std::uint32_t index = open[i % open.size()];

@@ -1,11 +1,13 @@
 // generate and simulate: a world in a directory.
 
 #include <cstdlib>
+#include <optional>
 
 #include "common/text/output.h"
 #include "common/text/text.h"
 #include "lab/clock.h"
 #include "lab/command_line.h"
+#include "lab/progress.h"
 #include "lab/simulation.h"
 
 namespace lab {
@@ -28,14 +30,17 @@ bool simulation::keep_moving(const sigset_t &stop) {
 
 int generate(const options &asked) {
   hold_file_size_signal();
+  const progress shown;
   return simulation(asked, own_directory::make(asked.directory)).start() ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
 int simulate(const options &asked) {
   const sigset_t stop = block_stop_signals();
   hold_file_size_signal();
+  std::optional<progress> shown(std::in_place);
   simulation kernel(asked, own_directory::make(asked.directory));
   if (!kernel.start()) return EXIT_FAILURE;
+  shown.reset();
   print<"simulating in %s\n">(foreign_text{asked.directory});
   report.flush();
   return kernel.keep_moving(stop) ? EXIT_SUCCESS : EXIT_FAILURE;

@@ -13,7 +13,7 @@ namespace lab {
 class simulation {
  public:
   simulation(const options &asked, own_directory directory)
-      : root_(std::move(directory)), state_(make_world(asked.size, asked.seed)), interval_(asked.interval) {}
+      : root_(std::move(directory)), state_(make_world(asked, asked.seed)), interval_(asked.interval) {}
 
   // Publishes the world, in place of any other that the directory shows. Like all here, returns false after a
   // message on standard error.

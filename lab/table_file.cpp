@@ -7,6 +7,8 @@
 #include <cstdint>
 #include <utility>
 
+#include "lab/progress.h"
+
 namespace lab {
 
 namespace {
@@ -40,7 +42,9 @@ table_file::~table_file() {
 void table_file::put(std::span<const std::byte> bytes) {
   size_ += bytes.size();
   buffer_.append(reinterpret_cast<const char *>(bytes.data()), bytes.size());
-  if (buffer_.size() >= flush_size) flush();
+  if (buffer_.size() < flush_size) return;
+  progress::tell<"writing %s: %llu MB">(name_, std::uint64_t{size_ >> 20});
+  flush();
 }
 
 void table_file::flush() {

@@ -1,6 +1,7 @@
 """Tests of the completions, typed into those shells that are here."""
 import os
 import pty
+import re
 import select
 import shlex
 import shutil
@@ -33,6 +34,8 @@ cases = [
     ("netns -p ", ["tcp", "udp"]),
     ("netns --proto=t", ["--proto=tcp"]),
     ("netns -i g", ["global"]),
+    ("netns --ip fe80::", ["fe80::1"]),
+    ("netns -i ", ["global", "10.0.0.9", "fe80::1"]),
     ("netstat -asp ", ["ip", "ip6", "tcp", "udp"]),
     ("netstat -s -w 3 --per-protocol u", ["udp"]),
     ("netstat -s -pudp t", []),
@@ -47,14 +50,35 @@ cases = [
     ("channel wi", []),
 ]
 
+# The same of the lab.
+lab_options = """--providers --nexuses --channels --rings --flows --stacks --arenas --namespaces --processes --seed
+    --help""".split()
+lab_cases = [
+    ("", "generate simulate run capture".split()),
+    ("--", ["--help", "--version"]),
+    ("capture --", ["--every", "--count", "--redact", "--help"]),
+    ("generate k --", lab_options),
+    ("capture --every ", []),
+    ("simulate f", ["folder"]),
+    ("run f", ["folder"]),
+    ("run --flows 3 -- tarvelc", ["tarvelctl"]),
+    ("run -- tarvelctl net", ["netns", "netstat"]),
+    ("run folder -- tarvelctl -w 1 netns --proto=t", ["--proto=tcp"]),
+    ("run -- tarvelctl tree " + ids[1][:35], ids),
+]
+
 # How a shell is started, and what it reads then. Control-G inserts everything that could stand there, the command
 # writes down how the shell reads the line then, and the shell says when it is ready for the next.
-command = "tarvelctl() { (IFS=@; printf '%s\\n' \"$*\" >>../typed); }; PS1=\n"
+command = """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed); }
+tarvellab() { tarvelctl "$@"; }; PS1=
+"""
 start_ups = {
-    "bash": ("--noprofile --rcfile ../.bashrc -i", """. $MADE/tarvelctl.bash; PROMPT_COMMAND='printf "<%s>" ready'
+    "bash": ("--noprofile --rcfile ../.bashrc -i", """. $MADE/tarvelctl.bash; . $MADE/tarvellab.bash
+PROMPT_COMMAND='printf "<%s>" ready'
 bind 'set bell-style none' '"\\C-g": insert-completions'"""),
     "zsh": ("-di", """precmd() { printf '<%s>' ready }; unsetopt beep prompt_cr prompt_sp
-cp $MADE/tarvelctl.zsh ../_tarvelctl; fpath=($PWD/.. $fpath); autoload -U compinit; compinit -u -d ../dump
+for each in ctl lab; do cp $MADE/tarvel$each.zsh ../_tarvel$each; done
+fpath=($PWD/.. $fpath); autoload -U compinit; compinit -u -d ../dump
 zle -C all-matches complete-word _generic; bindkey '^G' all-matches
 zstyle ':completion:all-matches:*' insert yes
 zstyle ':completion:all-matches::::' completer _all_matches _complete"""),
@@ -64,9 +88,11 @@ zstyle ':completion:all-matches::::' completer _all_matches _complete"""),
 class Completions(Case):
     def setUp(self):
         super().setUp()
-        self.top = self.directory
-        self.put({"nexus_provider_list": providers, "nexus_channel_list": b"", "stats/flow": b""})
-        (self.top / "work").mkdir()
+        self.top, self.means = self.directory, {}
+        netns = b"".join(make("netns", address=each, address_length=size, protocol=6)
+                         for each, size in (("10.0.0.9", 4), ("fe80::1", 16)))
+        self.put({"nexus_provider_list": providers, "nexus_channel_list": b"", "stats/flow": b"", "stats/netns": netns})
+        (self.top / "work/folder").mkdir(parents=True)
         (self.top / "work/with blanks.log").touch()
         self.options = {"cwd": self.top / "work", "env": {
             "PATH": f"{self.top}:{build}:{os.environ['PATH']}", "MADE": str(build / "completions"), "TERM": "dumb",
@@ -80,7 +106,7 @@ class Completions(Case):
         process = subprocess.Popen([shell, *options.split()], stdin=its, stdout=its, stderr=its,
                                    start_new_session=True, **self.options)
         self.addCleanup(process.kill)
-        for line in *(f"tarvelctl {line}\a\n" for line in lines), "exit\n":
+        for line in *(f"{line}\a\n" for line in lines), "exit\n":
             seen = b""
             while b"<ready>" not in seen:
                 self.assertTrue(select.select([terminal], [], [], 20)[0], seen)
@@ -91,13 +117,16 @@ class Completions(Case):
 
     def listed(self, lines):
         """What fish says could stand at the end of each line."""
-        ask = 'source $MADE/tarvelctl.fish; for line in $argv; complete -C "tarvelctl $line"; printf "\\0"; end'
+        ask = """source $MADE/tarvelctl.fish; source $MADE/tarvellab.fish
+            for line in $argv; complete -C "$line"; printf '\\0'; end"""
         fish = ["fish", "--no-config", "-c", ask, *lines]
         answer = subprocess.check_output(fish, stderr=subprocess.STDOUT, text=True, timeout=60, **self.options)
-        return [words.splitlines() for words in answer.split("\0")[:-1]]
+        self.assertNotRegex(answer, r"\t.*[^\w(),.\n -]")  # nor does what a word means drive the shell
+        self.means.update(re.findall(r"(.*)\t(.*)", answer))
+        return [re.findall(r"^[^\t\n]+?(?=/?$|\t)", words, re.M) for words in answer.split("\0")[:-1]]
 
-    def check(self, cases):
-        lines = [line for line, _ in cases]
+    def check(self, cases, program="tarvelctl"):
+        lines = [f"{program} {line}" for line, _ in cases]
         for shell in filter(shutil.which, ("bash", "zsh", "fish")):
             made = self.listed(lines) if shell == "fish" else self.typed(shell, lines)
             for (line, expected), words in zip(cases, made, strict=True):
@@ -108,6 +137,11 @@ class Completions(Case):
 
     def test_EveryWordIsCompletedAndNothingIsRun(self):
         self.check(cases)
+        self.check(lab_cases, "tarvellab")
+        if shutil.which("fish"):
+            meant = {ids[1]: "nexus_provider x", ids[2]: "nexus of touchhurttouchhurttouchhurt",
+                     "--redact": "put substitutes for addresses and names"}
+            self.assertEqual({**self.means, **meant}, self.means)
         self.assertFalse((self.top / "work/hurt").exists())
 
     def test_ToolThatDoesNotAnswerIsGivenUp(self):

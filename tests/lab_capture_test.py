@@ -101,6 +101,16 @@ class Capture(CaptureCase):
         # Each is .7 s late; the next that can be reached is the one after the next.
         self.assertEqual(sorted(path.name for path in self.moments()), ["1.200", "2.200", "3.200"])
 
+    def test_ATerminalSeesHowFarALongCaptureHasCome(self):
+        generate(self.kernel.root)
+        wipe = "\r" + " " * 39 + "\r"
+        told = "moment 3 of 4 in 1 s\r", "moment 4 of 4 in 2 s\r", "moment 4 of 4 in 1 s\r"
+        for to, lines in ("terminal", [each + wipe for each in told]), ("pipe", []):
+            seen = self.lab(f"capture {to} --every 1.5 --count 4", to=to, merged=True,
+                            environment=preloaded("no_entropy"))
+            note = NOTE.replace("saved", to)
+            self.assertEqual(seen.out.partition("saved in")[0], note + "".join(lines))
+
     def test_WhatEndsACaptureLeavesTheMomentsSoFar(self):
         def take_away(run):
             self.kernel.root.rename(self.directory / "gone")

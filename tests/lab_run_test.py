@@ -4,6 +4,7 @@ import itertools
 import os
 import pathlib
 import pty
+import re
 import resource
 import shlex
 import shutil
@@ -78,15 +79,40 @@ class Kernels(LabCase):
         wrong += [f"capture a --count 2 --every {each}" for each in "0 0.009 3600.01 -1 nan inf 1e1 1s ''".split()]
         for words in wrong:
             seen = self.lab(words)
-            self.assertEqual((seen.out, seen.err[:7], seen.status), ("", "usage:\n", 64), words)
+            self.assertEqual((seen.out, seen.status), ("", 64), words)
+            self.assertRegex(seen.err, "^tarvellab: .*; see tarvellab --help\n$")
         self.assertEqual([path.name for path in self.directory.iterdir()], ["kernel"])
         # Diagnostics do without a descriptor of their own.
         few = self.lab("nope", preexec_fn=lambda: [os.close(0), resource.setrlimit(resource.RLIMIT_NOFILE, (3, 3))])
-        self.assertEqual(few, seen)
+        self.assertEqual(few, self.lab("nope"))
         for words in ("generate a --seed 0", "generate a --seed 18446744073709551615", "generate a --rings 1024",
                       "generate a --channels 0 --flows 10000000", "run --interval 3600000 -- true",
                       "capture b --every 0.01 --count 1", "capture c --every 3600 --count 10000000"):
             self.assertNotEqual(self.lab(words).status, 64, words)
+
+    def test_AUsageErrorNamesWhatIsWrongAndHelpIsNone(self):
+        for words, said in (("", "a command is missing"), ("'n\x1bpe'", "there is no command 'n\x1bpe'"),
+                            ("capture a --seed 1", "capture has no option --seed"),
+                            ("generate a --rings 1025", "--rings takes 0 to 1024, not '1025'"),
+                            ("generate a --flows", "--flows takes 0 to 10000000"),
+                            ("generate a -v", "generate has no option -v"), ("generate", "generate takes a directory"),
+                            ("generate a b", "generate takes one directory, and 'b' cannot be it"),
+                            ("capture a --count 2", "--count and --every go together"),
+                            ("run --flows 1", "run takes a command, behind --"),
+                            ("run a --flows 1 -- true", "--flows is for a kernel to be made, and a is there")):
+            self.assertEqual(self.lab(words), ("", f"tarvellab: {said}; see tarvellab --help\n", 64))
+        terminal = self.lab(["n\x1bpe"], to="terminal", merged=True).out
+        self.assertEqual(terminal, "tarvellab: there is no command 'n?pe'; see tarvellab --help\n")
+        whole, own = self.lab("--help"), self.lab("capture k --count --help x")
+        self.assertEqual((whole.err, own.err, whole.status, own.status), ("", "", 0, 0))
+        self.assertTrue({*own.out.splitlines()} < {*whole.out.splitlines()})
+        self.assertEqual(re.findall("--[a-z]+", own.out), ["--help", "--version", "--every", "--count", "--redact"])
+        headings = re.findall("options of (.*):", whole.out)
+        self.assertEqual(headings, ["generate simulate run", "simulate run", "capture"])
+        self.assertEqual(self.lab("run -- sh -c 'echo $0' --help").out, "--help\n")
+        self.assertRegex(self.lab("--version").out, r"^tarvellab \d+\.\d+\.\d+\n$")
+        for words in "--help", "--version":
+            self.assertEqual(self.lab(words, to="/dev/full").status, 74)
 
     def test_WhatCannotBeWrittenIsNamed(self):
         made, flow, comm = self.kernel.root, NODES + "stats/flow", "proc/94/comm"
@@ -131,6 +157,22 @@ class Kernels(LabCase):
             return min(len(sizes), len(moments), len(names)) > 3  # no two new files have one name
         wait_for(has_moved)
         self.assertEqual((run.end(signal.SIGINT).status, hidden(self.kernel.root)), (0, []))
+
+    def test_ATerminalSeesLongWorkAndNothingOfItStays(self):
+        def made(line, to="terminal", **clock):
+            return self.lab(line.format("--flows 100000"), to=to, merged=True,
+                            environment=preloaded("no_entropy", WAITS="3", **{"TICK": "1000", **clock}))
+        wipe, line = "\r" + " " * 39 + "\r", r"(?:making flow \d+ of 100000|writing \w+: \d+ MB)\r"
+        out = made("generate {} k", TICK="100").out
+        self.assertRegex(out, f"^({line}{wipe})+$")
+        self.assertIn("writing flow", out)
+        first, second = [int(each) // 4096 for each in re.findall(r"making flow (\d+)", out)]
+        self.assertEqual((first, second - first), (19, 3))  # 2 s, and 0.25 s with a look at the clock more
+        self.assertRegex(made("simulate {} k").out, f"^({line}{wipe})+simulating in k\n$")
+        self.assertEqual([made("generate {} k", "pipe"), made("run {} -- true")], [("", "", 0)] * 2)
+        seen = made("generate {} k", LOOKS="9")
+        self.assertRegex(seen.out, f"^({line}{wipe})+$")
+        self.assertEqual(seen.status, -signal.SIGINT)
 
     def test_EndsWhereItCannotGoOn(self):
         self.assertEqual(self.lab("simulate made", to="/dev/full"), ("", "write error: No space left on device\n", 74))

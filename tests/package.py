@@ -9,10 +9,12 @@ import tempfile
 from runs import build, top
 
 expected = """bin/tarvelctl bin/tarvellab share/bash-completion/completions/tarvelctl
+    share/bash-completion/completions/tarvellab
     share/doc/tarvelctl/changelog.Debian.gz share/doc/tarvelctl/copyright
     share/doc/tarvelctl/from-symptom-to-command.md share/fish/vendor_completions.d/tarvelctl.fish
+    share/fish/vendor_completions.d/tarvellab.fish
     share/man/man1/tarvelctl.1.gz share/man/man1/tarvellab.1.gz share/man/man5/tarvel-tables.5.gz
-    share/zsh/vendor-completions/_tarvelctl""".split()
+    share/zsh/vendor-completions/_tarvelctl share/zsh/vendor-completions/_tarvellab""".split()
 
 
 def run(*words):
@@ -45,8 +47,12 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     os.environ["CDPATH"] = str(scratch)  # has such a folder too
     (scratch / "scripts").mkdir()
     os.chdir(top)
-    check_has(run("scripts/demo", root / "usr/bin"), f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14",
-              "Proto Local Address", "LISTENER")
+    shown = run("scripts/demo", root / "usr/bin")
+    check_has(shown, f"PATH={root}/usr/bin:", "tarvelctl provider -D", "Instances: 14", "Proto Local Address",
+              "LISTENER")
+    three_screens, lines = 3 * 24, shown.splitlines()
+    assert len(lines) <= three_screens and max(map(len, lines[1:])) <= 120, shown
+    check_has((top / "build/demo/netstat_-a_-n.txt").read_text(), "MULTIPLE")
     assert not (scratch / "build").exists()
     guide = (root / "usr/share/doc/tarvelctl/from-symptom-to-command.md").read_text()
     assert not re.search(r"\]\((?!#)", guide), "a link to a page that is not installed"

@@ -112,8 +112,8 @@ inline constexpr auto arena_rows = [] {
   using record = tv_stats_arena;
   using enum field_kind;
   return join(
-      ROW(name).is(field_kind::name, "name", "name of the arena"),
-      ROW(type).is(enumeration, "type", "type of the arena").of(arena_types), ROW(reserved_68),
+      ROW(name).is(field_kind::name, "name", "name of the arena").identifying(),
+      ROW(type).is(enumeration, "type", "type of the arena").of(arena_types).identifying(), ROW(reserved_68),
       ROW(regions).is(nested, "regions", "regions, empty where seg_count is 0").of(region_description),
       ROW(pids).is(pid, "pids", "process ids of users, up to the first 0").up_to(0));
 }();

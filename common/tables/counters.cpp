@@ -55,7 +55,7 @@ constinit const counter_name ip6_counter_names[] = {
 };
 
 // TCP, of a user-space stack.
-constinit const counter_name tcp_counter_names[] = {
+constexpr counter_name tcp_counter_names[] = {
     "ConnInit",
     "ConnAcpt",
     "ConnEst",
@@ -341,6 +341,7 @@ constinit const counter_name flow_switch_counter_names[] = {
 static_assert(std::size(ip_counter_names) == ip_counter_count + 1);
 static_assert(std::size(ip6_counter_names) == ip6_counter_count + 1);
 static_assert(std::size(tcp_counter_names) == tcp_counter_count + 1);
+static_assert(tcp_counter_names[tcp_time_wait].name() == "TWPcbCount");
 static_assert(std::size(udp_counter_names) == udp_counter_count + 1);
 static_assert(std::size(net_if_counter_names) == net_if_counter_count + 1);
 static_assert(std::size(flow_switch_counter_names) == flow_switch_counter_count + 1);

@@ -22,6 +22,9 @@ inline constexpr std::size_t ip6_counter_count = 36;
 inline constexpr std::size_t tcp_counter_count = 203;
 inline constexpr std::size_t udp_counter_count = 22;
 
+// Where TCP counts the connections that wait now, among all that counts up.
+inline constexpr std::uint16_t tcp_time_wait = 193;
+
 // The names of the counters of a block, by position. Each list is closed by an empty name.
 extern const counter_name net_if_counter_names[];
 extern const counter_name flow_switch_counter_names[];
@@ -91,12 +94,15 @@ inline constexpr auto userstack_rows = [] {
   using enum field_kind;
   return join(
       ROW(nx_uuid).is(identifier, "nexus", "UUID of the nexus"),
-      ROW(if_name).is(interface, "interface", "name of the interface"),
-      ROW(pid).is(field_kind::pid, "pid", "process id, 0: all ports now closed"), ROW(reserved_36),
-      ROW(ip).is(counter, "ip", "counters of IP, by position").of(ip_counter_names), ROW(reserved_392),
-      ROW(ip6).is(counter, "ip6", "counters of IPv6, by position").of(ip6_counter_names),
-      ROW(tcp).is(counter, "tcp", "counters of TCP, by position").of(tcp_counter_names), ROW(reserved_2312),
-      ROW(udp).is(counter, "udp", "counters of UDP, by position").of(udp_counter_names));
+      ROW(if_name).is(interface, "interface", "name of the interface").identifying(),
+      ROW(pid).is(field_kind::pid, "pid", "process id, 0: all ports now closed").identifying(),
+      ROW(reserved_36), ROW(ip).is(counter, "ip", "counters of IP, by position").of(ip_counter_names),
+      ROW(reserved_392), ROW(ip6).is(counter, "ip6", "counters of IPv6, by position").of(ip6_counter_names),
+      ROW(tcp)
+          .is(counter, "tcp", "counters of TCP, by position")
+          .of(tcp_counter_names)
+          .with_level(tcp_time_wait),
+      ROW(reserved_2312), ROW(udp).is(counter, "udp", "counters of UDP, by position").of(udp_counter_names));
 }();
 inline constexpr record_description userstack_description =
     describe<tv_stats_userstack>("tv_stats_userstack", "userstack", userstack_rows);

@@ -12,6 +12,7 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <optional>
 #include <span>
 #include <string_view>
@@ -53,7 +54,26 @@ struct number_at {
   field_type type = field_type::u8;
 
   // The number, sign extended.
-  std::int64_t in(record_bytes record) const;
+  std::int64_t in(record_bytes record) const {
+    const auto read = [&]<class Number>(Number value) {
+      std::memcpy(&value, record.data() + offset, sizeof value);
+      return value;
+    };
+    switch (type) {
+      case field_type::u8:
+        return read(std::uint8_t{});
+      case field_type::u16:
+        return read(std::uint16_t{});
+      case field_type::net16:
+        return std::rotl(read(std::uint16_t{}), 8);
+      case field_type::u32:
+        return read(std::uint32_t{});
+      case field_type::i32:
+        return read(std::int32_t{});
+      default:
+        return read(std::int64_t{});
+    }
+  }
 };
 
 // On what a field says anything: that a number of the record is, masked, one of some small ones or, inverted,
@@ -90,11 +110,13 @@ struct row {
   const bit_names *flags = nullptr;          // of flags
   const counter_name *names = nullptr;       // of the elements
   const record_description *nested = nullptr;
-  field_condition condition = {};          // it says something where this holds,
-  field_condition of_part = {};            // and this, of its part
-  std::optional<number_at> length = {};    // how many of its bytes count
-  std::optional<std::uint32_t> none = {};  // the number that means that there is none
-  bool ends_at_none = false;               // elements from the first `none` on say nothing
+  field_condition condition = {};           // it says something where this holds,
+  field_condition of_part = {};             // and this, of its part
+  std::optional<number_at> length = {};     // how many of its bytes count
+  std::optional<std::uint32_t> none = {};   // the number that means that there is none
+  bool ends_at_none = false;                // elements from the first `none` on say nothing
+  bool identifies = false;                  // as an identifier does, together with those
+  std::optional<std::uint16_t> level = {};  // the element among counters that rises and falls
 
   constexpr number_at at(std::size_t element = 0) const {
     return {static_cast<std::uint16_t>(offset + element * size), type};
@@ -102,6 +124,20 @@ struct row {
 
   // How many of its elements say anything.
   std::size_t count_in(record_bytes record) const;
+
+  // How many bytes of its only element say anything: of a text those in front of a NUL, of what has a length
+  // those that count. An address of a length that no family has says nothing.
+  std::size_t size_in(record_bytes record) const {
+    return length || type == field_type::text ? size_said_in(record) : size;
+  }
+
+  // Whether it tells its record from others: an equal one, at another moment, is the same record.
+  constexpr bool is_key() const {
+    return kind == field_kind::identifier || (identifies && kind != field_kind::unread);
+  }
+
+  // Whether what it says depends on another field.
+  constexpr bool depends() const { return condition.mask || of_part.mask || length; }
 
   bool holds(record_bytes record) const { return condition.holds(record) && of_part.holds(record); }
 
@@ -127,6 +163,8 @@ struct row {
   constexpr row of(const record_description &element) const { return with(&row::nested, &element); }
   constexpr row or_none(std::uint32_t number) const { return with(&row::none, number); }
   constexpr row up_to(std::uint32_t number) const { return or_none(number).with(&row::ends_at_none, true); }
+  constexpr row identifying() const { return with(&row::identifies, true); }
+  constexpr row with_level(std::uint16_t element) const { return with(&row::level, element); }
   constexpr row cut_to(const row &bytes) const { return with(&row::length, bytes.at()); }
   // Only where the other field is this number, or either of two; where it has the bit; where it is not 0.
   constexpr row where(const row &decides, std::uint32_t number) const {
@@ -145,10 +183,13 @@ struct row {
         .with(&row::part, whole.field)
         .with(&row::part_name, whole.name)
         .with(&row::part_meaning, whole.meaning)
+        .with(&row::identifies, identifies || whole.identifies)
         .with(&row::of_part, whole.condition);
   }
 
  private:
+  std::size_t size_said_in(record_bytes record) const;
+
   constexpr row on(const field_condition &decisive) const { return with(&row::condition, decisive); }
 };
 
@@ -264,6 +305,20 @@ consteval bool agrees_with(std::span<const follower> followers) {
   return true;
 }
 
+// Whether a field that identifies depends on fields that identify by themselves, if on any, and is one value.
+consteval bool can_identify(const row &field, std::span<const row> rows) {
+  const auto decides = [&](std::size_t offset) {
+    for (const row &each : rows) {
+      if (each.offset == offset) return each.is_key() && !each.depends();
+    }
+    return false;
+  };
+  return field.count == 1 && field.size <= UINT8_MAX &&
+         (!field.condition.mask || decides(field.condition.at.offset)) &&
+         (!field.of_part.mask || decides(field.of_part.at.offset)) &&
+         (!field.length || decides(field.length->offset));
+}
+
 template <class Record>
 consteval record_description describe(std::string_view name, std::string_view noun, std::span<const row> rows,
                                       std::span<const follower> followers = {}) {
@@ -278,6 +333,9 @@ consteval record_description describe(std::string_view name, std::string_view no
     }
     if (each.kind == field_kind::address && each.length && each.size != 16) {
       bad_description("an address of any length needs room for the longest");
+    }
+    if (each.is_key() && !can_identify(each, rows)) {
+      bad_description("what identifies is no single value, or depends on what does not");
     }
   }
   if (end != sizeof(Record)) bad_description("rows do not tile the record");

@@ -163,16 +163,17 @@ inline constexpr auto flow_rows = [] {
   constexpr row family = ROW(sf_local.family);
   return join(
       ROW(sf_nx_uuid).is(identifier, "nexus", "UUID of the flow switch"),
-      ROW(sf_if_name).is(interface, "interface", "name of the interface"),
+      ROW(sf_if_name).is(interface, "interface", "name of the interface").identifying(),
       ROW(sf_bucket).is(number, "bucket", "bucket of the flow, or none").or_none(no_index),
       ROW(sf_proc_name).is(process, "process", "name of the owner"),
-      ROW(sf_pid).is(pid, "pid", "process id of the owner"),
+      ROW(sf_pid).is(pid, "pid", "process id of the owner").identifying(),
       ROW(sf_flags).is(flags, "flags", "flags of the flow").of(flow_flag_names),
       ROW(sf_nx_port).is(number, "port", "port of the nexus, or none").or_none(no_index),
-      address_rows(ROW(sf_local).is(nested, "local", "local address and port"), family, true),
-      address_rows(ROW(sf_remote).is(nested, "remote", "remote address and port"), family, true),
-      ROW(sf_protocol).is(enumeration, "protocol", "transport protocol").of(ip_protocols), ROW(reserved_137),
-      ROW(sf_svc).is(enumeration, "service_class", "service class").of(service_classes),
+      address_rows(ROW(sf_local).is(nested, "local", "local address and port").identifying(), family, true),
+      address_rows(ROW(sf_remote).is(nested, "remote", "remote address and port").identifying(), family,
+                   true),
+      ROW(sf_protocol).is(enumeration, "protocol", "transport protocol").of(ip_protocols).identifying(),
+      ROW(reserved_137), ROW(sf_svc).is(enumeration, "service_class", "service class").of(service_classes),
       ROW(sf_adv_idx).is(number, "advisory", "index of the advisory, or none").or_none(no_index),
       ROW(reserved_148), endpoint_rows(ROW(sf_lstats).is(nested, "tx", "local end, and what was sent")),
       endpoint_rows(ROW(sf_rstats).is(nested, "rx", "remote end, and what was received")), ROW(reserved_280));
@@ -216,8 +217,8 @@ inline constexpr auto advisory_rows = [] {
   using record = tv_stats_flow_adv;
   using enum field_kind;
   return join(ROW(sfa_nx_uuid).is(identifier, "nexus", "UUID of the flow switch"),
-              ROW(sfa_if_name).is(interface, "interface", "name of the interface"),
-              ROW(sfa_pid).is(pid, "pid", "process id"),
+              ROW(sfa_if_name).is(interface, "interface", "name of the interface").identifying(),
+              ROW(sfa_pid).is(pid, "pid", "process id").identifying(),
               ROW(sfa_entries_count).is(number, "entries", "entries that follow, up to 512"));
 }();
 inline constexpr follower advisory_followers[] = {{"entries", row_at(advisory_rows, "sfa_entries_count"),
@@ -245,11 +246,11 @@ inline constexpr auto owner_rows = [] {
   using record = tv_stats_flow_owner;
   using enum field_kind;
   return join(ROW(sfo_nx_uuid).is(identifier, "nexus", "UUID of the flow switch"),
-              ROW(sfo_if_name).is(interface, "interface", "name of the interface"),
+              ROW(sfo_if_name).is(interface, "interface", "name of the interface").identifying(),
               ROW(sfo_bucket).is(number, "bucket", "bucket of the owner, or none").or_none(no_index),
               ROW(sfo_proc_name).is(process, "process", "name of the owner"),
-              ROW(sfo_pid).is(pid, "pid", "process id of the owner"),
-              ROW(sfo_nx_port).is(number, "port", "port of the nexus"),
+              ROW(sfo_pid).is(pid, "pid", "process id of the owner").identifying(),
+              ROW(sfo_nx_port).is(number, "port", "port of the nexus").identifying(),
               ROW(sfo_pid_bound).is(number, "pid_bound", "not 0: bound to the process id"),
               ROW(sfo_destroyed).is(number, "destroyed", "not 0: destroyed"), ROW(reserved_84));
 }();
@@ -284,13 +285,13 @@ inline constexpr auto route_rows = [] {
   constexpr row family = ROW(sfr_remote.family);
   constexpr row bits = ROW(sfr_flags).is(flags, "flags", "flags of the route").of(route_flag_names);
   return join(
-      ROW(reserved_0), ROW(sfr_if_name).is(interface, "interface", "name of the interface"),
+      ROW(reserved_0), ROW(sfr_if_name).is(interface, "interface", "name of the interface").identifying(),
       ROW(sfr_bidx).is(number, "bidx", "bucket of the route"),
       ROW(sfr_ibidx).is(number, "ibidx", "second bucket of the route"), bits,
       ROW(sfr_refs).is(gauge, "refs", "reference count"),
       ROW(sfr_expire).is(gauge, "expire", "expiry, as the kernel keeps it"),
-      address_rows(ROW(sfr_local).is(nested, "local", "local address"), family, false),
-      address_rows(ROW(sfr_remote).is(nested, "remote", "remote address"), family, false),
+      address_rows(ROW(sfr_local).is(nested, "local", "local address").identifying(), family, false),
+      address_rows(ROW(sfr_remote).is(nested, "remote", "remote address").identifying(), family, false),
       address_rows(ROW(sfr_gateway)
                        .is(nested, "gateway", "gateway, where flag 0x20 is set")
                        .where_bit(bits, record::has_gateway),

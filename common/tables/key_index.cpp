@@ -18,19 +18,40 @@ struct hash_key {
   }
 };
 
-std::uint64_t hash(const index_key &key) {
-  static const hash_key secret;
-  std::uint64_t halves[2];
-  std::memcpy(halves, key.bytes, sizeof halves);
+const hash_key &secret() {
+  static const hash_key drawn;
+  return drawn;
+}
+
+std::uint64_t folded_product(std::uint64_t a, std::uint64_t b) {
   __extension__ using wide = unsigned __int128;
-  const wide product = static_cast<wide>(halves[0] ^ secret.halves[0]) * (halves[1] ^ secret.halves[1]);
-  const std::uint64_t folded =
-      static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
-  const wide again = static_cast<wide>(folded ^ secret.halves[1]) * 0x9e3779b97f4a7c15;
-  return static_cast<std::uint64_t>(again) ^ static_cast<std::uint64_t>(again >> 64);
+  const wide product = static_cast<wide>(a) * b;
+  return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
+}
+
+// Of 16 bytes, and of what was hashed before them.
+std::uint64_t hash_block(const void *bytes, std::uint64_t before, const hash_key &by) {
+  std::uint64_t halves[2];
+  std::memcpy(halves, bytes, sizeof halves);
+  const std::uint64_t once = folded_product(halves[0] ^ by.halves[0] ^ before, halves[1] ^ by.halves[1]);
+  return folded_product(once ^ by.halves[1], 0x9e3779b97f4a7c15);
+}
+
+std::uint64_t hash(const index_key &key) {
+  return hash_block(key.bytes, 0, secret());
 }
 
 }  // namespace
+
+std::uint64_t keyed_hash(std::span<const std::byte> bytes) {
+  constexpr std::size_t block = sizeof(index_key);
+  const hash_key &by = secret();
+  std::uint64_t hash = bytes.size();
+  for (; bytes.size() > block; bytes = bytes.subspan(block)) hash = hash_block(bytes.data(), hash, by);
+  unsigned char last[block] = {};
+  std::copy_n(reinterpret_cast<const unsigned char *>(bytes.data()), bytes.size(), last);
+  return hash_block(last, hash, by);
+}
 
 // Where the search for `key` begins. There are slots.
 std::size_t key_index::first_slot_of(const index_key &key) const {

@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <span>
 #include <type_traits>
 #include <vector>
 
@@ -25,6 +26,9 @@ struct index_key {
     return std::memcmp(a.bytes, b.bytes, sizeof a.bytes) == 0;
   }
 };
+
+// A hash of any bytes that is another one in each process: who chooses what is hashed cannot choose it.
+std::uint64_t keyed_hash(std::span<const std::byte> bytes);
 
 // Positions by key. The first position added for a key stays, which is what a linear search would find.
 class key_index {

@@ -40,11 +40,12 @@ static_assert(sizeof(tv_stats_netns_range) == 32);
 inline constexpr auto range_rows = [] {
   using record = tv_stats_netns_range;
   using enum field_kind;
-  return join(ROW(first_port).is(number, "first", "first port of the range"),
-              ROW(last_port).is(number, "last", "last port of the range, 0: a single port").or_none(0),
-              ROW(subsystem).is(gauge, "tarvel", "reservations of the subsystem"),
-              ROW(bsd).is(gauge, "bsd", "reservations of sockets"), ROW(reserved_12),
-              ROW(listeners).is(gauge, "listeners", "listeners"), ROW(reserved_20));
+  return join(
+      ROW(first_port).is(number, "first", "first port of the range").identifying(),
+      ROW(last_port).is(number, "last", "last port of the range, 0: a single port").or_none(0).identifying(),
+      ROW(subsystem).is(gauge, "tarvel", "reservations of the subsystem"),
+      ROW(bsd).is(gauge, "bsd", "reservations of sockets"), ROW(reserved_12),
+      ROW(listeners).is(gauge, "listeners", "listeners"), ROW(reserved_20));
 }();
 inline constexpr record_description range_description =
     describe<tv_stats_netns_range>("tv_stats_netns_range", "range", range_rows);
@@ -53,9 +54,13 @@ inline constexpr auto netns_rows = [] {
   using record = tv_stats_netns;
   using enum field_kind;
   constexpr row length =
-      ROW(address_length).is(number, "address_length", "4: IPv4, 16: IPv6, others: global");
-  return join(ROW(address).is(field_kind::address, "address", "address of the namespace").cut_to(length),
-              length, ROW(protocol).is(enumeration, "protocol", "transport protocol").of(ip_protocols),
+      ROW(address_length).is(number, "address_length", "4: IPv4, 16: IPv6, others: global").identifying();
+  return join(ROW(address)
+                  .is(field_kind::address, "address", "address of the namespace")
+                  .cut_to(length)
+                  .identifying(),
+              length,
+              ROW(protocol).is(enumeration, "protocol", "transport protocol").of(ip_protocols).identifying(),
               ROW(entry_count).is(number, "ranges", "ranges that follow"), ROW(reserved_19));
 }();
 inline constexpr follower netns_followers[] = {

@@ -80,7 +80,7 @@ struct column_text {
     std::fill_n(std::copy_n(name, name_size, chars), size - name_size, ' ');
   }
 
-  std::string_view name() const { return {chars, name_size}; }
+  constexpr std::string_view name() const { return {chars, name_size}; }
 
   char *append_to(char *to) const {
     std::memcpy(to, chars, Capacity);  // a constant size needs no call

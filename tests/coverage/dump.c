@@ -22,6 +22,8 @@ __attribute__((destructor(101))) static void prepare(void) {
   getrlimit(RLIMIT_FSIZE, &size);
   size.rlim_cur = size.rlim_max;
   setrlimit(RLIMIT_FSIZE, &size);
+  const int spare = dup(STDIN_FILENO);
+  close(spare < 0 ? STDIN_FILENO : spare);
 }
 
 static void dump(void) {

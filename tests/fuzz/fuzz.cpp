@@ -5,7 +5,9 @@
 // about a kernel table, the end of the watch, or exit(); whatever else happens is a finding.
 //
 // An input begins with a header: three sizes, three nodes, the surroundings. Behind it stand a command line,
-// each word ended by a NUL, and the tables of the nodes. What is no node of an input is an empty table.
+// each word ended by a NUL, and the tables of the nodes. What is no node of an input is an empty table. Where
+// the surroundings say so, the last two tables are those of the last node at two moments, which are compared:
+// in the place of a command line stand their times.
 
 #include <fcntl.h>
 #include <getopt.h>
@@ -27,6 +29,7 @@
 #include "platform/process.h"
 #include "platform/sysctl.h"
 #include "tarvelctl/netstat_options.h"
+#include "tests/fuzz/fuzz.h"
 
 // The regions that the process has seen are forgotten between two executions: only this file can name them.
 #include "tarvelctl/memory.cpp"  // NOLINT(bugprone-suspicious-include)
@@ -89,12 +92,6 @@ void run(std::string line) {
   diagnostics.close();
 }
 
-void expect(bool holds, const char *what, std::string_view text) {
-  if (holds) return;
-  std::fprintf(stderr, "FINDING: %s: %.*s\n", what, static_cast<int>(text.size()), text.data());
-  std::abort();
-}
-
 // Whether a report has no control characters but line ends, tabulators and the program's own colours.
 bool is_plain(std::string text) {
   for (const std::string_view own : {"\n", "\t", "\033[0m", "\033[31m", "\033[36m"}) {
@@ -127,7 +124,25 @@ std::string_view take(std::string_view &input, std::size_t size) {
   return taken;
 }
 
+// Has the two tables of one node read one after the other.
+void compare(const table_description &table, std::string_view times) {
+  std::int64_t at[2]{};
+  times.copy(reinterpret_cast<char *>(at), sizeof at);
+  world.tables = {{table.node, world.tables[1].content}, {table.node, world.tables[2].content}};
+  const table_description *const wanted[] = {&table};
+  moment before = read_moment(wanted), now = read_moment(wanted);
+  before.tables[0].monotonic = at[0];
+  now.tables[0].monotonic = at[1];
+  judge_changes(before, now);
+}
+
 }  // namespace
+
+void expect(bool holds, const char *what, std::string_view text) {
+  if (holds) return;
+  std::fprintf(stderr, "FINDING: %s: %.*s\n", what, static_cast<int>(text.size()), text.data());
+  std::abort();
+}
 
 extern "C" int LLVMFuzzerInitialize(int * /*argc*/, char *** /*argv*/) {
   setenv("LC_ALL", "C.UTF-8", 1);
@@ -148,6 +163,10 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   for (std::size_t i = 0; i < 3; ++i) {
     const char *node = all_tables[header.nodes[i] % std::size(all_tables)].node;
     world.tables.push_back({node, i < 2 ? take(rest, header.sizes[i + 1]) : rest});
+  }
+  if (header.surroundings & 16) {
+    compare(all_tables[header.nodes[2] % std::size(all_tables)], line);
+    return 0;
   }
   world.tables.push_back({ring_stat_enable_node, header.surroundings & 8 ? std::string_view("\0", 1) : "\1"});
   world.has_terminal = header.surroundings & 1;

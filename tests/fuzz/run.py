@@ -47,7 +47,7 @@ def generated(lab, seed, sizes):
 
 
 def inputs(tables):
-    """As fuzz.cpp reads them: each command over whole tables and over a cut one."""
+    """As fuzz.cpp reads them: each command over whole tables and over a cut one, and each table at two moments."""
     for nodes, commands in COMMANDS.items():
         chosen = [NODES.index(node) for node in nodes.split()]
         *others, last = (tables[node] for node in chosen)
@@ -60,6 +60,10 @@ def inputs(tables):
             for surroundings, table in (2 * turn + 1, last), (2 * turn, last[:-1]):
                 start = struct.pack("<3H4B", *map(len, (line, *others)), *chosen, surroundings)
                 yield b"".join([start, line, *others, table])
+    for node, table in enumerate(tables):  # at two moments, whole and cut
+        for before, now in (table, table), (table[:-1], table), (table, table[8:]):
+            start = struct.pack("<3H4B", 16, 0, len(before), 0, 0, node, 16)
+            yield start + struct.pack("<2q", 1, 10**9) + before + now
 
 
 def execute(fuzzer, seed, runs, first, *corpus):

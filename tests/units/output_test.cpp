@@ -115,6 +115,15 @@ TEST(output, AbandonedItGoesOnUpToItsLastWholeLine) {
   EXPECT_TRUE(writes.empty());
 }
 
+TEST(output, AbandonedItSaysWhatKeptItFromWriting) {
+  for (const auto &[outcome, told] : {std::pair{ENOSPC, ENOSPC}, {-0, EIO}, {EPIPE, 0}}) {
+    const capture captured(report);
+    print<"line\n">();
+    writes = {outcome};
+    EXPECT_EQ(report.abandon(), told);
+  }
+}
+
 // In the middle of a flush that reaches beyond the last whole line, there is nothing to add.
 TEST(output, AbandonedInAFlushOfHalfALineWritesNothing) {
   const capture captured(report);
@@ -125,11 +134,13 @@ TEST(output, AbandonedInAFlushOfHalfALineWritesNothing) {
 }
 
 TEST(output_helpers, ShowWhatNoCommandShows) {
-  const option options[] = {{"maybe", optional_argument, nullptr, 'm'}, {}};
+  const option options[] = {
+      {"maybe", optional_argument, nullptr, 'm'}, {"must", required_argument, nullptr, 'M'}, {}};
+  const std::uint32_t are[] = {option_is_optional, 0};
   {
     const capture said(diagnostics);
-    print_options_usage(options, &option_is_optional);
-    EXPECT_EQ(said.text(), "\t[--maybe, -m [ <maybe> ] ]\n");
+    print_options_usage(options, are);
+    EXPECT_EQ(said.text(), "\t[--maybe, -m [ <maybe> ] ]\n\t--must, -M <must>\n");
   }
   {
     const capture printed(report);

@@ -1,6 +1,7 @@
 // Kernel variables and process names as files; what else the system is asked for.
 
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include "common/channel_snapshot.h"
@@ -79,6 +80,14 @@ TEST_F(kernel_files, BelowARootNothingButItsOwnFilesIsOpened) {
     for (std::string name, told; words >> name >> told;) EXPECT_EQ(ask(name, 10), told) << name << of;
     EXPECT_EQ(ask("") + ask(std::string(5000, 'x')) + ask(long_name + ".a"), "ENOENTENOENT5");
   }
+  rlimit all{};
+  getrlimit(RLIMIT_NOFILE, &all);
+  const int free = dup(STDERR_FILENO);
+  close(free);
+  const rlimit one{static_cast<rlim_t>(free) + 1, all.rlim_max};
+  setrlimit(RLIMIT_NOFILE, &one);
+  EXPECT_EQ(ask("kern.flow"), "EMFILE");  // found, but not opened
+  setrlimit(RLIMIT_NOFILE, &all);
   setenv("TARVEL_ROOT", std::string(PATH_MAX, '/').c_str(), 1);
   EXPECT_EQ(ask("kern.flow"), "ENAMETOOLONG");
   setenv("TARVEL_ROOT", "/", 1);

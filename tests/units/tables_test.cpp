@@ -1,16 +1,21 @@
 // What finds and holds things in memory.
 
+#include <algorithm>
+
 #include "common/mib.h"
 #include "common/tables/channel.h"
 #include "common/tables/key_index.h"
+#include "common/tables/provider.h"
 #include "common/tables/table_walk.h"
 #include "common/text/memory.h"
 #include "tests/units/units.h"
 
 namespace {
 
-TEST(allocation, OfNothingIsABlock) {
+TEST(allocationDeathTest, OfNothingIsABlockAndOfTooMuchAMessage) {
   EXPECT_NE((std::unique_ptr<void, c_free>(xrealloc(xmalloc(0), 0))), nullptr);
+  diagnostics.attach(STDERR_FILENO);
+  EXPECT_EXIT(xmalloc(SIZE_MAX), testing::ExitedWithCode(255), "malloc failed");
 }
 
 TEST(description, NumbersAreReadAsTheyLie) {
@@ -22,13 +27,27 @@ TEST(description, NumbersAreReadAsTheyLie) {
   }
 }
 
+TEST(description, ATextEndsWhereItIsCut) {
+  std::string provider(264, '\0');
+  provider.replace(64, 5, "utun0");
+  const auto name = std::ranges::find(provider_rows, "name", &row::field);
+  for (const char length : {'\4', '\11'}) {
+    provider[128] = length;
+    EXPECT_EQ(name->size_in(std::as_bytes(std::span(provider))), length == '\4' ? 4U : 5U);
+  }
+}
+
 TEST(description, NoNumberIsTakenForASmallerOne) {
   const field_condition is_30{{0, field_type::u8}, UINT64_MAX, std::uint64_t{1} << 30};
   EXPECT_FALSE(is_30.holds(std::as_bytes(std::span("^"))));  // 94
   std::string table(24 + 48, '\0');
-  table[16] = 1;                // channel,
+  table[16] = 1;  // channel
+  const auto is_whole = [&] {
+    return walk_table(channel_header_description, std::as_bytes(std::span(table)), [](const auto &) {});
+  };
+  EXPECT_TRUE(is_whole());
   table[24 + 32 + 3] = '\x20';  // whose rings take a multiple of 2^32 bytes
-  EXPECT_FALSE(walk_table(channel_header_description, std::as_bytes(std::span(table)), [](const auto &) {}));
+  EXPECT_FALSE(is_whole());
 }
 
 TEST(key_index, FindsWhatWasAddedFirst) {
@@ -41,6 +60,7 @@ TEST(key_index, FindsWhatWasAddedFirst) {
 }
 
 TEST(object_type_name, IsOfTypesOnly) {
+  EXPECT_EQ(object_type_name(object_type::nexus).view(), "nexus");
   EXPECT_EQ(object_type_name(object_type{5}).view(), "???");
 }
 
