@@ -9,21 +9,19 @@ namespace lab {
 
 namespace {
 
-constexpr std::uint32_t control_packet = 60;  // bytes of a segment that carries no data
-
 // By state.
 constexpr tcp_behaviour tcp_behaviours[] = {
-    {tcp::time_wait, false, false, 1500, tcp::gone, tcp::gone, 0},                 // closed
-    {tcp::closed, false, false, 0, tcp::listening, tcp::listening, 0},             // listening
-    {tcp::listening, false, false, 400, tcp::established, tcp::closed, 5},         // syn_sent
-    {tcp::syn_sent, false, false, 300, tcp::established, tcp::established, 0},     // syn_received
-    {tcp::established, true, true, 40'000, tcp::fin_wait_1, tcp::close_wait, 45},  // established
-    {tcp::fin_wait_2, true, false, 2500, tcp::last_ack, tcp::last_ack, 0},         // close_wait
-    {tcp::established, false, true, 600, tcp::fin_wait_2, tcp::closing, 12},       // fin_wait_1
-    {tcp::closing, false, false, 500, tcp::time_wait, tcp::time_wait, 0},          // closing
-    {tcp::fin_wait_2, false, false, 500, tcp::closed, tcp::closed, 0},             // last_ack
-    {tcp::close_wait, false, true, 1500, tcp::time_wait, tcp::time_wait, 0},       // fin_wait_2
-    {tcp::closed, false, false, 8000, tcp::gone, tcp::gone, 0},                    // time_wait
+    {tcp::time_wait, false, false, 1500, tcp::gone},       // closed
+    {tcp::closed, false, false, 0, tcp::listening},        // listening
+    {tcp::listening, false, false, 0, tcp::established},   // syn_sent
+    {tcp::syn_sent, false, false, 0, tcp::established},    // syn_received
+    {tcp::established, true, true, 0, tcp::fin_wait_1},    // established
+    {tcp::fin_wait_2, true, false, 2500, tcp::last_ack},   // close_wait
+    {tcp::established, false, true, 0, tcp::fin_wait_2},   // fin_wait_1
+    {tcp::closing, false, false, 0, tcp::time_wait},       // closing
+    {tcp::fin_wait_2, false, false, 0, tcp::closed},       // last_ack
+    {tcp::close_wait, false, true, 1500, tcp::time_wait},  // fin_wait_2
+    {tcp::closed, false, false, 15'000, tcp::gone},        // time_wait
 };
 static_assert(std::size(tcp_behaviours) == tcp::gone);
 
@@ -45,24 +43,40 @@ two_way<std::uint32_t> states_of(const flow &source) {
   return {by_packets(source.moved.out), by_packets(source.moved.in)};
 }
 
-bool was_connected(const flow &source) {
-  return source.use->protocol == tcp_protocol &&
-         (source.state >= tcp::established || source.state == tcp::closed);
-}
-
 void make_busy(world &state, flow &moving) {
+  constexpr std::uint32_t held_back = 16;  // times slower
   // Many flows share what an interface can carry.
   const std::uint32_t fair = std::max(400'000 / std::max(state.size.flows, 1U), 1U);
   const std::uint32_t most = std::min(moving.use->packets_per_second, fair);
-  moving.packets_per_second.out = state.random.between(1, most);
-  moving.packets_per_second.in = 1 + moving.packets_per_second.out * state.random.between(60, 120) / 100;
+  auto &[out, in] = moving.packets_per_second;
+  out = state.random.between(1, most);
+  in = 1 + out * state.random.between(60, 120) / 100;
+  moving.controlled = moving.stalled || (moving.advisory != none && state.random.chance(1, 24));
+  if (moving.controlled) {
+    out = moving.stalled ? 0 : out / held_back;
+    in = moving.stalled ? 0 : in / held_back;
+  }
+  moving.due += state.random.between(2000, 6000);
+  if (!moving.connected) return;
+  const nexus &carrier = state.nexuses[state.channels[moving.channel].nexus];
+  const std::uint32_t usual = state.routes[moving.route].rtt;
+  const std::uint32_t seen = usual + state.random.below(usual / 8 + 1) + carrier.delay;
+  moving.rtt = moving.rtt ? (3 * moving.rtt + seen) / 4 : seen;
 }
 
 void enter(world &state, flow &walker, tcp::state next) {
+  const tcp_behaviour &behaviour = behaviour_of(next);
   walker.state = next;
-  if (next == tcp::established) make_busy(state, walker);
-  if (!behaviour_of(next).sends) walker.packets_per_second.out = 0;
-  if (!behaviour_of(next).receives) walker.packets_per_second.in = 0;
+  walker.tries = 0;
+  if (!behaviour.sends) walker.packets_per_second.out = 0;
+  if (!behaviour.receives) walker.packets_per_second.in = 0;
+  if (next == tcp::established) {
+    make_busy(state, walker);
+  } else {
+    const std::uint32_t trip = state.routes[walker.route].rtt / 1000 + 1;
+    const std::uint32_t lasts = behaviour.lasts ? behaviour.lasts : trip;
+    walker.due += lasts / 2 + state.random.below(lasts);
+  }
   const traffic segment{control_packet, 1};
   carry(state, walker, {segment, next == tcp::syn_sent ? traffic() : segment});
 }

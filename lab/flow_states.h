@@ -26,28 +26,24 @@ enum state : std::uint8_t {
 };
 }  // namespace tcp
 
+inline constexpr std::uint32_t control_packet = 60;  // bytes of a segment that carries no data
+
 struct tcp_behaviour {
   tcp::state remote;  // the other end's state
   bool sends;
   bool receives;
-  std::uint32_t lasts;  // milliseconds on average; 0: until the channel is closed
+  std::uint32_t lasts;  // milliseconds on average; 0: until the peer answers
   tcp::state next;
-  tcp::state instead;  // sometimes
-  std::uint32_t percent_instead;
 };
 const tcp_behaviour &behaviour_of(std::uint8_t state);
 
 // The states of a flow's ends.
 two_way<std::uint32_t> states_of(const flow &source);
 
-// Whether the ends have, or had, a connection.
-bool was_connected(const flow &source);
-
-// Enters a state: what no longer sends or receives falls silent, a connection that is established becomes
-// busy.
+// Enters a state, from which on it is known when to leave it. What no longer sends or receives falls silent.
 void enter(world &state, flow &walker, tcp::state next);
 
-// Gives a flow its rates.
+// Gives a flow that has data the rates of its next seconds, and measures its round trip.
 void make_busy(world &state, flow &moving);
 
 }  // namespace lab

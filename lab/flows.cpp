@@ -17,12 +17,10 @@ struct wish {
   std::uint8_t state;
 };
 
-// Every fourth flow of a new machine is one of these, so that there is one in each state.
+// Every fourth flow of a small machine that is new is one of these, so that there is one in each state.
 constexpr wish rare[] = {
-    {tcp_protocol, tcp::listening},
     {tcp_protocol, tcp::syn_sent},
     {tcp_protocol, tcp::time_wait},
-    {udp_protocol, 0},
     {tcp_protocol, tcp::close_wait},
     {tcp_protocol, tcp::fin_wait_1},
     {udp_protocol, 1},
@@ -33,19 +31,10 @@ constexpr wish rare[] = {
     {tcp_protocol, tcp::syn_received},
 };
 
-constexpr std::uint16_t first_ephemeral = 49152;
-constexpr std::uint32_t ephemeral_ports = 16384;
-
-constexpr address_kind route_kinds[] = {
-    address_kind::ipv4,        address_kind::global_ipv6, address_kind::ipv4,       address_kind::ipv4,
-    address_kind::global_ipv6, address_kind::ipv4,        address_kind::link_local, address_kind::ipv4,
-    address_kind::ipv4,        address_kind::global_ipv6,
-};
-
 bool fits(const service &offered, const wish &wanted) {
   if (offered.protocol != wanted.protocol) return false;
   if (offered.protocol == udp_protocol) return true;
-  if (wanted.state == tcp::listening || wanted.state == tcp::syn_received) return offered.inbound;
+  if (wanted.state == tcp::syn_received) return offered.inbound;
   return wanted.state != tcp::syn_sent || !offered.inbound;
 }
 
@@ -75,106 +64,129 @@ void take_advisory(flow_switch &carrier, flow &taker) {
   }
 }
 
-void connect(world &state, flow &made) {
+bool connect(world &state, flow &made, bool connected) {
   flow_switch &carrier = state.switches[state.channels[made.channel].flow_switch];
-  made.route = carrier.first_route + state.random.below(carrier.route_count);
+  made.route = choose_route(state, carrier, connected || made.use->inbound);
+  if (made.route == none) return false;
   route &way = state.routes[made.route];
   made.ipv6 = way.kind != address_kind::ipv4;
+  const bool exhausted = carrier.reserved == ephemeral_ports && made.use->protocol == tcp_protocol;
+  if (exhausted && !made.ipv6 && !made.use->inbound) return false;
   const auto ephemeral = static_cast<std::uint16_t>(first_ephemeral + way.used++ % ephemeral_ports);
   made.local_port = made.use->inbound ? made.use->port : ephemeral;
   made.remote_port = made.use->inbound ? ephemeral : made.use->port;
   ++way.flows;
   take_advisory(carrier, made);
-  made.controlled = state.random.chance(1, 10);
+  return true;
 }
 
 // A server has its known port, and then, as everyone else, ports of its own.
 void listen(world &state, flow &made) {
   const std::uint32_t before = state.channels[made.channel].listeners++;
   made.route = none;
+  made.due = never;
   made.ipv6 = state.random.chance(1, 2);
-  const bool known = made.use->inbound && before == 0;
+  const bool known = made.use->inbound && before < 2;
   made.local_port = known ? made.use->port : static_cast<std::uint16_t>(49'151 - before % 40'000);
 }
 
-flow &open_flow(world &state, std::uint32_t channel_index, const service &use, bool listening) {
+// The flow, which opened at some time within the latest milliseconds, or null where nobody can be reached.
+flow *open_flow(world &state, std::uint32_t channel_index, const service &use, const wish &wanted,
+                std::uint32_t within) {
   flow made{.id = state.random.identity(), .channel = channel_index, .use = &use, .advisory = none};
-  if (listening) {
+  made.due = state.elapsed - state.random.below(within);
+  made.state = wanted.protocol == tcp_protocol ? wanted.state : std::uint8_t{tcp::closed};
+  const bool is_tcp = wanted.protocol == tcp_protocol;
+  if (wanted.state == (is_tcp ? tcp::listening : 0)) {
     listen(state, made);
-  } else {
-    connect(state, made);
+  } else if (!connect(state, made, is_tcp ? wanted.state > tcp::syn_sent : wanted.state > 1)) {
+    return nullptr;
   }
+  // Most are short, and most of the time belongs to the long ones.
+  made.ends = made.due + state.random.between(1000, 2000) * (1U << state.random.below(10));
   state.flows.push_back(made);
-  return state.flows.back();
+  return &state.flows.back();
 }
 
-// What a flow has moved in the time before anyone looked.
+// What a flow has moved in the time before anyone looked: long ones are met more often than they are opened,
+// and go on for a while.
 void remember_past(world &state, flow &old) {
-  const std::uint32_t seconds = state.random.between(1, 1800);
   make_busy(state, old);
+  const std::uint32_t lasts = state.random.between(1, 1024);
+  const std::uint32_t seconds = lasts - lasts / 8 - state.random.below(lasts * 3 / 4 + 1);
+  old.ends = state.elapsed + (lasts - seconds) * std::uint64_t{1000} + state.random.below(1000);
   const std::uint64_t out = std::uint64_t{old.packets_per_second.out} * seconds + 2;
   const std::uint64_t in = std::uint64_t{old.packets_per_second.in} * seconds + 2;
   carry(state, old, {{out * old.use->packet_size.out, out}, {in * old.use->packet_size.in, in}});
 }
 
-void open_tcp(world &state, std::uint32_t channel_index, const service &use, tcp::state wanted) {
-  flow &made = open_flow(state, channel_index, use, wanted == tcp::listening);
-  made.state = wanted;
+void open_tcp(world &state, flow &made) {
+  const auto wanted = static_cast<tcp::state>(made.state);
+  auto &count = state.channels[made.channel].stack.count;
   if (wanted == tcp::listening) return;
-  if (was_connected(made)) remember_past(state, made);
-  enter(state, made, wanted);
-  stack_totals &stack = state.channels[channel_index].stack;
-  ++(use.inbound ? stack.accepted : stack.initiated);
-}
-
-void open_udp(world &state, std::uint32_t channel_index, const service &use, std::uint32_t packets) {
-  flow &made = open_flow(state, channel_index, use, packets == 0);
-  if (packets == 1) carry(state, made, {{use.packet_size.out, 1}, {}});
-  if (packets > 1) remember_past(state, made);
-}
-
-void open_wish(world &state, std::uint32_t channel_index, const service &use, const wish &wanted) {
-  if (use.protocol == tcp_protocol) {
-    open_tcp(state, channel_index, use, static_cast<tcp::state>(wanted.state));
-  } else {
-    open_udp(state, channel_index, use, wanted.state);
+  ++count[made.use->inbound ? stack::accepted : stack::initiated];
+  made.connected = wanted >= tcp::established || wanted == tcp::closed;
+  if (made.connected) {
+    ++count[stack::established];
+    remember_past(state, made);
+    made.due = state.elapsed;
   }
+  enter(state, made, wanted);
 }
 
-void make_routes(world &state, flow_switch &carrier, std::uint32_t count) {
-  const std::uint32_t ordinal = state.nexuses[carrier.nexus].ordinal;
-  carrier.first_route = static_cast<std::uint32_t>(state.routes.size());
-  carrier.route_count = count;
-  std::uint32_t of_kind[address_kinds] = {};
-  for (std::uint32_t i = 0; i < count; ++i) {
-    const address_kind kind = route_kinds[i % std::size(route_kinds)];
-    const bool on_link = kind == address_kind::link_local || i % 7 == 6;
-    const std::uint32_t number = of_kind[static_cast<int>(kind)]++;
-    const std::uint32_t rtt = on_link ? state.random.between(250, 1800) : state.random.between(6'000, 90'000);
-    state.routes.push_back({.flow_switch = static_cast<std::uint32_t>(&carrier - state.switches.data()),
-                            .kind = kind,
-                            .on_link = on_link,
-                            .remote = remote_address(state.random, ordinal, kind, number, on_link),
-                            .used = state.random.below(ephemeral_ports),
-                            .rtt = rtt});
+// False where nobody can be reached.
+bool open_wish(world &state, std::uint32_t channel_index, const service &use, const wish &wanted,
+               std::uint32_t within) {
+  flow *const made = open_flow(state, channel_index, use, wanted, within);
+  if (!made) return false;
+  if (use.protocol == tcp_protocol) {
+    open_tcp(state, *made);
+  } else if (wanted.state == 1) {
+    carry(state, *made, {{use.packet_size.out, 1}, {}});
+    made->due += state.random.below(600);
+  } else if (wanted.state > 1) {
+    remember_past(state, *made);
+  }
+  return true;
+}
+
+// Opens flow number `number` of a new machine on one of the channels, as if it had been there for some time.
+void open_old_flow(world &state, const std::vector<std::uint32_t> &open, std::uint64_t number) {
+  const std::uint32_t every = number < 60 ? 4 : 16;
+  const wish wanted = rare[number / every % std::size(rare)];
+  const service *use = nullptr;
+  std::uint32_t index = open[number % open.size()];
+  // The next channel whose program has such a service.
+  for (std::uint32_t ahead = 0; number % every == 3 && !use && ahead < flow_programs; ++ahead) {
+    index = open[(number + ahead) % open.size()];
+    use = fitting_service(state, index, wanted);
+  }
+  if (use) {
+    open_wish(state, index, *use, wanted, 1);
+  } else if ((use = any_service(state, index))) {
+    const bool is_tcp = use->protocol == tcp_protocol;
+    open_wish(state, index, *use, {use->protocol, is_tcp ? std::uint8_t{tcp::established} : std::uint8_t{2}},
+              1);
   }
 }
 
 }  // namespace
 
 void start_listening(world &state, std::uint32_t channel_index) {
-  if (state.size.flows == 0) return;
-  const wish wanted{tcp_protocol, tcp::listening};
-  const service *use = fitting_service(state, channel_index, wanted);
-  if (use) open_wish(state, channel_index, *use, wanted);
+  for (const service &offered : program_of(state, channel_index).services) {
+    const std::uint8_t waiting =
+        offered.protocol == tcp_protocol ? std::uint8_t{tcp::listening} : std::uint8_t{};
+    if (offered.inbound && state.flows.size() < state.size.flows)
+      open_wish(state, channel_index, offered, {offered.protocol, waiting}, 1);
+  }
 }
 
-void open_new_flow(world &state, std::uint32_t channel_index) {
+void open_new_flow(world &state, std::uint32_t channel_index, std::uint32_t within) {
   const service *use = any_service(state, channel_index);
   if (!use) return;
   const std::uint8_t first_tcp = use->inbound ? tcp::syn_received : tcp::syn_sent;
   const std::uint8_t first = use->protocol == tcp_protocol ? first_tcp : std::uint8_t{1};
-  open_wish(state, channel_index, *use, {use->protocol, first});
+  open_wish(state, channel_index, *use, {use->protocol, first}, within);
 }
 
 void open_flows(world &state) {
@@ -188,22 +200,11 @@ void open_flows(world &state) {
     make_routes(state, carrier,
                 static_cast<std::uint32_t>(std::clamp<std::size_t>(per_switch / 2, 10, 4096)));
   }
-  for (std::uint32_t i = 0; i < state.size.flows; ++i) {
-    const wish wanted = rare[i / 4 % std::size(rare)];
-    const service *use = nullptr;
-    std::uint32_t index = open[i % open.size()];
-    // The next channel whose program has such a service.
-    for (std::uint32_t ahead = 0; i % 4 == 3 && !use && ahead < flow_programs; ++ahead) {
-      index = open[(i + ahead) % open.size()];
-      use = fitting_service(state, index, wanted);
-    }
-    if (use) {
-      open_wish(state, index, *use, wanted);
-    } else if ((use = any_service(state, index))) {
-      const bool is_tcp = use->protocol == tcp_protocol;
-      open_wish(state, index, *use,
-                {use->protocol, is_tcp ? std::uint8_t{tcp::established} : std::uint8_t{2}});
-    }
+  for (const std::uint32_t index : open) start_listening(state, index);
+  // Some cannot be opened: whoever they are for may not answer.
+  const std::uint64_t attempts = std::uint64_t{2} * state.size.flows + 100;
+  for (std::uint64_t i = 0; i < attempts && state.flows.size() < state.size.flows; ++i) {
+    open_old_flow(state, open, i);
   }
 }
 

@@ -1,5 +1,7 @@
 // kern.tarvel.stats.userstack
 
+#include <algorithm>
+
 #include "common/tables/counters.h"
 #include "lab/counter_recipe.h"
 #include "lab/tables.h"
@@ -8,85 +10,110 @@ namespace lab {
 
 namespace {
 
-// Packets that left and arrived, bytes of them that are data, connections.
-enum source {
-  ip_tx,
-  ip_rx,
-  ip6_tx,
-  ip6_rx,
-  tx,
-  rx,
-  txd,
-  rxd,
-  udp_tx,
-  udp_rx,
-  init,
-  acpt,
-  done,
-  source_count
-};
+// Packets and bytes of data that left and arrived, what is left of those that left without those that were
+// sent again, and behind them what was counted, by stack::event.
+enum source { ip_tx, ip_rx, ip6_tx, ip6_rx, tx, rx, txd, rxd, fresh, freshd, udp_tx, udp_rx, sources_count };
+constexpr int first_event = sources_count;
 
-constexpr ingredient ip_ingredients[] = {
-    {"TotalRcvd", ip_rx, 1, 1},        {"Delivered", ip_rx, 1, 1},
-    {"Delivered", ip_rx, -1, 50'000},  {"FragRcvd", ip_rx, 2, 50'000},
-    {"Reassembled", ip_rx, 1, 50'000}, {"LocalOut", ip_tx, 1, 1},
-    {"NoRoute", ip_tx, 1, 250'000},    {"RxChn", ip_rx, 1, 1},
-    {"RxChnColl", ip_rx, 1, 14},       {"RxChnGT2", ip_rx, 1, 8},
-    {"RxChnGT4", ip_rx, 1, 30},        {"IPInPkt", ip_rx, 1, 1},
-};
+constexpr known_counter ip_known[] = {
+    {"TotalRcvd", ip_rx}, {"Delivered", ip_rx}, {"LocalOut", ip_tx}, {"RxChn", ip_rx}, {"IPInPkt", ip_rx}};
 
-constexpr ingredient ip6_ingredients[] = {
-    {"TotalRcvd", ip6_rx, 1, 1},     {"Delivered", ip6_rx, 1, 1},        {"Delivered", ip6_rx, -1, 90'000},
-    {"FrafRcvd", ip6_rx, 2, 90'000}, {"Reassembled", ip6_rx, 1, 90'000}, {"LocalOut", ip6_tx, 1, 1},
-    {"NoRoute", ip6_tx, 1, 350'000}, {"Fwd$Hit", ip6_tx, 1, 1},          {"Fwd$Hit", ip6_tx, -1, 400},
-    {"Fwd$Miss", ip6_tx, 1, 400},
-};
+constexpr derived_counter ip_derived[] = {
+    {"Reassembled", "Delivered", 50'000, true}, {"FragRcvd", "Reassembled", 2, false},
+    {"FragRcvd", "Reassembled", 2, false},      {"NoRoute", "LocalOut", 250'000, false},
+    {"RxChnColl", "RxChn", 14, false},          {"RxChnGT2", "RxChn", 8, false},
+    {"RxChnGT4", "RxChnGT2", 4, false}};
 
-constexpr ingredient tcp_ingredients[] = {
-    {"ConnInit", init, 1, 1},       {"ConnAcpt", acpt, 1, 1},       {"ConnEst", init, 1, 1},
-    {"ConnEst", init, -1, 25},      {"ConnEst", acpt, 1, 1},        {"ConnDrop", init, 1, 25},
-    {"ConnClosed", done, 1, 1},     {"SndTotalPkt", tx, 1, 1},      {"SndTotalDP", tx, 1, 1},
-    {"SndTotalDP", tx, -1, 3},      {"SndAck", tx, 1, 3},           {"SndAck", tx, -1, 30},
-    {"SndWinUpd", tx, 1, 30},       {"SndWinUpd", tx, -1, 300},     {"SndDPktReXmt", tx, 1, 300},
-    {"SndDPktReXmt", tx, -1, 3000}, {"SndCtlPkt", tx, 1, 3000},     {"SndDataByte", txd, 1, 1},
-    {"SndDataByte", txd, -1, 300},  {"SndDByteReXmt", txd, 1, 300}, {"RcvTotalPkt", rx, 1, 1},
-    {"RcvPktInSeq", rx, 1, 1},      {"RcvPktInSeq", rx, -1, 4},     {"RcvAckPkt", rx, 1, 4},
-    {"RcvAckPkt", rx, -1, 400},     {"RcvDupPkt", rx, 1, 400},      {"RcvDupPkt", rx, -1, 800},
-    {"RcvOOPkt", rx, 1, 800},       {"RcvBInSeq", rxd, 1, 1},       {"RcvBInSeq", rxd, -1, 400},
-    {"RcvDupByte", rxd, 1, 400},    {"RcvDupByte", rxd, -1, 800},   {"RcvOOByte", rxd, 1, 800},
-    {"RcvAckByte", txd, 1, 1},      {"RcvAckByte", txd, -1, 300},   {"RcvDupAck", rx, 1, 120},
-    {"RcvWinUpdPkt", rx, 1, 80},    {"PredAck", rx, 1, 5},          {"PredData", rx, 1, 2},
-    {"Pcb$Miss", rx, 1, 70},        {"RTTTimed", tx, 1, 6},         {"RTTUpdated", tx, 1, 6},
-    {"DelayAck", rx, 1, 9},         {"ReXmtTO", tx, 1, 4000},       {"KATO", done, 1, 5},
-    {"KAProbe", done, 1, 5},        {"RTT$Upd", done, 1, 2},        {"RTTVar$Upd", done, 1, 2},
-    {"RTTUsed", init, 1, 3},        {"RTTVarUsed", init, 1, 3},     {"SCAdded", acpt, 1, 1},
-    {"SCCompl", acpt, 1, 1},        {"SACKRecEpi", tx, 1, 2600},    {"SACKReXmt", tx, 1, 1400},
-    {"SACKReXmtB", txd, 1, 1400},   {"SACKRcvBlk", rx, 1, 900},     {"SACKSntBlk", rx, 1, 700},
-    {"CoalPkt", rx, 1, 7},          {"LRO2Pkt", rx, 1, 22},         {"LROMultiPkt", rx, 1, 12},
-    {"TailLossTRO", tx, 1, 5000},   {"ReOrdPkt", rx, 1, 1100},      {"RecoveryPkt", tx, 1, 1800},
-    {"ProbTO", tx, 1, 2400},        {"ECNCliSetup", init, 1, 1},    {"ECNNegoSucc", init, 1, 3},
-    {"ECNSvrNoSupt", init, 2, 3},   {"TmrDriftLE1Ms", tx, 1, 15},   {"TmrDriftLE10Ms", tx, 1, 90},
-    {"TmrDriftLE20Ms", tx, 1, 800},
-};
+constexpr known_counter ip6_known[] = {
+    {"TotalRcvd", ip6_rx}, {"Delivered", ip6_rx}, {"LocalOut", ip6_tx}, {"Fwd$Hit", ip6_tx}};
 
-constexpr ingredient udp_ingredients[] = {
-    {"InPkt", udp_rx, 1, 1},         {"NoPort", udp_rx, 1, 9000}, {"FullSock", udp_rx, 1, 120'000},
-    {"PCBCacheMiss", udp_rx, 1, 25}, {"OutPkt", udp_tx, 1, 1},    {"FastOut", udp_tx, 1, 1},
-    {"FastOut", udp_tx, -1, 40},     {"NoCsum", udp_rx, 1, 60},
-};
+constexpr derived_counter ip6_derived[] = {{"Reassembled", "Delivered", 90'000, true},
+                                           {"FrafRcvd", "Reassembled", 2, false},
+                                           {"FrafRcvd", "Reassembled", 2, false},
+                                           {"NoRoute", "LocalOut", 350'000, false},
+                                           {"Fwd$Miss", "Fwd$Hit", 400, true}};
+
+constexpr known_counter tcp_known[] = {{"ConnInit", first_event + stack::initiated},
+                                       {"ConnAcpt", first_event + stack::accepted},
+                                       {"ConnEst", first_event + stack::established},
+                                       {"EConnDrop", first_event + stack::refused},
+                                       {"DropTO", first_event + stack::timed_out},
+                                       {"ConnDrop", first_event + stack::timed_out},
+                                       {"ConnClosed", first_event + stack::closed},
+                                       {"SndTotalPkt", tx},
+                                       {"SndTotalDP", fresh},
+                                       {"SndDataByte", freshd},
+                                       {"SndDPktReXmt", first_event + stack::resent},
+                                       {"SndDByteReXmt", first_event + stack::resent_bytes},
+                                       {"ReXmtTO", first_event + stack::timeouts},
+                                       {"RcvTotalPkt", rx},
+                                       {"RcvPktInSeq", rx},
+                                       {"RcvBInSeq", rxd},
+                                       {"RcvAckByte", freshd},
+                                       {"SCAdded", first_event + stack::accepted},
+                                       {"SCCompl", first_event + stack::accepted},
+                                       {"ECNCliSetup", first_event + stack::initiated}};
+
+constexpr derived_counter tcp_derived[] = {{"SndAck", "SndTotalDP", 3, true},
+                                           {"SndWinUpd", "SndAck", 10, true},
+                                           {"SndCtlPkt", "SndWinUpd", 100, true},
+                                           {"RcvAckPkt", "RcvPktInSeq", 4, true},
+                                           {"RcvDupPkt", "RcvAckPkt", 100, true},
+                                           {"RcvOOPkt", "RcvDupPkt", 2, true},
+                                           {"RcvDupByte", "RcvBInSeq", 400, true},
+                                           {"RcvOOByte", "RcvDupByte", 2, true},
+                                           {"RcvDupAck", "RcvAckPkt", 30, false},
+                                           {"RcvWinUpdPkt", "RcvAckPkt", 20, false},
+                                           {"PredAck", "RcvTotalPkt", 5, false},
+                                           {"PredData", "RcvTotalPkt", 2, false},
+                                           {"Pcb$Miss", "RcvTotalPkt", 70, false},
+                                           {"RTTTimed", "SndTotalPkt", 6, false},
+                                           {"RTTUpdated", "SndTotalPkt", 6, false},
+                                           {"DelayAck", "RcvTotalPkt", 9, false},
+                                           {"KAProbe", "ConnClosed", 5, false},
+                                           {"KATO", "KAProbe", 2, false},
+                                           {"RTT$Upd", "ConnClosed", 2, false},
+                                           {"RTTVar$Upd", "ConnClosed", 2, false},
+                                           {"RTTUsed", "ConnInit", 3, false},
+                                           {"RTTVarUsed", "ConnInit", 3, false},
+                                           {"SACKRecEpi", "SndDPktReXmt", 9, false},
+                                           {"SACKReXmt", "SndDPktReXmt", 5, false},
+                                           {"SACKReXmtB", "SndDByteReXmt", 5, false},
+                                           {"SACKRcvBlk", "RcvTotalPkt", 900, false},
+                                           {"SACKSntBlk", "RcvTotalPkt", 700, false},
+                                           {"CoalPkt", "RcvTotalPkt", 7, false},
+                                           {"LRO2Pkt", "CoalPkt", 3, false},
+                                           {"LROMultiPkt", "CoalPkt", 2, false},
+                                           {"TailLossTRO", "SndDPktReXmt", 16, false},
+                                           {"ReOrdPkt", "RcvOOPkt", 2, false},
+                                           {"RecoveryPkt", "SndDPktReXmt", 6, false},
+                                           {"ProbTO", "SndDPktReXmt", 8, false},
+                                           {"ECNNegoSucc", "ECNCliSetup", 3, false},
+                                           {"ECNSvrNoSupt", "ECNCliSetup", 2, false},
+                                           {"TmrDriftLE1Ms", "SndTotalPkt", 15, false},
+                                           {"TmrDriftLE10Ms", "SndTotalPkt", 90, false},
+                                           {"TmrDriftLE20Ms", "SndTotalPkt", 800, false}};
+
+constexpr known_counter udp_known[] = {{"InPkt", udp_rx},
+                                       {"NoPort", first_event + stack::no_port},
+                                       {"FullSock", first_event + stack::full_socket},
+                                       {"OutPkt", udp_tx},
+                                       {"FastOut", udp_tx}};
+
+constexpr derived_counter udp_derived[] = {{"PCBCacheMiss", "InPkt", 25, false},
+                                           {"NoCsum", "InPkt", 60, false}};
 
 std::uint64_t data_of(const traffic &moved) {
-  constexpr std::uint64_t headers = 52;  // of a segment with the usual options
-  return moved.bytes - std::min(moved.bytes, headers * moved.packets);
+  return moved.bytes - std::min(moved.bytes, segment_headers * moved.packets);
 }
 
 void put_stack(const nexus &carrier, std::int32_t pid, const stack_totals &seen, table_file &file) {
-  static const counter_recipe ip(ip_counter_names, ip_ingredients);
-  static const counter_recipe ip6(ip6_counter_names, ip6_ingredients);
-  static const counter_recipe tcp(tcp_counter_names, tcp_ingredients);
-  static const counter_recipe udp(udp_counter_names, udp_ingredients);
+  static const counter_recipe ip(ip_counter_names, ip_known, ip_derived);
+  static const counter_recipe ip6(ip6_counter_names, ip6_known, ip6_derived);
+  static const counter_recipe tcp(tcp_counter_names, tcp_known, tcp_derived);
+  static const counter_recipe udp(udp_counter_names, udp_known, udp_derived);
 
-  std::uint64_t sources[source_count] = {};
+  std::uint64_t sources[first_event + stack::events] = {};
   for (int ipv6 = 0; ipv6 < 2; ++ipv6) {
     const auto &[by_tcp, by_udp] = seen.moved[ipv6];
     sources[ipv6 ? ip6_tx : ip_tx] = by_tcp.out.packets + by_udp.out.packets;
@@ -98,18 +125,19 @@ void put_stack(const nexus &carrier, std::int32_t pid, const stack_totals &seen,
     sources[udp_tx] += by_udp.out.packets;
     sources[udp_rx] += by_udp.in.packets;
   }
-  sources[init] = seen.initiated;
-  sources[acpt] = seen.accepted;
-  sources[done] = seen.closed;
+  sources[fresh] = sources[tx] - seen.count[stack::resent];
+  sources[freshd] = sources[txd] - seen.count[stack::resent_bytes];
+  std::ranges::copy(seen.count, sources + first_event);
 
   tv_stats_userstack record{};
   record.nx_uuid = carrier.id;
   set_text(record.if_name, interface_name(carrier.kind, carrier.ordinal));
   record.pid = pid;
-  ip.fill(record.ip, sources);
-  ip6.fill(record.ip6, sources);
-  tcp.fill(record.tcp, sources);
-  udp.fill(record.udp, sources);
+  const std::uint64_t key = key_of(carrier.id) + static_cast<std::uint64_t>(pid) * 1000;
+  ip.fill(record.ip, sources, key);
+  ip6.fill(record.ip6, sources, key + 100);
+  tcp.fill(record.tcp, sources, key + 200);
+  udp.fill(record.udp, sources, key + 300);
   file.put(record);
 }
 
