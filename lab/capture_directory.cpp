@@ -18,6 +18,7 @@
 #include "common/text/output.h"
 #include "common/text/text.h"
 #include "lab/table_file.h"
+#include "platform/sysctl.h"
 
 namespace lab {
 
@@ -134,6 +135,19 @@ std::string given_root() {
   return given ? given : "";
 }
 
+// What the kernel in sight calls its machine; the name of this one where that kernel does not say.
+std::string host_name() {
+  utsname machine{};
+  uname(&machine);
+  char name[sizeof machine.nodename + 1];
+  std::size_t length = sizeof name;
+  std::string host = machine.nodename;
+  if (sysctlbyname("kernel.hostname", name, &length, nullptr, 0) == 0) host.assign(name, length);
+  if (host.ends_with('\n')) host.pop_back();
+  std::ranges::replace(host, '\n', '?');
+  return host;
+}
+
 std::string name_of(std::int64_t offset) {
   char name[32];
   std::snprintf(name, sizeof name, "%lld.%03lld", static_cast<long long>(offset / 1000),
@@ -158,10 +172,7 @@ bool write_note(const own_directory &top, time_t taken, bool redacted) {
   tm utc;
   char time[32];
   strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", gmtime_r(&taken, &utc));
-  utsname machine{};
-  uname(&machine);
-  std::string host = redacted ? "redacted" : machine.nodename;
-  std::ranges::replace(host, '\n', '?');
+  const std::string host = redacted ? "redacted" : host_name();
   const std::string text = "format: " + std::string(format_version) + "\ntime: " + time + "\nhost: " + host +
                            "\nredacted: " + (redacted ? "yes" : "no") + "\n";
   table_file file(top.enter("."), note_name);

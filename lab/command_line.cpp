@@ -1,16 +1,20 @@
 #include "lab/command_line.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
+#include <cstdlib>
 #include <string_view>
 
 #include "common/text/output.h"
+#include "lab/incidents.h"
 
 namespace lab {
 
 namespace {
 
 constexpr std::uint32_t most_records = 10'000'000;
+constexpr std::uint32_t longest = 86'400'000;  // milliseconds
 
 struct number_option {
   std::string_view name;
@@ -39,7 +43,7 @@ struct command {
   const char *purpose;
   int (*handler)(const options &);
   bool needs_directory = false;
-  bool makes_world = false;  // takes sizes and a seed
+  bool makes_world = false;  // takes sizes, a seed, incidents and a name
   bool moves_world = false;  // takes an interval
   bool runs_command = false;
   bool captures = false;  // takes the times of moments and a wish to redact
@@ -47,20 +51,21 @@ struct command {
 
 constexpr command commands[] = {
     {.name = "generate",
-     .synopsis = "DIR [sizes] [--seed N]",
+     .synopsis = "DIR [sizes] [--seed N] [--host NAME] [--incident NAME[@SECONDS]]... [--after SECONDS]",
      .purpose = "make one snapshot",
      .handler = generate,
      .needs_directory = true,
      .makes_world = true},
     {.name = "simulate",
-     .synopsis = "DIR [sizes] [--seed N] [--interval MS]",
+     .synopsis = "DIR [sizes] [--seed N] [--host NAME] [--incident NAME[@SECONDS]]... [--interval MS]",
      .purpose = "make one and keep it moving until interrupted",
      .handler = simulate,
      .needs_directory = true,
      .makes_world = true,
      .moves_world = true},
     {.name = "run",
-     .synopsis = "[DIR | [sizes] [--seed N] [--interval MS]] -- COMMAND...",
+     .synopsis = "[DIR | [sizes] [--seed N] [--host NAME] [--incident NAME[@SECONDS]]... [--interval MS]] -- "
+                 "COMMAND...",
      .purpose = "run COMMAND on DIR, or on a simulation of its own",
      .handler = run,
      .makes_world = true,
@@ -104,10 +109,49 @@ bool parse_seconds(const char *text, std::uint32_t least, std::uint32_t most, st
   return true;
 }
 
+// NAME or NAME@SECONDS.
+bool take_incident(const char *text, options &asked) {
+  const std::string_view word = text ? text : "";
+  const std::size_t end = word.find('@');
+  const auto known = std::ranges::find(incidents, word.substr(0, end), &incident::name);
+  std::uint32_t begins = 0;
+  if (known == incidents.end()) return false;
+  if (end != word.npos && !parse_seconds(text + end + 1, 0, longest, begins)) return false;
+  asked.incidents.push_back({&*known, begins});
+  return true;
+}
+
+// A name that stands in one line, as a kernel has it.
+bool take_host(const char *text, options &asked) {
+  constexpr std::size_t most = 64;
+  asked.host = text ? text : "";
+  const auto is_text = [](char c) { return c > ' ' && c < 0x7f; };
+  return !asked.host.empty() && asked.host.size() <= most && std::ranges::all_of(asked.host, is_text);
+}
+
+bool take_after(const char *text, options &asked) {
+  return parse_seconds(text, 0, longest, asked.after);
+}
+
+// Whether the words are a wish to know which incidents there are.
+bool wants_incidents(char **argument) {
+  const std::string_view option = "--incident";
+  return argument[0] && argument[1] && argument[0] == option && argument[1] == std::string_view("list");
+}
+
+int list_incidents() {
+  for (const incident &row : incidents) print<"%-16s %s\n">(row.name, row.story);
+  report.flush();
+  return EXIT_SUCCESS;
+}
+
 // Takes one option with its value. False where the command does not know it or the value is no such number.
 bool take_option(const command &row, std::string_view name, const char *value, options &asked) {
   if (name == "--seed")
     return row.makes_world && parse_number<std::uint64_t>(value, 0, UINT64_MAX, asked.seed);
+  if (name == "--incident") return row.makes_world && take_incident(value, asked);
+  if (name == "--host") return row.makes_world && take_host(value, asked);
+  if (name == "--after") return row.handler == generate && take_after(value, asked);
   if (name == "--every") return row.captures && parse_seconds(value, 10, 3'600'000, asked.every);
   if (name == "--count") return row.captures && parse_number(value, 1U, most_records, asked.count);
   for (const number_option &known : number_options) {
@@ -150,6 +194,7 @@ int run_command_line(int argc, char **argv) {
   if (argc < 2) return usage();
   for (const command &row : commands) {
     options asked;
+    if (row.name == argv[1] && row.makes_world && wants_incidents(argv + 2)) return list_incidents();
     if (row.name == argv[1]) return parse(row, argv + 2, asked) ? row.handler(asked) : usage();
   }
   return usage();

@@ -14,6 +14,7 @@ std::size_t position_of(const counter_name *names, std::string_view counter) {
 
 // One in `per` of a counter that never falls: never falls, and never rises by more than the counter does.
 std::uint64_t part_of(std::uint64_t counter, std::uint32_t per, std::uint64_t key) {
+  if (per == 1) return counter;
   // Half of each block has more of it, by up to a half, and the other half less.
   constexpr std::uint64_t half = 4096;
   const std::uint64_t rest = counter % (2 * half);
@@ -27,25 +28,23 @@ std::uint64_t part_of(std::uint64_t counter, std::uint32_t per, std::uint64_t ke
 
 }  // namespace
 
-counter_recipe::counter_recipe(const counter_name *names, std::span<const known_counter> known,
-                               std::span<const derived_counter> derived)
-    : derived_(derived) {
-  for (const known_counter &row : known) {
-    known_.push_back({position_of(names, row.counter), static_cast<std::size_t>(row.source)});
+counter_recipe::counter_recipe(const counter_name *names, std::span<const ingredient> ingredients,
+                               std::span<const part> parts) {
+  for (const auto &[counter, source, per] : ingredients) {
+    ingredients_.push_back({position_of(names, counter), static_cast<std::size_t>(source), per});
   }
-  for (const derived_counter &row : derived) {
-    steps_.push_back({position_of(names, row.counter), position_of(names, row.from)});
+  for (const auto &[counter, from, per] : parts) {
+    parts_.push_back({position_of(names, counter), position_of(names, from), per});
   }
 }
 
 void counter_recipe::fill(std::span<std::uint64_t> counters, std::span<const std::uint64_t> sources,
                           std::uint64_t key) const {
-  for (const step &next : known_) counters[next.to] += sources[next.from];
-  for (std::size_t i = 0; i < steps_.size(); ++i) {
-    const auto &[to, from] = steps_[i];
-    const std::uint64_t part = part_of(counters[from], derived_[i].per, key + i);
-    counters[to] += part;
-    if (derived_[i].moved) counters[from] -= part;
+  for (const step &next : ingredients_) counters[next.to] += part_of(sources[next.from], next.per, ++key);
+  for (const step &next : parts_) {
+    const std::uint64_t taken = part_of(counters[next.from], next.per, ++key);
+    counters[next.to] += taken;
+    counters[next.from] -= taken;
   }
 }
 

@@ -14,39 +14,39 @@
 
 namespace lab {
 
-// A counter that the world keeps itself. One that has several is their sum.
-struct known_counter {
+// Adds a source, or about one in `per` of it, to the counter of this name. A counter may have several.
+struct ingredient {
   std::string_view counter;
   int source;
+  std::uint32_t per;
 };
 
-// About one in `per` of another counter, 2 at least, counts here, too; or, where it is `moved`, only here.
-// The counter it is taken from must be complete in the rows above: so none ever falls.
-struct derived_counter {
+// Takes about one in `per`, 2 at least, of what a counter has got and gives it to another one.
+struct part {
   std::string_view counter;
   std::string_view from;
   std::uint32_t per;
-  bool moved;
 };
 
 class counter_recipe {
  public:
   // `names` ends with an empty one; all counters are among them.
-  counter_recipe(const counter_name *names, std::span<const known_counter> known,
-                 std::span<const derived_counter> derived);
+  counter_recipe(const counter_name *names, std::span<const ingredient> ingredients,
+                 std::span<const part> parts);
 
-  // Sets the counters by the values of the sources. `key` decides on the proportions.
+  // Sets the counters by the values of the sources. `key` decides on the proportions. None falls as long as
+  // no source does.
   void fill(std::span<std::uint64_t> counters, std::span<const std::uint64_t> sources,
             std::uint64_t key) const;
 
  private:
   struct step {
     std::size_t to;
-    std::size_t from;
+    std::size_t from;  // a source, or another counter
+    std::uint32_t per;
   };
-  std::span<const derived_counter> derived_;
-  std::vector<step> known_;  // from a source
-  std::vector<step> steps_;  // from a counter
+  std::vector<step> ingredients_;
+  std::vector<step> parts_;
 };
 
 }  // namespace lab

@@ -11,32 +11,9 @@ namespace lab {
 
 namespace {
 
-// A flow that someone wants to see: a TCP state, or how many packets a datagram flow has sent.
-struct wish {
-  std::uint8_t protocol;
-  std::uint8_t state;
-};
-
-// Every fourth flow of a small machine that is new is one of these, so that there is one in each state.
-constexpr wish rare[] = {
-    {tcp_protocol, tcp::syn_sent},
-    {tcp_protocol, tcp::time_wait},
-    {tcp_protocol, tcp::close_wait},
-    {tcp_protocol, tcp::fin_wait_1},
-    {udp_protocol, 1},
-    {tcp_protocol, tcp::closing},
-    {tcp_protocol, tcp::last_ack},
-    {tcp_protocol, tcp::fin_wait_2},
-    {tcp_protocol, tcp::closed},
-    {tcp_protocol, tcp::syn_received},
-};
-
-bool fits(const service &offered, const wish &wanted) {
-  if (offered.protocol != wanted.protocol) return false;
-  if (offered.protocol == udp_protocol) return true;
-  if (wanted.state == tcp::syn_received) return offered.inbound;
-  return wanted.state != tcp::syn_sent || !offered.inbound;
-}
+// Some flows of a new machine are in one of these, so that there is one in each state.
+constexpr tcp::state rare[] = {tcp::syn_sent, tcp::time_wait, tcp::close_wait, tcp::fin_wait_1,
+                               tcp::closing,  tcp::last_ack,  tcp::fin_wait_2, tcp::closed};
 
 const program &program_of(const world &state, std::uint32_t channel_index) {
   return programs[state.processes[state.channels[channel_index].process].program];
@@ -48,11 +25,10 @@ const service *any_service(world &state, std::uint32_t channel_index) {
                           : &services[state.random.below(static_cast<std::uint32_t>(services.size()))];
 }
 
-const service *fitting_service(const world &state, std::uint32_t channel_index, const wish &wanted) {
-  for (const service &offered : program_of(state, channel_index).services) {
-    if (fits(offered, wanted)) return &offered;
-  }
-  return nullptr;
+// The state of a flow when it opens. What has no states has the number of packets that it has sent instead.
+std::uint8_t first_state(const service &use) {
+  if (use.protocol == udp_protocol) return 1;
+  return use.inbound ? tcp::syn_received : tcp::syn_sent;
 }
 
 void take_advisory(flow_switch &carrier, flow &taker) {
@@ -71,7 +47,11 @@ bool connect(world &state, flow &made, bool connected) {
   route &way = state.routes[made.route];
   made.ipv6 = way.kind != address_kind::ipv4;
   const bool exhausted = carrier.reserved == ephemeral_ports && made.use->protocol == tcp_protocol;
-  if (exhausted && !made.ipv6 && !made.use->inbound) return false;
+  if (exhausted && !made.ipv6 && !made.use->inbound) {
+    auto &count = state.channels[made.channel].stack.count;
+    for (const stack::event each : {stack::initiated, stack::refused, stack::closed}) ++count[each];
+    return false;
+  }
   const auto ephemeral = static_cast<std::uint16_t>(first_ephemeral + way.used++ % ephemeral_ports);
   made.local_port = made.use->inbound ? made.use->port : ephemeral;
   made.remote_port = made.use->inbound ? ephemeral : made.use->port;
@@ -91,15 +71,15 @@ void listen(world &state, flow &made) {
 }
 
 // The flow, which opened at some time within the latest milliseconds, or null where nobody can be reached.
-flow *open_flow(world &state, std::uint32_t channel_index, const service &use, const wish &wanted,
+flow *open_flow(world &state, std::uint32_t channel_index, const service &use, std::uint8_t wanted,
                 std::uint32_t within) {
   flow made{.id = state.random.identity(), .channel = channel_index, .use = &use, .advisory = none};
   made.due = state.elapsed - state.random.below(within);
-  made.state = wanted.protocol == tcp_protocol ? wanted.state : std::uint8_t{tcp::closed};
-  const bool is_tcp = wanted.protocol == tcp_protocol;
-  if (wanted.state == (is_tcp ? tcp::listening : 0)) {
+  const bool is_tcp = use.protocol == tcp_protocol;
+  if (is_tcp) made.state = wanted;
+  if (wanted == (is_tcp ? int{tcp::listening} : 0)) {
     listen(state, made);
-  } else if (!connect(state, made, is_tcp ? wanted.state > tcp::syn_sent : wanted.state > 1)) {
+  } else if (!connect(state, made, wanted != first_state(use))) {
     return nullptr;
   }
   // Most are short, and most of the time belongs to the long ones.
@@ -134,59 +114,45 @@ void open_tcp(world &state, flow &made) {
   enter(state, made, wanted);
 }
 
-// False where nobody can be reached.
-bool open_wish(world &state, std::uint32_t channel_index, const service &use, const wish &wanted,
-               std::uint32_t within) {
+void open_in(world &state, std::uint32_t channel_index, const service &use, std::uint8_t wanted,
+             std::uint32_t within) {
   flow *const made = open_flow(state, channel_index, use, wanted, within);
-  if (!made) return false;
+  if (!made) return;
   if (use.protocol == tcp_protocol) {
     open_tcp(state, *made);
-  } else if (wanted.state == 1) {
+  } else if (wanted == 1) {
     carry(state, *made, {{use.packet_size.out, 1}, {}});
     made->due += state.random.below(600);
-  } else if (wanted.state > 1) {
+  } else if (wanted > 1) {
     remember_past(state, *made);
   }
-  return true;
 }
 
-// Opens flow number `number` of a new machine on one of the channels, as if it had been there for some time.
-void open_old_flow(world &state, const std::vector<std::uint32_t> &open, std::uint64_t number) {
-  const std::uint32_t every = number < 60 ? 4 : 16;
-  const wish wanted = rare[number / every % std::size(rare)];
-  const service *use = nullptr;
-  std::uint32_t index = open[number % open.size()];
-  // The next channel whose program has such a service.
-  for (std::uint32_t ahead = 0; number % every == 3 && !use && ahead < flow_programs; ++ahead) {
-    index = open[(number + ahead) % open.size()];
-    use = fitting_service(state, index, wanted);
-  }
-  if (use) {
-    open_wish(state, index, *use, wanted, 1);
-  } else if ((use = any_service(state, index))) {
-    const bool is_tcp = use->protocol == tcp_protocol;
-    open_wish(state, index, *use, {use->protocol, is_tcp ? std::uint8_t{tcp::established} : std::uint8_t{2}},
-              1);
-  }
+// Opens a flow as if it had been there for some time: every fourth, or of many every sixteenth, in a rare
+// state.
+void open_old_flow(world &state, std::uint32_t channel_index, std::uint64_t number, std::size_t &rare_ones) {
+  const service *use = any_service(state, channel_index);
+  if (!use) return;
+  const bool is_tcp = use->protocol == tcp_protocol;
+  std::uint8_t wanted = is_tcp ? std::uint8_t{tcp::established} : std::uint8_t{2};
+  if (number % (number < 60 ? 4 : 16) == 3)
+    wanted = is_tcp ? rare[rare_ones++ % std::size(rare)] : std::uint8_t{1};
+  open_in(state, channel_index, *use, wanted == tcp::syn_sent ? first_state(*use) : wanted, 1);
 }
 
 }  // namespace
 
 void start_listening(world &state, std::uint32_t channel_index) {
   for (const service &offered : program_of(state, channel_index).services) {
-    const std::uint8_t waiting =
-        offered.protocol == tcp_protocol ? std::uint8_t{tcp::listening} : std::uint8_t{};
-    if (offered.inbound && state.flows.size() < state.size.flows)
-      open_wish(state, channel_index, offered, {offered.protocol, waiting}, 1);
+    const std::uint8_t waiting = offered.protocol == tcp_protocol ? tcp::listening : tcp::closed;
+    const bool fits = offered.inbound && state.flows.size() < state.size.flows;
+    if (fits) open_in(state, channel_index, offered, waiting, 1);
   }
 }
 
 void open_new_flow(world &state, std::uint32_t channel_index, std::uint32_t within) {
   const service *use = any_service(state, channel_index);
-  if (!use) return;
-  const std::uint8_t first_tcp = use->inbound ? tcp::syn_received : tcp::syn_sent;
-  const std::uint8_t first = use->protocol == tcp_protocol ? first_tcp : std::uint8_t{1};
-  open_wish(state, channel_index, *use, {use->protocol, first}, within);
+  if (use) open_in(state, channel_index, *use, first_state(*use), within);
 }
 
 void open_flows(world &state) {
@@ -197,14 +163,14 @@ void open_flows(world &state) {
   if (open.empty() || state.size.flows == 0) return;
   const std::size_t per_switch = state.size.flows / state.switches.size();
   for (flow_switch &carrier : state.switches) {
-    make_routes(state, carrier,
-                static_cast<std::uint32_t>(std::clamp<std::size_t>(per_switch / 2, 10, 4096)));
+    make_routes(state, carrier, static_cast<std::uint32_t>(std::clamp<std::size_t>(per_switch, 10, 4096)));
   }
   for (const std::uint32_t index : open) start_listening(state, index);
   // Some cannot be opened: whoever they are for may not answer.
   const std::uint64_t attempts = std::uint64_t{2} * state.size.flows + 100;
+  std::size_t rare_ones = 0;
   for (std::uint64_t i = 0; i < attempts && state.flows.size() < state.size.flows; ++i) {
-    open_old_flow(state, open, i);
+    open_old_flow(state, open[i % open.size()], i, rare_ones);
   }
 }
 

@@ -43,7 +43,7 @@ std::uint32_t choose_route(world &state, flow_switch &carrier, bool connected) {
   if (!connected && carrier.dead_route != none && state.random.chance(1, 2)) return carrier.dead_route;
   const std::uint32_t index = carrier.first_route + state.random.below(carrier.route_count);
   route &way = state.routes[index];
-  if (way.flows == 0 && index != carrier.dead_route && state.random.chance(1, 2)) {
+  if (way.flows == 0 && index != carrier.dead_route && state.random.chance(3, 4)) {
     meet_someone(state, carrier, way);
   }
   return connected && !way.answers ? none : index;

@@ -10,112 +10,81 @@ namespace lab {
 
 namespace {
 
-// Packets and bytes of data that left and arrived, what is left of those that left without those that were
-// sent again, and behind them what was counted, by stack::event.
-enum source { ip_tx, ip_rx, ip6_tx, ip6_rx, tx, rx, txd, rxd, fresh, freshd, udp_tx, udp_rx, sources_count };
-constexpr int first_event = sources_count;
+// Packets and bytes of data that left and arrived, those that left for the first time, and what was counted,
+// in the order of stack::event.
+enum moved { ip_tx, ip_rx, ip6_tx, ip6_rx, tx, rx, txd, rxd, fresh, freshd, udp_tx, udp_rx, moved_count };
+enum seen {
+  init = moved_count,
+  acpt,
+  est,
+  failed,
+  late,
+  done,
+  again,
+  againd,
+  rto,
+  stray,
+  full,
+  source_count
+};
+static_assert(source_count == init + int{stack::events});
 
-constexpr known_counter ip_known[] = {
-    {"TotalRcvd", ip_rx}, {"Delivered", ip_rx}, {"LocalOut", ip_tx}, {"RxChn", ip_rx}, {"IPInPkt", ip_rx}};
+constexpr ingredient ip_ingredients[] = {
+    {"TotalRcvd", ip_rx, 1},     {"Delivered", ip_rx, 1}, {"FragRcvd", ip_rx, 25'000}, {"LocalOut", ip_tx, 1},
+    {"NoRoute", ip_tx, 250'000}, {"RxChn", ip_rx, 1},     {"RxChnColl", ip_rx, 14},    {"RxChnGT2", ip_rx, 8},
+    {"RxChnGT4", ip_rx, 30},     {"IPInPkt", ip_rx, 1},
+};
+constexpr part ip_parts[] = {{"Reassembled", "Delivered", 50'000}};
 
-constexpr derived_counter ip_derived[] = {
-    {"Reassembled", "Delivered", 50'000, true}, {"FragRcvd", "Reassembled", 2, false},
-    {"FragRcvd", "Reassembled", 2, false},      {"NoRoute", "LocalOut", 250'000, false},
-    {"RxChnColl", "RxChn", 14, false},          {"RxChnGT2", "RxChn", 8, false},
-    {"RxChnGT4", "RxChnGT2", 4, false}};
+constexpr ingredient ip6_ingredients[] = {
+    {"TotalRcvd", ip6_rx, 1}, {"Delivered", ip6_rx, 1},     {"FrafRcvd", ip6_rx, 45'000},
+    {"LocalOut", ip6_tx, 1},  {"NoRoute", ip6_tx, 350'000}, {"Fwd$Hit", ip6_tx, 1},
+};
+constexpr part ip6_parts[] = {{"Reassembled", "Delivered", 90'000}, {"Fwd$Miss", "Fwd$Hit", 400}};
 
-constexpr known_counter ip6_known[] = {
-    {"TotalRcvd", ip6_rx}, {"Delivered", ip6_rx}, {"LocalOut", ip6_tx}, {"Fwd$Hit", ip6_tx}};
+constexpr ingredient tcp_ingredients[] = {
+    {"ConnInit", init, 1},      {"ConnAcpt", acpt, 1},      {"ConnEst", est, 1},
+    {"EConnDrop", failed, 1},   {"DropTO", late, 1},        {"ConnDrop", late, 1},
+    {"ConnClosed", done, 1},    {"SndTotalPkt", tx, 1},     {"SndTotalDP", fresh, 1},
+    {"SndDataByte", freshd, 1}, {"SndDPktReXmt", again, 1}, {"SndDByteReXmt", againd, 1},
+    {"ReXmtTO", rto, 1},        {"RcvTotalPkt", rx, 1},     {"RcvPktInSeq", rx, 1},
+    {"RcvBInSeq", rxd, 1},      {"RcvAckByte", freshd, 1},  {"RcvDupAck", rx, 120},
+    {"RcvWinUpdPkt", rx, 80},   {"PredAck", rx, 5},         {"PredData", rx, 2},
+    {"Pcb$Miss", rx, 70},       {"RTTTimed", tx, 6},        {"RTTUpdated", tx, 6},
+    {"DelayAck", rx, 9},        {"KATO", done, 5},          {"KAProbe", done, 5},
+    {"RTT$Upd", done, 2},       {"RTTVar$Upd", done, 2},    {"RTTUsed", init, 3},
+    {"RTTVarUsed", init, 3},    {"SCAdded", acpt, 1},       {"SCCompl", acpt, 1},
+    {"SACKRecEpi", again, 9},   {"SACKReXmt", again, 5},    {"SACKReXmtB", againd, 5},
+    {"SACKRcvBlk", rx, 900},    {"SACKSntBlk", rx, 700},    {"CoalPkt", rx, 7},
+    {"LRO2Pkt", rx, 22},        {"LROMultiPkt", rx, 12},    {"TailLossTRO", again, 16},
+    {"ReOrdPkt", rx, 1100},     {"RecoveryPkt", again, 6},  {"ProbTO", again, 8},
+    {"ECNCliSetup", init, 1},   {"ECNNegoSucc", init, 3},   {"ECNSvrNoSupt", init, 2},
+    {"TmrDriftLE1Ms", tx, 15},  {"TmrDriftLE10Ms", tx, 90}, {"TmrDriftLE20Ms", tx, 800},
+};
+constexpr part tcp_parts[] = {
+    {"SndAck", "SndTotalDP", 3},      {"SndWinUpd", "SndAck", 10},     {"SndCtlPkt", "SndWinUpd", 100},
+    {"RcvAckPkt", "RcvPktInSeq", 4},  {"RcvDupPkt", "RcvAckPkt", 100}, {"RcvOOPkt", "RcvDupPkt", 2},
+    {"RcvDupByte", "RcvBInSeq", 400}, {"RcvOOByte", "RcvDupByte", 2},
+};
 
-constexpr derived_counter ip6_derived[] = {{"Reassembled", "Delivered", 90'000, true},
-                                           {"FrafRcvd", "Reassembled", 2, false},
-                                           {"FrafRcvd", "Reassembled", 2, false},
-                                           {"NoRoute", "LocalOut", 350'000, false},
-                                           {"Fwd$Miss", "Fwd$Hit", 400, true}};
-
-constexpr known_counter tcp_known[] = {{"ConnInit", first_event + stack::initiated},
-                                       {"ConnAcpt", first_event + stack::accepted},
-                                       {"ConnEst", first_event + stack::established},
-                                       {"EConnDrop", first_event + stack::refused},
-                                       {"DropTO", first_event + stack::timed_out},
-                                       {"ConnDrop", first_event + stack::timed_out},
-                                       {"ConnClosed", first_event + stack::closed},
-                                       {"SndTotalPkt", tx},
-                                       {"SndTotalDP", fresh},
-                                       {"SndDataByte", freshd},
-                                       {"SndDPktReXmt", first_event + stack::resent},
-                                       {"SndDByteReXmt", first_event + stack::resent_bytes},
-                                       {"ReXmtTO", first_event + stack::timeouts},
-                                       {"RcvTotalPkt", rx},
-                                       {"RcvPktInSeq", rx},
-                                       {"RcvBInSeq", rxd},
-                                       {"RcvAckByte", freshd},
-                                       {"SCAdded", first_event + stack::accepted},
-                                       {"SCCompl", first_event + stack::accepted},
-                                       {"ECNCliSetup", first_event + stack::initiated}};
-
-constexpr derived_counter tcp_derived[] = {{"SndAck", "SndTotalDP", 3, true},
-                                           {"SndWinUpd", "SndAck", 10, true},
-                                           {"SndCtlPkt", "SndWinUpd", 100, true},
-                                           {"RcvAckPkt", "RcvPktInSeq", 4, true},
-                                           {"RcvDupPkt", "RcvAckPkt", 100, true},
-                                           {"RcvOOPkt", "RcvDupPkt", 2, true},
-                                           {"RcvDupByte", "RcvBInSeq", 400, true},
-                                           {"RcvOOByte", "RcvDupByte", 2, true},
-                                           {"RcvDupAck", "RcvAckPkt", 30, false},
-                                           {"RcvWinUpdPkt", "RcvAckPkt", 20, false},
-                                           {"PredAck", "RcvTotalPkt", 5, false},
-                                           {"PredData", "RcvTotalPkt", 2, false},
-                                           {"Pcb$Miss", "RcvTotalPkt", 70, false},
-                                           {"RTTTimed", "SndTotalPkt", 6, false},
-                                           {"RTTUpdated", "SndTotalPkt", 6, false},
-                                           {"DelayAck", "RcvTotalPkt", 9, false},
-                                           {"KAProbe", "ConnClosed", 5, false},
-                                           {"KATO", "KAProbe", 2, false},
-                                           {"RTT$Upd", "ConnClosed", 2, false},
-                                           {"RTTVar$Upd", "ConnClosed", 2, false},
-                                           {"RTTUsed", "ConnInit", 3, false},
-                                           {"RTTVarUsed", "ConnInit", 3, false},
-                                           {"SACKRecEpi", "SndDPktReXmt", 9, false},
-                                           {"SACKReXmt", "SndDPktReXmt", 5, false},
-                                           {"SACKReXmtB", "SndDByteReXmt", 5, false},
-                                           {"SACKRcvBlk", "RcvTotalPkt", 900, false},
-                                           {"SACKSntBlk", "RcvTotalPkt", 700, false},
-                                           {"CoalPkt", "RcvTotalPkt", 7, false},
-                                           {"LRO2Pkt", "CoalPkt", 3, false},
-                                           {"LROMultiPkt", "CoalPkt", 2, false},
-                                           {"TailLossTRO", "SndDPktReXmt", 16, false},
-                                           {"ReOrdPkt", "RcvOOPkt", 2, false},
-                                           {"RecoveryPkt", "SndDPktReXmt", 6, false},
-                                           {"ProbTO", "SndDPktReXmt", 8, false},
-                                           {"ECNNegoSucc", "ECNCliSetup", 3, false},
-                                           {"ECNSvrNoSupt", "ECNCliSetup", 2, false},
-                                           {"TmrDriftLE1Ms", "SndTotalPkt", 15, false},
-                                           {"TmrDriftLE10Ms", "SndTotalPkt", 90, false},
-                                           {"TmrDriftLE20Ms", "SndTotalPkt", 800, false}};
-
-constexpr known_counter udp_known[] = {{"InPkt", udp_rx},
-                                       {"NoPort", first_event + stack::no_port},
-                                       {"FullSock", first_event + stack::full_socket},
-                                       {"OutPkt", udp_tx},
-                                       {"FastOut", udp_tx}};
-
-constexpr derived_counter udp_derived[] = {{"PCBCacheMiss", "InPkt", 25, false},
-                                           {"NoCsum", "InPkt", 60, false}};
+constexpr ingredient udp_ingredients[] = {
+    {"InPkt", udp_rx, 1},  {"NoPort", stray, 1},   {"FullSock", full, 1},  {"PCBCacheMiss", udp_rx, 25},
+    {"OutPkt", udp_tx, 1}, {"FastOut", udp_tx, 1}, {"NoCsum", udp_rx, 60},
+};
 
 std::uint64_t data_of(const traffic &moved) {
   return moved.bytes - std::min(moved.bytes, segment_headers * moved.packets);
 }
 
-void put_stack(const nexus &carrier, std::int32_t pid, const stack_totals &seen, table_file &file) {
-  static const counter_recipe ip(ip_counter_names, ip_known, ip_derived);
-  static const counter_recipe ip6(ip6_counter_names, ip6_known, ip6_derived);
-  static const counter_recipe tcp(tcp_counter_names, tcp_known, tcp_derived);
-  static const counter_recipe udp(udp_counter_names, udp_known, udp_derived);
+void put_stack(const nexus &carrier, std::int32_t pid, const stack_totals &totals, table_file &file) {
+  static const counter_recipe ip(ip_counter_names, ip_ingredients, ip_parts);
+  static const counter_recipe ip6(ip6_counter_names, ip6_ingredients, ip6_parts);
+  static const counter_recipe tcp(tcp_counter_names, tcp_ingredients, tcp_parts);
+  static const counter_recipe udp(udp_counter_names, udp_ingredients, {});
 
-  std::uint64_t sources[first_event + stack::events] = {};
+  std::uint64_t sources[source_count] = {};
   for (int ipv6 = 0; ipv6 < 2; ++ipv6) {
-    const auto &[by_tcp, by_udp] = seen.moved[ipv6];
+    const auto &[by_tcp, by_udp] = totals.moved[ipv6];
     sources[ipv6 ? ip6_tx : ip_tx] = by_tcp.out.packets + by_udp.out.packets;
     sources[ipv6 ? ip6_rx : ip_rx] = by_tcp.in.packets + by_udp.in.packets;
     sources[tx] += by_tcp.out.packets;
@@ -125,9 +94,9 @@ void put_stack(const nexus &carrier, std::int32_t pid, const stack_totals &seen,
     sources[udp_tx] += by_udp.out.packets;
     sources[udp_rx] += by_udp.in.packets;
   }
-  sources[fresh] = sources[tx] - seen.count[stack::resent];
-  sources[freshd] = sources[txd] - seen.count[stack::resent_bytes];
-  std::ranges::copy(seen.count, sources + first_event);
+  sources[fresh] = sources[tx] - totals.count[stack::resent];
+  sources[freshd] = sources[txd] - totals.count[stack::resent_bytes];
+  std::ranges::copy(totals.count, sources + init);
 
   tv_stats_userstack record{};
   record.nx_uuid = carrier.id;

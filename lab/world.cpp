@@ -157,8 +157,6 @@ std::string registered_name(nexus_kind kind, std::uint32_t ordinal) {
 
 void advance(world &state, std::uint32_t milliseconds) {
   constexpr std::uint32_t longest = 250;
-  state.started.clear();
-  state.ended.clear();
   for (std::uint32_t left = milliseconds; left;) {
     const std::uint32_t now = std::min(left, longest);
     left -= now;

@@ -178,7 +178,7 @@ struct world {
   std::uint64_t elapsed = 0;  // milliseconds
   std::vector<planned_incident> incidents;
 
-  // Since the world was published last.
+  // Since the world was published last; whoever publishes it forgets them.
   std::vector<std::uint32_t> started;  // indexes of processes
   std::vector<std::int32_t> ended;     // process ids that are no more
 };
