@@ -12,8 +12,8 @@ namespace lab {
 namespace {
 
 // Some flows of a new machine are in one of these, so that there is one in each state.
-constexpr tcp::state rare[] = {tcp::syn_sent, tcp::time_wait, tcp::close_wait, tcp::fin_wait_1,
-                               tcp::closing,  tcp::last_ack,  tcp::fin_wait_2, tcp::closed};
+constexpr std::uint8_t rare[] = {tcp::syn_sent, tcp::time_wait, tcp::close_wait, tcp::fin_wait_1,
+                                 tcp::closing,  tcp::last_ack,  tcp::fin_wait_2, tcp::closed};
 
 const program &program_of(const world &state, std::uint32_t channel_index) {
   return programs[state.processes[state.channels[channel_index].process].program];
@@ -77,7 +77,7 @@ flow *open_flow(world &state, std::uint32_t channel_index, const service &use, s
   made.due = state.elapsed - state.random.below(within);
   const bool is_tcp = use.protocol == tcp_protocol;
   if (is_tcp) made.state = wanted;
-  if (wanted == (is_tcp ? int{tcp::listening} : 0)) {
+  if (wanted == (is_tcp ? std::uint8_t{tcp::listening} : std::uint8_t{})) {
     listen(state, made);
   } else if (!connect(state, made, wanted != first_state(use))) {
     return nullptr;
@@ -137,7 +137,8 @@ void open_old_flow(world &state, std::uint32_t channel_index, std::uint64_t numb
   std::uint8_t wanted = is_tcp ? std::uint8_t{tcp::established} : std::uint8_t{2};
   if (number % (number < 60 ? 4 : 16) == 3)
     wanted = is_tcp ? rare[rare_ones++ % std::size(rare)] : std::uint8_t{1};
-  open_in(state, channel_index, *use, wanted == tcp::syn_sent ? first_state(*use) : wanted, 1);
+  if (is_tcp && wanted == tcp::syn_sent) wanted = first_state(*use);
+  open_in(state, channel_index, *use, wanted, 1);
 }
 
 }  // namespace
