@@ -91,9 +91,9 @@ void replace_pipes(world &state, std::uint32_t milliseconds) {
 }
 
 void step(world &state, std::uint32_t milliseconds) {
-  cause_trouble(state, milliseconds);
   replace_pipes(state, milliseconds);
   replace_channels(state, milliseconds);
+  cause_trouble(state, milliseconds);  // the flows of what it takes end before it is closed
   wander_routes(state);
   replace_flows(state, milliseconds);
   move_flows(state, milliseconds);
