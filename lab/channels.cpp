@@ -109,6 +109,7 @@ std::uint32_t owner_of(const world &state, const nexus &place, std::uint32_t por
 // The kernel takes the channel of a client that sleeps.
 void take_channel(world &state, channel &taken) {
   if (taken.state != channel::phase::open || is_server(state, taken)) return;
+  if (!state.incidents.empty()) return;  // trouble does not hide behind another
   make_defunct(state, taken, state.elapsed + state.random.between(4'000, 60'000));
 }
 
@@ -161,7 +162,6 @@ void reopen_channel(world &state, std::uint32_t index) {
     owner.pid = state.next_pid;
     state.started.push_back(opened.process);
   }
-  opened.listeners = 0;
   open_channel(state, opened);
   start_listening(state, index);
 }

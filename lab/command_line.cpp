@@ -129,16 +129,6 @@ bool take_host(const char *text, options &asked) {
   return !asked.host.empty() && asked.host.size() <= most && std::ranges::all_of(asked.host, is_text);
 }
 
-bool take_after(const char *text, options &asked) {
-  return parse_seconds(text, 0, longest, asked.after);
-}
-
-// Whether the words are a wish to know which incidents there are.
-bool wants_incidents(char **argument) {
-  const std::string_view option = "--incident";
-  return argument[0] && argument[1] && argument[0] == option && argument[1] == std::string_view("list");
-}
-
 int list_incidents() {
   for (const incident &row : incidents) print<"%-16s %s\n">(row.name, row.story);
   report.flush();
@@ -151,7 +141,7 @@ bool take_option(const command &row, std::string_view name, const char *value, o
     return row.makes_world && parse_number<std::uint64_t>(value, 0, UINT64_MAX, asked.seed);
   if (name == "--incident") return row.makes_world && take_incident(value, asked);
   if (name == "--host") return row.makes_world && take_host(value, asked);
-  if (name == "--after") return row.handler == generate && take_after(value, asked);
+  if (name == "--after") return row.handler == generate && parse_seconds(value, 0, longest, asked.after);
   if (name == "--every") return row.captures && parse_seconds(value, 10, 3'600'000, asked.every);
   if (name == "--count") return row.captures && parse_number(value, 1U, most_records, asked.count);
   for (const number_option &known : number_options) {
@@ -194,8 +184,11 @@ int run_command_line(int argc, char **argv) {
   if (argc < 2) return usage();
   for (const command &row : commands) {
     options asked;
-    if (row.name == argv[1] && row.makes_world && wants_incidents(argv + 2)) return list_incidents();
-    if (row.name == argv[1]) return parse(row, argv + 2, asked) ? row.handler(asked) : usage();
+    if (row.name != argv[1]) continue;
+    const bool asks =
+        argc == 4 && std::string_view(argv[2]) == "--incident" && argv[3] == std::string_view("list");
+    if (asks && row.makes_world) return list_incidents();
+    return parse(row, argv + 2, asked) ? row.handler(asked) : usage();
   }
   return usage();
 }

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 
-#include "lab/flow_states.h"
 #include "lab/world_parts.h"
 
 namespace lab {

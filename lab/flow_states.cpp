@@ -1,4 +1,4 @@
-#include "lab/flow_states.h"
+// The states of flows: how they are entered, and what a flow moves meanwhile.
 
 #include <algorithm>
 #include <iterator>

@@ -2,8 +2,8 @@
 
 #include "common/tables/flow.h"
 
-#include "lab/flow_states.h"
 #include "lab/tables.h"
+#include "lab/world_parts.h"
 
 namespace lab {
 

@@ -3,7 +3,6 @@
 #include <algorithm>
 
 #include "common/tables/flow.h"
-#include "lab/flow_states.h"
 #include "lab/programs.h"
 #include "lab/world_parts.h"
 
@@ -49,7 +48,7 @@ bool connect(world &state, flow &made, bool connected) {
   const bool exhausted = carrier.reserved == ephemeral_ports && made.use->protocol == tcp_protocol;
   if (exhausted && !made.ipv6 && !made.use->inbound) {
     auto &count = state.channels[made.channel].stack.count;
-    for (const stack::event each : {stack::initiated, stack::refused, stack::closed}) ++count[each];
+    for (const stack::connections each : {stack::initiated, stack::refused, stack::closed}) ++count[each];
     return false;
   }
   const auto ephemeral = static_cast<std::uint16_t>(first_ephemeral + way.used++ % ephemeral_ports);
@@ -60,16 +59,6 @@ bool connect(world &state, flow &made, bool connected) {
   return true;
 }
 
-// A server has its known port, and then, as everyone else, ports of its own.
-void listen(world &state, flow &made) {
-  const std::uint32_t before = state.channels[made.channel].listeners++;
-  made.route = none;
-  made.due = never;
-  made.ipv6 = state.random.chance(1, 2);
-  const bool known = made.use->inbound && before < 2;
-  made.local_port = known ? made.use->port : static_cast<std::uint16_t>(49'151 - before % 40'000);
-}
-
 // The flow, which opened at some time within the latest milliseconds, or null where nobody can be reached.
 flow *open_flow(world &state, std::uint32_t channel_index, const service &use, std::uint8_t wanted,
                 std::uint32_t within) {
@@ -78,12 +67,16 @@ flow *open_flow(world &state, std::uint32_t channel_index, const service &use, s
   const bool is_tcp = use.protocol == tcp_protocol;
   if (is_tcp) made.state = wanted;
   if (wanted == (is_tcp ? std::uint8_t{tcp::listening} : std::uint8_t{})) {
-    listen(state, made);
+    made.route = none;
+    made.due = never;
+    made.ipv6 = state.random.chance(1, 2);
+    made.local_port = use.port;
   } else if (!connect(state, made, wanted != first_state(use))) {
     return nullptr;
   }
   // Most are short, and most of the time belongs to the long ones.
-  made.ends = made.due + state.random.between(1000, 2000) * (1U << state.random.below(10));
+  const std::uint32_t octave = state.random.below(10);
+  made.ends = made.due + (state.random.between(1000, 2000) << octave);
   state.flows.push_back(made);
   return &state.flows.back();
 }

@@ -18,10 +18,8 @@ simulation::simulation(const options &asked, own_directory directory)
       host_(asked.host) {
   state_.incidents = asked.incidents;
   std::uint64_t until = asked.after;
-  if (asked.after) {
-    for (const planned_incident &planned : asked.incidents) {
-      until = std::max(until, planned.begins + asked.after);
-    }
+  for (const planned_incident &planned : asked.incidents) {
+    if (asked.after) until = std::max(until, planned.begins + asked.after);
   }
   while (state_.elapsed < until) {
     advance(state_, static_cast<std::uint32_t>(std::min<std::uint64_t>(until - state_.elapsed, interval_)));

@@ -19,21 +19,11 @@ void for_each_client(world &state, const flow_switch &place, Visit visit) {
   }
 }
 
-// The interface below a switch, or the switch itself.
-nexus &interface_of(world &state, const flow_switch &place) {
+void lose_packets(world &state, flow_switch &place, std::uint32_t milliseconds) {
+  constexpr std::uint32_t longest = 400'000;
   nexus &carrier = state.nexuses[place.nexus];
-  return carrier.interface == none ? carrier : state.nexuses[carrier.interface];
-}
-
-void lose_packets(world &state, flow_switch &place) {
-  constexpr std::uint32_t loss = 40'000;
-  interface_of(state, place).loss = state.nexuses[place.nexus].loss = loss;
-}
-
-void delay_packets(world &state, flow_switch &place, std::uint32_t milliseconds) {
-  constexpr std::uint32_t most = 400'000;
-  std::uint32_t &delay = state.nexuses[place.nexus].delay;
-  delay = std::min(delay + 20 * milliseconds, most);
+  carrier.loss = 40'000;
+  carrier.delay = std::min(carrier.delay + 20 * milliseconds, longest);
 }
 
 // The first server is no more, and its peers do not know yet.
@@ -67,7 +57,8 @@ void hold_flow_back(world &state, flow_switch &place) {
   flow *busiest = nullptr;
   for (flow &candidate : state.flows) {
     const channel &user = state.channels[candidate.channel];
-    const bool fits = &state.switches[user.flow_switch] == &place && candidate.advisory != none;
+    const bool fits = &state.switches[user.flow_switch] == &place && candidate.advisory != none &&
+                      (candidate.state == tcp::established || candidate.state == tcp::closed);
     const auto rate = [](const flow &of) { return of.packets_per_second.out; };
     if (fits && (!busiest || rate(candidate) > rate(*busiest))) busiest = &candidate;
   }
@@ -86,6 +77,13 @@ void lose_peer(world &state, flow_switch &place) {
   for (flow &waiting : state.flows) {
     if (waiting.route == place.dead_route) waiting.due = std::min(waiting.due, state.elapsed);
   }
+}
+
+void insist(world &state, flow_switch &place, std::uint32_t milliseconds) {
+  for_each_client(state, place, [&](const channel &client) {
+    const auto index = static_cast<std::uint32_t>(&client - state.channels.data());
+    if (state.random.chance(milliseconds, 10'000)) open_new_flow(state, index, milliseconds);
+  });
 }
 
 void reserve_ports(world & /*state*/, flow_switch &place, std::uint32_t milliseconds) {
@@ -110,12 +108,12 @@ void end_process(world &state, flow_switch &place) {
 }
 
 constexpr incident stories[] = {
-    {"lossy-link", "an interface drops packets, and round trips take longer", lose_packets, delay_packets},
+    {"lossy-link", "an interface drops packets, and round trips take longer", nullptr, lose_packets},
     {"lookup-miss", "a service has died, and its peers keep sending", end_service, nullptr},
     {"slow-reader", "a process stops reading what it receives", stop_reading, nullptr},
     {"leak", "an arena grows until nothing is left for packets", nullptr, leak_memory},
     {"stalled-flow", "the busiest flow is held back by its advisory", hold_flow_back, nullptr},
-    {"dead-peer", "the host with most flows does not answer any more", lose_peer, nullptr},
+    {"dead-peer", "the host with most flows does not answer any more", lose_peer, insist},
     {"port-exhaustion", "the ephemeral ports of an address are reserved to the last", nullptr, reserve_ports},
     {"crash", "a process ends and leaves its channels behind", end_process, nullptr},
 };

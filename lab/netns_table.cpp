@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <map>
 
-#include "lab/flow_states.h"
 #include "lab/tables.h"
 #include "lab/world_parts.h"
 

@@ -40,6 +40,7 @@ void make_routes(world &state, flow_switch &carrier, std::uint32_t count) {
 }
 
 std::uint32_t choose_route(world &state, flow_switch &carrier, bool connected) {
+  if (carrier.route_count == 0) return none;
   if (!connected && carrier.dead_route != none && state.random.chance(1, 2)) return carrier.dead_route;
   const std::uint32_t index = carrier.first_route + state.random.below(carrier.route_count);
   route &way = state.routes[index];

@@ -90,15 +90,16 @@ two_way<traffic> settle(world &state, channel &user, std::uint32_t loss, std::ui
 }
 
 // Takes what crosses an interface. What it loses it has not received.
-void cross(world &state, nexus &place, const two_way<traffic> &moved, std::uint32_t milliseconds) {
+void cross(world &state, nexus &place, const two_way<traffic> &moved, std::uint32_t loss,
+           std::uint32_t milliseconds) {
   const auto key = static_cast<std::uint32_t>(key_of(place.id));
   const std::uint32_t level = tide(state.elapsed, key);
   const auto losses = [&](std::uint32_t parts) {
-    return state.random.share(moved.in.packets, parts * level / 100 + place.loss / 2, million);
+    return state.random.share(moved.in.packets, parts * level / 100 + loss / 2, million);
   };
   lose(place, lost::bad_length, losses(1 + key % 2));
   lose(place, lost::no_memory, losses(1 + key / 2 % 3));
-  lose(place, lost::not_sent, state.random.share(moved.out.packets, place.loss / 4, million));
+  lose(place, lost::not_sent, state.random.share(moved.out.packets, loss / 4, million));
   place.moved += moved;
   // Whoever looks at the interface sees all of it.
   for (std::uint32_t i = 0; i < place.channel_count; ++i) {
@@ -117,10 +118,10 @@ void lose_some(world &state, nexus &place, const two_way<traffic> &moved, std::u
   const auto share = [&](std::uint64_t packets, std::uint32_t parts) {
     return state.random.share(packets, parts * level / 100, million);
   };
-  lose(place, lost::no_match,
-       share(moved.in.packets, 30 + key % 100) + state.random.share(place.strays, milliseconds, 1000));
-  lose(place, lost::torn_down,
-       share(moved.in.packets, 4 + key % 10) + state.random.share(place.strays, milliseconds, 4000));
+  lose(place, lost::no_match, share(moved.in.packets, 30 + key % 100));
+  lose(place, lost::no_match, state.random.share(place.strays, milliseconds, 1000));
+  lose(place, lost::torn_down, share(moved.in.packets, 4 + key % 10));
+  lose(place, lost::torn_down, state.random.share(place.strays, milliseconds, 4000));
   lose(place, lost::not_sent, std::min(share(moved.out.packets, 1 + key % 4), moved.out.packets));
   if (place.leaked > full) lose(place, lost::no_memory, 1 + moved.in.packets / 2);
 }
@@ -140,7 +141,7 @@ void pass_switch(world &state, nexus &place, std::uint32_t milliseconds) {
     sum += settle(state, port, place.loss, milliseconds);
     // Who does not know yet that the kernel has taken the channel sends on.
     if (port.state == channel::phase::defunct) {
-      lose(place, lost::port_defunct, state.random.share(1, std::min(milliseconds, 2000U), 2000));
+      lose(place, lost::defunct, state.random.share(1, std::min(milliseconds, 2000U), 2000));
     }
   }
   lose_some(state, place, sum, milliseconds);
@@ -149,7 +150,7 @@ void pass_switch(world &state, nexus &place, std::uint32_t milliseconds) {
   place.lost_now = {};
   place.moved += sum;
   if (device) count(*device, sum);
-  if (place.interface != none) cross(state, state.nexuses[place.interface], sum, milliseconds);
+  if (place.interface != none) cross(state, state.nexuses[place.interface], sum, place.loss, milliseconds);
 }
 
 // The ports of a bridge and the ends of a pipe: what one sends the next one receives, or it is lost. A single
@@ -214,7 +215,7 @@ void deliver(world &state, std::uint32_t milliseconds) {
     } else if (place.kind != nexus_kind::net_if) {
       forward(state, place, milliseconds);
     } else if (place.ordinal >= state.multistacks.size() || state.multistacks[place.ordinal] == none) {
-      cross(state, place, background(state, place.id, 300, milliseconds), milliseconds);
+      cross(state, place, background(state, place.id, 300, milliseconds), 0, milliseconds);
     }
   }
 }

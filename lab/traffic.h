@@ -57,27 +57,16 @@ struct meter {
     packets_average = packets_average ? (7 * packets_average + packets_per_second) / 8 : packets_per_second;
     interval = {};
   }
-
-  // Keeps the total and nothing else.
-  void forget_rates() { *this = {.total = total}; }
 };
 
-// What happens to connections and packets in a protocol stack.
+// What happens in a protocol stack.
 namespace stack {
-enum event : std::uint8_t {
-  initiated,    // connections that were asked for here,
-  accepted,     // or there
-  established,  // of both
-  refused,      // of both, never established
-  timed_out,    // given up
-  closed,       // of all, those that are no more
-  resent,       // packets that were sent again
-  resent_bytes,
-  timeouts,  // of packets, each of which was sent again
-  no_port,   // datagrams for no one
-  full_socket,
-  events
-};
+// Connections that were asked for here, or there; of both, those that were established, that never were, that
+// were given up, and that are no more.
+enum connections : std::uint8_t { initiated, accepted, established, refused, timed_out, closed, packets };
+
+// What was sent again, for a time-out or not, and datagrams for no one or for who does not read them.
+enum event : std::uint8_t { resent = packets, resent_bytes, timeouts, no_port, full_socket, events };
 }  // namespace stack
 
 // What a protocol stack in user space has seen.
@@ -92,16 +81,17 @@ struct stack_totals {
   }
 };
 
-// Why packets are lost on their way through a nexus.
+// Why packets are lost on their way through a nexus: no flow waits for it or the flow is no more, its channel
+// is defunct or has a full ring, and so on; the last one on the way out.
 namespace lost {
 enum reason : std::uint8_t {
-  no_match,      // no flow waits for it
-  torn_down,     // the flow is no more
-  port_defunct,  // its channel is one that the kernel has taken
-  no_space,      // the ring that it is for is full
+  no_match,
+  torn_down,
+  defunct,
+  no_space,
   no_memory,
   bad_length,
-  not_sent,  // the one reason on the way out
+  not_sent,
   reasons
 };
 }  // namespace lost

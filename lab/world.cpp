@@ -135,10 +135,7 @@ world make_world(const sizes &size, std::uint64_t seed) {
   open_channels(state);
   open_flows(state);
   deliver(state, uptime);
-  for (channel &used : state.channels) {
-    used.moved.out.forget_rates();
-    used.moved.in.forget_rates();
-  }
+  end_interval(state, uptime);
   // All states that there are last for a second: none is left.
   move_flows(state, second);
   deliver(state, second);

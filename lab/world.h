@@ -93,9 +93,8 @@ struct channel {
   std::int32_t fd;
   phase state;
   bool reads_slowly = false;
-  std::uint64_t due = 0;        // when a defunct one is closed, a closed one opened
-  std::uint32_t listeners = 0;  // how many it has had
-  std::uint64_t errors = 0;     // packets lost for what the sender did to them
+  std::uint64_t due = 0;     // when a defunct one is closed, a closed one opened
+  std::uint64_t errors = 0;  // packets lost for what the sender did to them
   two_way<meter> moved;
   two_way<traffic> now[2][2];    // of its flows in this step, by IPv6 and UDP,
   std::uint64_t resent_now = 0;  // and packets of these that were sent again

@@ -52,6 +52,7 @@ class Moment:
         self.providers = {at["uuid"]: each for each in self.tables["nexus_provider_list"] for at in each["instances"]}
         self.flows = {self.key(each): each for each in self.tables["stats/flow"]}
         self.switches = {each["nx_uuid"]: each for each in self.tables["stats/flow_switch"]}
+        self.states = [each["sf_lstats.state"] for each in self.flows.values()]
         self.owners = collections.defaultdict(lambda: {"stacks": [], "channels": [], "flows": []})
         for stack in self.tables["stats/userstack"]:
             self.owners[stack["nx_uuid"], stack["pid"]]["stacks"].append(stack)
@@ -163,9 +164,7 @@ class Laws(LabCase):
         for region in (each for arena in seen.tables["stats/arena"] for each in arena["regions"]):
             self.assertEqual(region["allocs"] - region["frees"], region["seg_in_use"])
             self.assertLessEqual(region["seg_in_use"], region["seg_count"])
-        states = [each["sf_lstats.state"] for each in seen.flows.values()]
-        self.assertIn(NO_TRAFFIC, states)
-        self.assertLess(sum(each in (SYN_SENT, SYN_RECEIVED) for each in states), 3 + len(states) / 50)
+        self.assertIn(NO_TRAFFIC, seen.states)
 
     def check_change(self, before, seen, near):
         """Nothing counted falls; what flows have moved, stacks have; and a flow that is over learns nothing new."""
@@ -217,7 +216,8 @@ class Laws(LabCase):
         seen = [self.moment(60_000 // each, f"--interval {each} --flows 1000") for each in (500, 6000, 60_000)]
         tables = [[each.tables[name][0].table for name in TABLES if name != "nexus_channel_list"] for each in seen]
         self.assertTrue(tables[0] == tables[1] == tables[2])
-        self.assertLess(abs(len(seen[0].tables["stats/flow"]) - 1000), 60)
+        self.assertLess(abs(len(seen[0].states) - 1000), 60)
+        self.assertLess(sum(each in (SYN_SENT, SYN_RECEIVED) for each in seen[0].states), 20)
 
     def test_AnHourHasItsChanges(self):
         first, *_, last = seen = [self.moment(each, "--interval 60000") for each in (0, 1, 5, 60)]
@@ -247,17 +247,17 @@ class Laws(LabCase):
                 if advisory in flags[0] and advisory in flags[1]:
                     found[flags[0][advisory] & flags[1][advisory]].append(sent[1] - sent[0])
             return found
-        self.assertNotIn(CONTROLLED, rates(""))
+        self.assertNotIn(0, rates("")[CONTROLLED])
         held, others = map(rates("--incident stalled-flow").get, (CONTROLLED, 0))
-        self.assertEqual(held, [0])
-        self.assertGreater(sum(others) / len(others), 100)
+        self.assertIn(0, held)
+        self.assertLess(4 * sum(held) / len(held), sum(others) / len(others))
 
     def test_IncidentsShowWhereTheGuideLooks(self):
-        usual = generate(self.directory / "usual", "--after", 40)
+        usual = generate(self.directory / "usual", "--after", 120)
         page = (top / "docs/from-symptom-to-command.md").read_text()
         for name, command, pattern, least in SIGNS:
             with self.subTest(name=name, command=command):
-                struck = generate(self.directory / name, "--after", 40, "--incident", name)
+                struck = generate(self.directory / name, "--after", 120, "--incident", name)
                 found = [sum(int(each) if each.isdigit() else 1 for each in re.findall(pattern, self.start(
                     command, kernel=kernel).end().out)) for kernel in (usual, struck)]
                 self.assertGreaterEqual(found[1] - found[0], least, found)
