@@ -139,7 +139,7 @@ std::string given_root() {
 std::string host_name() {
   utsname machine{};
   uname(&machine);
-  char name[sizeof machine.nodename + 1];
+  char name[256];
   std::size_t length = sizeof name;
   std::string host = machine.nodename;
   if (sysctlbyname("kernel.hostname", name, &length, nullptr, 0) == 0) host.assign(name, length);

@@ -53,24 +53,15 @@ std::uint32_t port_of(nexus_kind kind, std::uint32_t number) {
   return number == 0 ? 2 : number - 1;
 }
 
-// Takes the lowest free descriptor, as every kernel does.
+// The lowest free descriptor, as every kernel gives it.
 std::int32_t take_descriptor(process &owner) {
-  auto free = std::find(owner.descriptors.begin() + static_cast<std::ptrdiff_t>(owner.lowest),
-                        owner.descriptors.end(), false);
-  const std::ptrdiff_t number = free - owner.descriptors.begin();
-  if (free == owner.descriptors.end()) {
-    owner.descriptors.push_back(true);
-  } else {
-    *free = true;
-  }
-  owner.lowest = static_cast<std::size_t>(number) + 1;
-  return static_cast<std::int32_t>(number);
+  return owner.free.empty() ? owner.next_fd++ : owner.free.extract(owner.free.begin()).value();
 }
 
 void open_channel(world &state, channel &opened) {
   process &owner = state.processes[opened.process];
   // Whoever has a channel has a few files, too.
-  if (owner.descriptors.empty()) owner.descriptors.resize(state.random.between(3, 20), true);
+  if (owner.next_fd == 0) owner.next_fd = static_cast<std::int32_t>(state.random.between(3, 20));
   opened.id = state.random.identity();
   opened.fd = take_descriptor(owner);
   ++owner.channels;
@@ -86,16 +77,15 @@ void remember_past(world &state, channel &opened) {
     const std::uint64_t answers = packets / state.random.between(1, 4);
     opened.now[kind / 2][kind % 2] += {{packets * 300, packets}, {answers * 900, answers}};
   }
-  const bool serves = is_server(state, opened);
-  const std::uint32_t many = state.random.between(10, 900);
-  const std::uint32_t few = state.random.between(0, 12);
-  const std::uint32_t refused = (serves ? few : many) / state.random.between(15, 60);
+  std::uint32_t initiated = state.random.between(10, 900);
+  std::uint32_t accepted = state.random.between(0, 12);
+  if (is_server(state, opened)) std::swap(initiated, accepted);
   auto &count = opened.stack.count;
-  count[stack::initiated] = serves ? few : many;
-  count[stack::accepted] = serves ? many : few;
-  count[stack::established] = many + few - refused;
-  count[stack::refused] = refused;
-  count[stack::closed] = many + few;
+  count[stack::initiated] = initiated;
+  count[stack::accepted] = accepted;
+  count[stack::closed] = initiated + accepted;
+  count[stack::refused] = initiated / state.random.between(15, 60);
+  count[stack::established] = count[stack::closed] - count[stack::refused];
 }
 
 std::uint32_t owner_of(const world &state, const nexus &place, std::uint32_t port) {
@@ -148,9 +138,7 @@ void close_channel(world &state, channel &closed) {
   closed.moved = {};
   closed.reads_slowly = false;
   process &owner = state.processes[closed.process];
-  const auto descriptor = static_cast<std::size_t>(closed.fd);
-  owner.descriptors[descriptor] = false;
-  owner.lowest = std::min(owner.lowest, descriptor);
+  owner.free.insert(closed.fd);
   if (--owner.channels == 0) forget_process(state, closed);
 }
 
@@ -191,18 +179,7 @@ void open_channels(world &state) {
   if (state.processes.empty()) return;
   deal_channels(state.nexuses, state.size.channels);
   for (std::uint32_t i = 0; i < state.nexuses.size(); ++i) populate(state, i);
-  // Each switch has seen someone who is gone.
-  for (flow_switch &carrier : state.switches) {
-    remember_past(state, state.channels[state.nexuses[carrier.nexus].first_channel]);
-  }
-  deliver(state, 1000);
-  for (const std::uint32_t index : state.flow_channels) {
-    channel &opened = state.channels[index];
-    state.switches[opened.flow_switch].closed += opened.stack;
-    opened.stack = {};
-    opened.moved = {};
-    remember_past(state, opened);
-  }
+  for (const std::uint32_t index : state.flow_channels) remember_past(state, state.channels[index]);
 }
 
 void replace_channels(world &state, std::uint32_t milliseconds) {

@@ -1,12 +1,43 @@
 // Flows: how they walk through their states and end.
 
 #include <algorithm>
+#include <iterator>
 
 #include "lab/world_parts.h"
 
 namespace lab {
 
 namespace {
+
+constexpr std::uint32_t control_packet = 60;  // bytes of a segment that carries no data
+
+struct tcp_behaviour {
+  tcp::state remote;  // the other end's state
+  bool sends;
+  bool receives;
+  std::uint32_t lasts;  // milliseconds on average; 0: until the peer answers
+  tcp::state next;
+};
+
+// By state.
+constexpr tcp_behaviour tcp_behaviours[] = {
+    {tcp::time_wait, false, false, 1500, tcp::gone},       // closed
+    {tcp::closed, false, false, 0, tcp::listening},        // listening
+    {tcp::listening, false, false, 0, tcp::established},   // syn_sent
+    {tcp::syn_sent, false, false, 0, tcp::established},    // syn_received
+    {tcp::established, true, true, 0, tcp::fin_wait_1},    // established
+    {tcp::fin_wait_2, true, false, 2500, tcp::last_ack},   // close_wait
+    {tcp::established, false, true, 0, tcp::fin_wait_2},   // fin_wait_1
+    {tcp::closing, false, false, 0, tcp::time_wait},       // closing
+    {tcp::fin_wait_2, false, false, 0, tcp::closed},       // last_ack
+    {tcp::close_wait, false, true, 1500, tcp::time_wait},  // fin_wait_2
+    {tcp::closed, false, false, 15'000, tcp::gone},        // time_wait
+};
+static_assert(std::size(tcp_behaviours) == tcp::gone);
+
+// Of ends without connection state, by the packets that they have sent.
+constexpr std::uint32_t datagram_states[] = {flow_states.number("NO_TRAFFIC"), flow_states.number("SINGLE"),
+                                             flow_states.number("MULTIPLE")};
 
 auto &counts_of(world &state, const flow &source) {
   return state.channels[source.channel].stack.count;
@@ -44,7 +75,7 @@ void leave_handshake(world &state, flow &walker) {
 // What its state wants when its time has come.
 void step_tcp(world &state, flow &walker) {
   const bool is_over = walker.due >= walker.ends && !walker.stalled;
-  const auto next = behaviour_of(walker.state).next;
+  const auto next = tcp_behaviours[walker.state].next;
   if (next == tcp::gone) {
     walker.state = tcp::gone;
   } else if (!state.routes[walker.route].answers) {
@@ -78,13 +109,6 @@ void step_udp(world &state, flow &walker) {
   if (!answers) walker.packets_per_second = {1, 0};
 }
 
-// Flows have a time at which the next thing happens to them, whatever the step.
-void step(world &state, flow &walker) {
-  while (walker.due <= state.elapsed && walker.state != tcp::gone) {
-    walker.use->protocol == tcp_protocol ? step_tcp(state, walker) : step_udp(state, walker);
-  }
-}
-
 void release(world &state, const flow &ended) {
   channel &user = state.channels[ended.channel];
   if (ended.use->protocol == tcp_protocol && ended.route != none) {
@@ -111,12 +135,60 @@ void open_missing_flows(world &state, std::uint32_t milliseconds) {
 
 }  // namespace
 
+two_way<std::uint32_t> states_of(const flow &source) {
+  if (source.use->protocol == tcp_protocol) return {source.state, tcp_behaviours[source.state].remote};
+  const auto by_packets = [](const traffic &sent) {
+    return datagram_states[std::min<std::uint64_t>(sent.packets, 2)];
+  };
+  return {by_packets(source.moved.out), by_packets(source.moved.in)};
+}
+
+void make_busy(world &state, flow &moving) {
+  constexpr std::uint32_t held_back = 16;  // times slower
+  // Many flows share what an interface can carry.
+  const std::uint32_t fair = std::max(400'000 / std::max(state.size.flows, 1U), 1U);
+  const std::uint32_t most = std::min(moving.use->packets_per_second, fair);
+  auto &[out, in] = moving.packets_per_second;
+  out = state.random.between(1, most);
+  in = 1 + out * state.random.between(60, 120) / 100;
+  moving.controlled = moving.stalled || (moving.advisory != none && state.random.chance(1, 24));
+  if (moving.controlled) {
+    out = moving.stalled ? 0 : out / held_back;
+    in = moving.stalled ? 0 : in / held_back;
+  }
+  moving.due += state.random.between(2000, 6000);
+  if (!moving.connected) return;
+  const nexus &carrier = state.nexuses[state.channels[moving.channel].nexus];
+  const std::uint32_t usual = state.routes[moving.route].rtt;
+  const std::uint32_t seen = usual + state.random.below(usual / 8 + 1) + carrier.delay;
+  moving.rtt = moving.rtt ? (3 * moving.rtt + seen) / 4 : seen;
+}
+
+void enter(world &state, flow &walker, tcp::state next) {
+  const tcp_behaviour &behaviour = tcp_behaviours[next];
+  walker.state = next;
+  walker.tries = 0;
+  if (!behaviour.sends) walker.packets_per_second.out = 0;
+  if (!behaviour.receives) walker.packets_per_second.in = 0;
+  if (next == tcp::established) {
+    make_busy(state, walker);
+  } else {
+    const std::uint32_t trip = state.routes[walker.route].rtt / 1000 + 1;
+    const std::uint32_t lasts = behaviour.lasts ? behaviour.lasts : trip;
+    walker.due += lasts / 2 + state.random.below(lasts);
+  }
+  const traffic segment{control_packet, 1};
+  carry(state, walker, {segment, next == tcp::syn_sent ? traffic() : segment});
+}
+
 void replace_flows(world &state, std::uint32_t milliseconds) {
   open_missing_flows(state, milliseconds);
   for (flow &walker : state.flows) {
     const bool is_open = state.channels[walker.channel].state == channel::phase::open;
-    if (is_open && walker.due > state.elapsed) continue;
-    if (is_open) step(state, walker);
+    // Whatever the step, what happens to a flow has a time of its own.
+    while (is_open && walker.due <= state.elapsed && walker.state != tcp::gone) {
+      walker.use->protocol == tcp_protocol ? step_tcp(state, walker) : step_udp(state, walker);
+    }
     if (is_open && walker.state != tcp::gone) continue;
     release(state, walker);
     walker.state = tcp::gone;

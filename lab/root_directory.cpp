@@ -75,7 +75,7 @@ bool root_directory::put_host(std::string_view name) {
     return true;
   }
   table_file file(system.make_below("kernel"), "hostname");
-  file.put(std::as_bytes(std::span(name)));
+  file.put(std::as_bytes(std::span(name.substr(0, 64))));  // as long as hosts have them
   file.put('\n');
   return file.commit();
 }

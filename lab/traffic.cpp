@@ -33,17 +33,19 @@ two_way<traffic> background(world &state, const uuid &id, std::uint32_t busy, st
           some(2 + id.bytes[1] * busy / 256, 180U + id.bytes[3] * 4U)};
 }
 
-void count(channel &port, const two_way<traffic> &moved) {
-  port.moved.out.add(moved.out);
-  port.moved.in.add(moved.in);
+// Counts what a ring has moved. About 20 ms of traffic wait in it, or as much as is moved; what is not read
+// stays.
+void count(meter &ring, const traffic &moved, bool read, std::uint32_t milliseconds) {
+  ring.add(moved);
+  const std::uint64_t few = ring.waiting - std::min<std::uint64_t>(ring.waiting, moved.packets);
+  const std::uint64_t usual = read ? std::max(moved.packets * 20 / milliseconds, few) : channel::slots;
+  ring.waiting = static_cast<std::uint32_t>(
+      std::min<std::uint64_t>({usual, ring.waiting + moved.packets, channel::slots}));
 }
 
-// About 20 ms of traffic wait in a ring, or as much as is moved; what is not read stays.
-void fill_ring(meter &moved, std::uint64_t packets, bool read, std::uint32_t milliseconds) {
-  const std::uint64_t few = moved.waiting - std::min<std::uint64_t>(moved.waiting, packets);
-  const std::uint64_t usual = read ? std::max(packets * 20 / milliseconds, few) : channel::slots;
-  moved.waiting =
-      static_cast<std::uint32_t>(std::min<std::uint64_t>({usual, moved.waiting + packets, channel::slots}));
+void count(channel &port, const two_way<traffic> &moved, std::uint32_t milliseconds) {
+  count(port.moved.out, moved.out, true, milliseconds);
+  count(port.moved.in, moved.in, !port.reads_slowly, milliseconds);
 }
 
 // What a stack meets beside what its flows move: packets that have to be sent again, more of them where the
@@ -64,10 +66,8 @@ void disturb(world &state, channel &user, std::uint32_t loss) {
     }
     const std::uint32_t astray = (20 + key % 150) * level / 100;
     const std::uint64_t no_port = state.random.share(by_udp.in.packets, astray, million);
-    const std::uint64_t late = state.random.share(by_udp.in.packets, astray, 20 * million);
     user.stack.count[stack::no_port] += no_port;
-    user.stack.count[stack::full_socket] += late;
-    by_udp.in += {(no_port + late) * lost_size, no_port + late};
+    by_udp.in += {no_port * lost_size, no_port};
   }
   user.stack.count[stack::resent] += user.resent_now;
   user.resent_now = 0;
@@ -83,9 +83,7 @@ two_way<traffic> settle(world &state, channel &user, std::uint32_t loss, std::ui
     sum += now;
     now = {};
   }
-  count(user, sum);
-  fill_ring(user.moved.out, sum.out.packets, true, milliseconds);
-  fill_ring(user.moved.in, sum.in.packets, !user.reads_slowly, milliseconds);
+  count(user, sum, milliseconds);
   return sum;
 }
 
@@ -103,10 +101,7 @@ void cross(world &state, nexus &place, const two_way<traffic> &moved, std::uint3
   place.moved += moved;
   // Whoever looks at the interface sees all of it.
   for (std::uint32_t i = 0; i < place.channel_count; ++i) {
-    channel &monitor = state.channels[place.first_channel + i];
-    count(monitor, moved);
-    fill_ring(monitor.moved.out, moved.out.packets, true, milliseconds);
-    fill_ring(monitor.moved.in, moved.in.packets, true, milliseconds);
+    count(state.channels[place.first_channel + i], moved, milliseconds);
   }
 }
 
@@ -133,7 +128,7 @@ void pass_switch(world &state, nexus &place, std::uint32_t milliseconds) {
   for (std::uint32_t i = 0; i < place.channel_count; ++i) {
     channel &port = state.channels[place.first_channel + i];
     if (port.port == channel::device_port) device = &port;
-    if (port.port == channel::host_port) count(port, sum);
+    if (port.port == channel::host_port) count(port, sum, milliseconds);
   }
   for (std::uint32_t i = 0; i < place.channel_count; ++i) {
     channel &port = state.channels[place.first_channel + i];
@@ -149,7 +144,7 @@ void pass_switch(world &state, nexus &place, std::uint32_t milliseconds) {
   sum.in += {place.lost_now.in * lost_size, place.lost_now.in};
   place.lost_now = {};
   place.moved += sum;
-  if (device) count(*device, sum);
+  if (device) count(*device, sum, milliseconds);
   if (place.interface != none) cross(state, state.nexuses[place.interface], sum, place.loss, milliseconds);
 }
 
@@ -164,10 +159,8 @@ void forward(world &state, nexus &place, std::uint32_t milliseconds) {
     const std::uint32_t parts = sender.id.bytes[4] < 64 ? 12 : 1;
     const std::uint64_t gone = to_kernel ? 0 : state.random.share(sent.packets, parts, million);
     const traffic arrived = to_kernel ? answer : without(sent, gone);
-    sender.moved.out.add(sent);
-    receiver.moved.in.add(arrived);
-    fill_ring(sender.moved.out, sent.packets, true, milliseconds);
-    fill_ring(receiver.moved.in, arrived.packets, true, milliseconds);
+    count(sender.moved.out, sent, true, milliseconds);
+    count(receiver.moved.in, arrived, true, milliseconds);
     place.moved += {sent, arrived};
     (place.kind == nexus_kind::bridge ? place.lost[lost::not_sent] : sender.errors) += gone;
   }

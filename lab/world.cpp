@@ -73,11 +73,11 @@ void register_providers(world &state) {
     const nexus &instance = state.nexuses[i];
     if (instance.kind == nexus_kind::multistack) state.multistacks[instance.ordinal] = i;
   }
-  for (std::uint32_t i = 0; i < state.nexuses.size(); ++i) {
-    const nexus &below = state.nexuses[i];
+  for (const nexus &below : state.nexuses) {
     if (below.kind != nexus_kind::net_if || below.ordinal >= state.multistacks.size()) continue;
     const std::uint32_t above = state.multistacks[below.ordinal];
-    if (above != none) state.nexuses[above].interface = i;
+    if (above != none)
+      state.nexuses[above].interface = static_cast<std::uint32_t>(&below - state.nexuses.data());
   }
 }
 

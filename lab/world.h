@@ -6,6 +6,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -38,10 +39,10 @@ struct sizes {
 struct process {
   std::int32_t pid;  // 0 while it does not run
   std::uint32_t program;
-  std::uint32_t channels = 0;          // how many it has open
-  bool crashed = false;                // it is no more, and its channels are not closed yet
-  std::vector<bool> descriptors = {};  // by number: it is taken
-  std::size_t lowest = 0;              // no smaller one is free
+  std::uint32_t channels = 0;  // how many it has open
+  bool crashed = false;        // it is no more, and its channels are not closed yet
+  std::int32_t next_fd = 0;    // where no lower descriptor is free
+  std::set<std::int32_t> free = {};
 };
 
 enum class nexus_kind : std::uint8_t { multistack, net_if, bridge, user_pipe, kernel_pipe, scratch_pipe };

@@ -27,17 +27,6 @@ enum state : std::uint8_t {
 };
 }  // namespace tcp
 
-inline constexpr std::uint32_t control_packet = 60;  // bytes of a segment that carries no data
-
-struct tcp_behaviour {
-  tcp::state remote;  // the other end's state
-  bool sends;
-  bool receives;
-  std::uint32_t lasts;  // milliseconds on average; 0: until the peer answers
-  tcp::state next;
-};
-const tcp_behaviour &behaviour_of(std::uint8_t state);
-
 // The states of a flow's ends.
 two_way<std::uint32_t> states_of(const flow &source);
 
@@ -55,13 +44,6 @@ void replace_channels(world &state, std::uint32_t milliseconds);
 
 // Takes a channel with flows from its owner, and closes it at a time. At 0 that is soon, and for good.
 void make_defunct(world &state, channel &lost, std::uint64_t until);
-
-// Gives a switch its routes.
-void make_routes(world &state, flow_switch &carrier, std::uint32_t count);
-
-// The route of a flow that is opened, or none: for who connects to a host, which may be someone new, or is
-// `connected` to one.
-std::uint32_t choose_route(world &state, flow_switch &carrier, bool connected);
 
 // Lets round-trip times rise and fall.
 void wander_routes(world &state);

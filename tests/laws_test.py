@@ -25,8 +25,7 @@ SIGNS = (("lossy-link", "interface", r"BadLen +: (\d+)", 500),
          ("dead-peer", "netstat -s -p tcp", r"DropTO +: (\d+)", 2),
          ("port-exhaustion", "netns -i 10.0.0.2 -p tcp", r"49152-65535 +1 ", 1),
          ("port-exhaustion", "netstat -s -p tcp", r"EConnDrop +: (\d+)", 3),
-         ("crash", "channel", r"<unknown>\.\d+ .*DEFUNCT>", 1), ("crash", "flow-switch", r"FlowsAborted *: (\d+)", 3),
-         ("crash", "netstat --flow-owner", r"Destroyed", 1))
+         ("crash", "channel", r"<unknown>\.\d+ .*DEFUNCT>", 1), ("crash", "netstat --flow-owner", r"Destroyed", 1))
 
 
 def count(record, *names, block="counters"):
