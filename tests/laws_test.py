@@ -5,8 +5,8 @@ All figures are read as they lie in the tables. A moment is the kernel so many i
 import collections
 import re
 
-from records import TABLES, Kernel
-from runs import LabCase, generate, preloaded, top
+from records import TABLES
+from runs import LabCase, files, generate, preloaded, top
 
 SYN_SENT, SYN_RECEIVED, TIME_WAIT, NO_TRAFFIC = 2, 3, 10, 20
 CONTROLLED, RESOLVED, CLIENTS = 2, 1 << 6, 2  # flags of advisories and routes; the first port that may have flows
@@ -68,7 +68,8 @@ class Moment:
         return flow["sf_nx_uuid"], flow["sf_pid"], flow.table[slice(*ends)]
 
     def sums(self, owner):
-        """What an owner's stacks, rings and flows have sent and received, its datagrams that met no flow and connections that ended."""
+        """What an owner's stacks, rings and flows have sent and received, and how many datagrams
+        met no flow and connections ended."""
         stacks, flows = self.owners[owner]["stacks"], self.owners[owner]["flows"]
         by_stack = [sum(count(each, name, block="ip") + count(each, name, block="ip6") for each in stacks)
                     for name in ("LocalOut", "TotalRcvd")]
@@ -99,24 +100,19 @@ class Laws(LabCase):
         return Moment(self.kernel)
 
     def check_pipes_and_bridges(self, seen):
-        for nexus, group in seen.groups.items():
-            is_pipe = "pipe" in self.name(seen, nexus) or "content" in self.name(seen, nexus)
-            lost = errors(group) if is_pipe else 0
-            if "bridge" in self.name(seen, nexus):
-                lost, bridge = count(seen.switches[nexus], "Dropped"), seen.switches[nexus]
-                for way in "Tx", "Rx":
-                    self.assertEqual(count(bridge, way + "CopyDirect", way + "CopySum"), slots(group, way.lower()))
-            elif not is_pipe:
-                continue
-            self.assertEqual(slots(group, "tx"), slots(group, "rx") + lost)
-            if is_pipe and len(group) == 2:
-                self.assertEqual(slots(group[:1], "tx"), slots(group[1:], "rx") + errors(group[:1]))
-
-    def name(self, seen, nexus):
-        return seen.providers[nexus]["name"]
+        """What one end sends the other receives, or it is lost: of a pipe, and of a bridge, which sums its ports."""
+        for nexus, ends in seen.groups.items():
+            kind, = {"content-filter", "tunnel", "bridge"} & {*seen.providers[nexus]["name"].split(".")} or [""]
+            if kind == "content-filter" and len(ends) == 2:
+                self.assertEqual(slots(ends[:1], "tx"), slots(ends[1:], "rx") + errors(ends[:1]))
+                self.assertEqual(slots(ends[1:], "tx"), slots(ends[:1], "rx") + errors(ends[1:]))
+            elif kind == "bridge":
+                moved = [count(seen.switches[nexus], way + "CopyDirect", way + "CopySum") for way in ("Tx", "Rx")]
+                self.assertEqual(moved, [slots(ends, "tx"), slots(ends, "rx")])
+                self.assertEqual(moved[0], moved[1] + count(seen.switches[nexus], "Dropped"))
 
     def check_switches(self, seen):
-        """What crosses an interface is what its host and the stacks of its switch have sent and got, and what got lost."""
+        """What crosses an interface is what host and stacks have sent and got, and what got lost."""
         for each in seen.tables["stats/net_if"]:
             self.assertEqual(count(each, "Dropped"), count(each, "NoMemPkt", "BadLen", "TxEnqueueDrop"))
             for monitor in seen.groups[each["nx_uuid"]]:
@@ -250,6 +246,22 @@ class Laws(LabCase):
         held, others = map(rates("--incident stalled-flow").get, (CONTROLLED, 0))
         self.assertIn(0, held)
         self.assertLess(4 * sum(held) / len(held), sum(others) / len(others))
+
+    def test_OptionsOfTheMachine(self):
+        known = [line.split()[0] for line in self.lab("run --incident list").out.splitlines()]
+        self.assertEqual((len(known), known[0], known[-1]), (8, "lossy-link", "crash"))
+        for words in ("generate a --incident nope", "generate a --incident leak@x", "generate a --incident leak@-1",
+                      "generate a --host ''", "simulate a --after 1", "generate a --after 86401", "capture a --host b"):
+            self.assertEqual(self.lab(words).status, 64, words)
+        late, early = [generate(self.directory / at, "--incident", f"leak@{at}", "--after", 2.5).table("stats/arena")
+                       for at in ("7.5", "0")]
+        self.assertNotEqual(late, early)
+        generate(self.kernel.root, "--host", "box.example")
+        self.assertEqual(self.lab("capture named").status, 0)
+        self.assertIn("\nhost: box.example\n", (self.directory / "named/capture.txt").read_text())
+        self.assertEqual(self.lab("capture redacted --redact").status, 0)
+        self.assertFalse([path for path, held in files(self.directory / "redacted").items() if b"box" in held])
+        self.assertFalse(generate(self.kernel.root).path("../../kernel").exists())
 
     def test_IncidentsShowWhereTheGuideLooks(self):
         usual = generate(self.directory / "usual", "--after", 120)
