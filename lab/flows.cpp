@@ -39,17 +39,17 @@ void make_routes(world &state, flow_switch &carrier, std::uint32_t count) {
   }
 }
 
-// The route of a flow, or none: for who connects to a host, which may be someone new, or is `connected` to
+// The route of a flow, or none: for who connects to a host, which may be someone new, or is `answered` by
 // one.
-std::uint32_t choose_route(world &state, flow_switch &carrier, bool connected) {
+std::uint32_t choose_route(world &state, flow_switch &carrier, bool answered) {
   if (carrier.route_count == 0) return none;
-  if (!connected && carrier.dead_route != none && state.random.chance(1, 2)) return carrier.dead_route;
+  if (!answered && carrier.dead_route != none && state.random.chance(1, 2)) return carrier.dead_route;
   const std::uint32_t index = carrier.first_route + state.random.below(carrier.route_count);
   route &way = state.routes[index];
   if (way.flows == 0 && index != carrier.dead_route && state.random.chance(3, 4)) {
     meet_someone(state, carrier, way);
   }
-  return connected && !way.answers ? none : index;
+  return answered && !way.answers ? none : index;
 }
 
 // Some flows of a new machine are in one of these, so that there is one in each state.
@@ -81,9 +81,9 @@ void take_advisory(flow_switch &carrier, flow &taker) {
   }
 }
 
-bool connect(world &state, flow &made, bool connected) {
+bool connect(world &state, flow &made, bool answered) {
   flow_switch &carrier = state.switches[state.channels[made.channel].flow_switch];
-  made.route = choose_route(state, carrier, connected || made.use->inbound);
+  made.route = choose_route(state, carrier, answered || made.use->inbound);
   if (made.route == none) return false;
   route &way = state.routes[made.route];
   made.ipv6 = way.kind != address_kind::ipv4;
