@@ -189,7 +189,7 @@ void wander_routes(world &state) {
 void start_listening(world &state, std::uint32_t channel_index) {
   for (const service &offered : program_of(state, channel_index).services) {
     const std::uint8_t waiting = offered.protocol == tcp_protocol ? tcp::listening : tcp::closed;
-    const bool fits = offered.inbound && state.flows.size() < state.size.flows;
+    const bool fits = offered.inbound && 2 * state.flows.size() < state.size.flows;
     if (fits) open_in(state, channel_index, offered, waiting, 1);
   }
 }
