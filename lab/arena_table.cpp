@@ -62,19 +62,55 @@ constexpr arena_parts policy_parts{arena_types.number("PLCY"), 1 << 0 | 1 << 5 |
 constexpr arena_parts switch_parts{arena_types.number("NEXUS"), 0xfff};
 constexpr arena_parts pipe_parts{arena_types.number("NEXUS"), 0xfff & ~(1 << 6 | 1 << 7)};
 
+struct region_usage {
+  std::uint64_t packets = 0;   // that came and went
+  std::uint32_t channels = 1;  // that there may be, were opened so far, and are open
+  std::uint32_t opened = 1;
+  std::uint32_t open = 1;
+  std::uint32_t leaked = 0;  // thousandths
+};
+
+// By scope.
+struct arena_owner {
+  uuid ids[scopes];
+  std::string names[scopes];
+  region_usage used[scopes];
+};
+
 std::uint64_t rounded_up(std::uint64_t value, std::uint64_t step) {
   return (value + step - 1) / step * step;
 }
 
+// How a region is used, in segments. None of it ever falls but what is in use.
+void use_region(tv_stats_region &made, const region_usage &usage, std::uint64_t key) {
+  const std::uint64_t usual = made.seg_count;
+  // A third for the channels that are open, a tenth more or less with the packets that come and go.
+  const std::uint64_t each = usual / 3 / std::max(usage.channels, 1U);
+  const std::uint64_t wave = usual / 10;
+  const std::uint64_t cached = std::max<std::uint64_t>(made.objs_per_seg, 1) * (3 + key % 4);
+  made.allocs = usual * 2 / 5 + wave + usage.packets / cached;
+  const std::uint64_t at = wave ? made.allocs / 2 % (2 * wave) : 0;
+  made.seg_in_use = usual * 2 / 5 + std::min(at, 2 * wave - at) + usage.open * each;
+  made.allocs += usage.opened * each;
+  if (usual == 1) made.seg_in_use = made.allocs = 1;
+  // It is scaled anew to up to twice its size, and then it is full.
+  const std::uint64_t leaked = usual * usage.leaked / 1000;
+  made.seg_count += usual > 1 ? std::min(leaked, usual) : 0;
+  made.rescales = usual > 8 ? key / 8 % 5 + (made.seg_count - usual + 7) / 8 : 0;
+  made.allocs += leaked;
+  made.seg_in_use += leaked;
+  made.frees = made.allocs - made.seg_in_use;
+  const std::uint64_t missing = made.seg_in_use - std::min(made.seg_in_use, made.seg_count);
+  made.seg_in_use -= missing;
+  made.allocs -= missing;
+}
+
 // The state of a region follows from whose it is, so that all arenas that have it show the same.
-tv_stats_region region_of(const world &state, std::size_t type, const uuid &owner,
-                          const std::string &owner_name) {
+tv_stats_region region_of(const world &state, std::size_t type, const arena_owner &whose) {
   const region_shape &shape = region_shapes[type];
-  std::uint64_t key;
-  std::memcpy(&key, owner.bytes, sizeof key);
-  random_source random(state.seed, 16 + type, key);
+  random_source random(state.seed, 16 + type, key_of(whose.ids[shape.shared]));
   tv_stats_region made{};
-  std::string name = owner_name + ".";
+  std::string name = whose.names[shape.shared] + ".";
   for (const char c : region_types.rows[type].name.view()) name += static_cast<char>(std::tolower(c));
   set_text(made.name, name);
   made.region_uuid = random.identity();
@@ -88,25 +124,12 @@ tv_stats_region region_of(const world &state, std::size_t type, const uuid &owne
   made.seg_size = shape.segment_size;
   made.objs_per_seg = shape.mode & monolithic ? shape.objects : made.seg_size / made.obj_size;
   made.seg_count = rounded_up(shape.objects, made.objs_per_seg) / made.objs_per_seg;
+  use_region(made, whose.used[shape.shared], key_of(made.region_uuid));
   made.obj_count = made.seg_count * made.objs_per_seg;
   made.mem_total = made.seg_count * made.seg_size;
-  // Half to all segments are in use, a few more or less from second to second.
-  const std::uint64_t seconds = state.elapsed / 1000;
-  random_source now(random.next(), seconds);
-  made.seg_in_use = made.seg_count - made.seg_count * (random.below(40) + now.below(10)) / 100;
   made.mem_wired = shape.wired ? made.seg_in_use * made.seg_size : 0;
-  const std::uint64_t each_second = made.seg_count > 1 ? made.seg_count / 10 + 1 + random.below(4) : 0;
-  made.frees = random.below(500) + seconds * each_second;
-  made.allocs = made.frees + made.seg_in_use;
-  made.rescales = made.seg_count > 8 ? random.below(5) + seconds / 600 : 0;
   return made;
 }
-
-// By scope.
-struct arena_owner {
-  uuid ids[scopes];
-  std::string names[scopes];
-};
 
 void put_arena(const world &state, const arena_parts &parts, const arena_owner &owner,
                const std::vector<std::int32_t> &pids, table_file &file) {
@@ -114,9 +137,8 @@ void put_arena(const world &state, const arena_parts &parts, const arena_owner &
   set_text(arena.name, owner.names[channel_scope]);
   arena.type = parts.type;
   for (std::size_t type = 0; type < tv_stats_arena::region_slots; ++type) {
-    const scope shared = region_shapes[type].shared;
     if ((parts.regions >> type & 1) == 0) continue;
-    arena.regions[type] = region_of(state, type, owner.ids[shared], owner.names[shared]);
+    arena.regions[type] = region_of(state, type, owner);
   }
   for (std::size_t i = 0; i < std::min(pids.size(), tv_stats_arena::pid_slots); ++i) arena.pids[i] = pids[i];
   file.put(arena);
@@ -153,6 +175,10 @@ void put_channel_arena(const world &state, const channel &used, std::size_t turn
     owner.ids[channel_scope] = random_source(turn, used.id.bytes[0], used.id.bytes[1]).identity();
     owner.names[channel_scope].append(1, '.').append(std::to_string(turn));
   }
+  owner.used[nexus_scope] = {place.moved.out.packets + place.moved.in.packets, place.channel_count,
+                             place.opened, place.open, place.leaked};
+  owner.used[channel_scope].packets = used.moved.out.total.packets + used.moved.in.total.packets;
+  owner.used[channel_scope].open = used.state == channel::phase::open;
   const arena_parts &parts = place.kind == nexus_kind::multistack ? switch_parts : pipe_parts;
   put_arena(state, parts, owner, users_of(state, used), file);
 }

@@ -9,12 +9,26 @@
 
 #include "common/captured.h"
 #include "lab/table_file.h"
+#include "platform/sysctl.h"
 
 namespace lab {
 
 namespace {
 
 constexpr char unfinished[] = ".new";
+
+// What the kernel in sight calls its machine; the name of this one where that kernel does not say.
+std::string host_name() {
+  utsname machine{};
+  uname(&machine);
+  char name[sizeof machine.nodename + 1];
+  std::size_t length = sizeof name;
+  std::string host = machine.nodename;
+  if (sysctlbyname("kernel.hostname", name, &length, nullptr, 0) == 0) host.assign(name, length);
+  if (host.ends_with('\n')) host.pop_back();
+  std::ranges::replace(host, '\n', '?');
+  return host;
+}
 
 }  // namespace
 
@@ -33,10 +47,7 @@ bool write_note(const own_directory &top, time_t taken, bool redacted) {
   tm utc;
   char time[32];
   strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", gmtime_r(&taken, &utc));
-  utsname machine{};
-  uname(&machine);
-  std::string host = redacted ? capture_note::redacted_host : machine.nodename;
-  std::ranges::replace(host, '\n', '?');
+  const std::string host = redacted ? capture_note::redacted_host : host_name();
   const std::string text = "format: " + std::string(capture_note::known_format) + "\ntime: " + time +
                            "\nhost: " + host + "\nredacted: " + (redacted ? "yes" : "no") + "\n";
   table_file file(top.enter("."), capture_note::file_name);

@@ -22,8 +22,8 @@ std::uint32_t part(std::uint32_t total, std::uint32_t number, std::uint32_t ring
 }
 
 // What a ring moves, in operations of about `batch` slots. A packet takes a slot.
-ring_activity activity_of(const meter &moved, std::uint32_t batch, std::uint32_t number,
-                          std::uint32_t rings) {
+ring_activity activity_of(const meter &moved, std::uint64_t key, std::uint32_t number, std::uint32_t rings) {
+  const auto batch = static_cast<std::uint32_t>(3 + key % 6);
   const std::uint64_t slots = part(moved.total.packets, number, rings);
   return {.slots = slots,
           .bytes = part(moved.total.bytes, number, rings),
@@ -36,31 +36,37 @@ ring_activity activity_of(const meter &moved, std::uint32_t batch, std::uint32_t
           .bytes_per_sec_avg = part(moved.bytes_average, number, rings)};
 }
 
-// The sync side's rates are those of one sync.
-void set_per_sync(ring_activity &sync) {
+// What the process has put into a ring to send, or taken from one: `waiting` slots more or less than was
+// transferred. Its rates are those of one sync.
+ring_activity sync_of(meter moved, std::uint64_t waiting, std::uint64_t key, std::uint32_t number,
+                      std::uint32_t rings) {
+  constexpr std::uint64_t least = 60;  // bytes of a packet
+  moved.total.packets += waiting;
+  moved.total.bytes += least * waiting;
+  ring_activity sync = activity_of(moved, key, number, rings);
+  sync.count = (sync.count + 1) / 2;
   const std::uint64_t count = std::max<std::uint64_t>(sync.count, 1);
+  const std::uint64_t size = sync.bytes / std::max<std::uint64_t>(sync.slots, 1);
   sync.slots_per_sec_avg = static_cast<std::uint32_t>(sync.slots / count);
   sync.bytes_per_sec_avg = sync.bytes / count;
-  const std::uint64_t size = sync.bytes / std::max<std::uint64_t>(sync.slots, 1);
   sync.slots_per_sec = std::min(sync.slots_per_sec, sync.slots_per_sec_avg + (sync.slots_per_sec & 1));
   sync.bytes_per_sec = sync.slots_per_sec * size;
+  return sync;
 }
 
-void put_rings(const meter &moved, const uuid &id, std::uint32_t batch, std::uint32_t rings,
+// `errors` of what is sent: most packets come from who does not keep to the rules.
+void put_rings(const meter &moved, std::uint64_t key, bool sent, std::uint64_t errors, std::uint32_t rings,
                table_file &file) {
   for (std::uint32_t number = 0; number < rings; ++number) {
     ring_stats ring{};
     ring.ring_id = number;
-    ring.xfer = activity_of(moved, batch, number, rings);
-    ring.sync = activity_of(moved, 2 * batch, number, rings);
-    set_per_sync(ring.sync);
-    constexpr std::uint32_t slots = 512;
-    ring.mem_total = slots * buffer_size;
-    // What waits in the ring: about 20 ms of traffic.
-    ring.mem_used = std::min(slots, ring.xfer.slots_per_sec / 50) * buffer_size;
-    // A rare channel has a peer that does not keep to the rules.
-    if (id.bytes[4] < 12) ring.err_len_modified = ring.xfer.slots / 90'000;
-    if (id.bytes[4] < 4) ring.err_corrupted = ring.xfer.slots / 1'300'000;
+    ring.xfer = activity_of(moved, key, number, rings);
+    const std::uint64_t waiting = moved.waiting;
+    ring.sync = sync_of(moved, sent ? waiting : 0 - waiting, key, number, rings);
+    ring.mem_total = channel::slots * buffer_size;
+    ring.mem_used = part(waiting, number, rings) * buffer_size;
+    ring.err_corrupted = part(errors / 16, number, rings);
+    ring.err_len_modified = part(errors - errors / 16, number, rings);
     file.put(ring);
   }
 }
@@ -74,7 +80,7 @@ std::uint32_t flags_of(const world &state, const channel &source) {
   constexpr std::uint32_t may_be_taken = bit("DEFUNCT_OK");
   constexpr std::uint32_t exclusive = bit("EXCLUSIVE");
   if (source.state == channel::phase::defunct) return user_pool | may_be_taken | channel_entry::defunct;
-  if (source.flow_switch != none) return user_pool | may_be_taken;
+  if (source.flow_switch != none) return user_pool | (is_server(state, source) ? 0 : may_be_taken);
   switch (state.nexuses[source.nexus].kind) {
     case nexus_kind::net_if:
       return monitor;
@@ -97,8 +103,9 @@ void put_channel(const world &state, const channel &source, table_file &file) {
                          .port = source.port,
                          .n_tx_rings = tx_rings,
                          .n_rx_rings = rx_rings});
-  put_rings(source.moved.out, source.id, 4, tx_rings, file);
-  put_rings(source.moved.in, source.id, 8, rx_rings, file);
+  const std::uint64_t key = key_of(source.id);
+  put_rings(source.moved.out, key, true, source.errors, tx_rings, file);
+  put_rings(source.moved.in, key / 8, false, 0, rx_rings, file);
 }
 
 }  // namespace

@@ -53,13 +53,20 @@ std::uint32_t port_of(nexus_kind kind, std::uint32_t number) {
   return number == 0 ? 2 : number - 1;
 }
 
+// The lowest free descriptor, as every kernel gives it.
+std::int32_t take_descriptor(process &owner) {
+  return owner.free.empty() ? owner.next_fd++ : owner.free.extract(owner.free.begin()).value();
+}
+
 void open_channel(world &state, channel &opened) {
   process &owner = state.processes[opened.process];
+  // Whoever has a channel has a few files, too.
   if (owner.next_fd == 0) owner.next_fd = static_cast<std::int32_t>(state.random.between(3, 20));
   opened.id = state.random.identity();
-  opened.fd = owner.next_fd;
-  owner.next_fd += static_cast<std::int32_t>(state.random.between(1, 3));
+  opened.fd = take_descriptor(owner);
   ++owner.channels;
+  ++state.nexuses[opened.nexus].opened;
+  ++state.nexuses[opened.nexus].open;
   opened.state = channel::phase::open;
 }
 
@@ -68,15 +75,17 @@ void remember_past(world &state, channel &opened) {
   for (int kind = 0; kind < 4; ++kind) {
     const std::uint64_t packets = state.random.between(5000, 400'000);
     const std::uint64_t answers = packets / state.random.between(1, 4);
-    carry(state, opened, kind & 2, kind & 1, {{packets * 300, packets}, {answers * 900, answers}});
+    opened.now[kind / 2][kind % 2] += {{packets * 300, packets}, {answers * 900, answers}};
   }
-  const auto services = programs[state.processes[opened.process].program].services;
-  const bool serves = !services.empty() && services.front().inbound;
-  const std::uint32_t many = state.random.between(10, 900);
-  const std::uint32_t few = state.random.between(0, 12);
-  opened.stack.initiated = serves ? few : many;
-  opened.stack.accepted = serves ? many : few;
-  opened.stack.closed = many + few;
+  std::uint32_t initiated = state.random.between(10, 900);
+  std::uint32_t accepted = state.random.between(0, 12);
+  if (is_server(state, opened)) std::swap(initiated, accepted);
+  auto &count = opened.stack.count;
+  count[stack::initiated] = initiated;
+  count[stack::accepted] = accepted;
+  count[stack::closed] = initiated + accepted;
+  count[stack::refused] = initiated / state.random.between(15, 60);
+  count[stack::established] = count[stack::closed] - count[stack::refused];
 }
 
 std::uint32_t owner_of(const world &state, const nexus &place, std::uint32_t port) {
@@ -85,6 +94,13 @@ std::uint32_t owner_of(const world &state, const nexus &place, std::uint32_t por
     return process_for(state, client % flow_programs, client / flow_programs);
   }
   return process_for(state, plans[static_cast<int>(place.kind)].owners[port > 0], place.ordinal);
+}
+
+// The kernel takes the channel of a client that sleeps.
+void take_channel(world &state, channel &taken) {
+  if (taken.state != channel::phase::open || is_server(state, taken)) return;
+  if (!state.incidents.empty()) return;  // trouble does not hide behind another
+  make_defunct(state, taken, state.elapsed + state.random.between(4'000, 60'000));
 }
 
 void populate(world &state, std::uint32_t nexus_index) {
@@ -102,9 +118,17 @@ void populate(world &state, std::uint32_t nexus_index) {
     }
     open_channel(state, made);
     // Now and then the kernel has taken a channel from a process that sleeps.
-    if (has_flows && state.flow_channels.size() % 9 == 0) made.state = channel::phase::defunct;
+    if (has_flows && state.flow_channels.size() % 9 == 0) take_channel(state, made);
     state.channels.push_back(made);
   }
+}
+
+void forget_process(world &state, channel &last) {
+  process &owner = state.processes[last.process];
+  // Nobody has heard of a process that came and went between two snapshots.
+  const bool is_news = std::erase(state.started, last.process) == 0;
+  if (is_news && !owner.crashed) state.ended.push_back(owner.pid);
+  owner = {.pid = 0, .program = owner.program};
 }
 
 void close_channel(world &state, channel &closed) {
@@ -112,10 +136,10 @@ void close_channel(world &state, channel &closed) {
   state.switches[closed.flow_switch].closed += closed.stack;
   closed.stack = {};
   closed.moved = {};
+  closed.reads_slowly = false;
   process &owner = state.processes[closed.process];
-  if (--owner.channels) return;
-  state.ended.push_back(owner.pid);
-  owner.pid = 0;
+  owner.free.insert(closed.fd);
+  if (--owner.channels == 0) forget_process(state, closed);
 }
 
 void reopen_channel(world &state, std::uint32_t index) {
@@ -124,15 +148,19 @@ void reopen_channel(world &state, std::uint32_t index) {
   if (owner.pid == 0) {
     state.next_pid += static_cast<std::int32_t>(state.random.between(1, 30));
     owner.pid = state.next_pid;
-    owner.next_fd = 0;
     state.started.push_back(opened.process);
   }
-  opened.listeners = 0;
   open_channel(state, opened);
   start_listening(state, index);
 }
 
 }  // namespace
+
+void make_defunct(world &state, channel &lost, std::uint64_t until) {
+  if (lost.state == channel::phase::open) --state.nexuses[lost.nexus].open;
+  lost.state = channel::phase::defunct;
+  lost.due = until;
+}
 
 std::uint32_t process_for(const world &state, std::uint32_t program, std::uint32_t instance) {
   const auto processes = static_cast<std::uint32_t>(state.processes.size());
@@ -142,44 +170,33 @@ std::uint32_t process_for(const world &state, std::uint32_t program, std::uint32
   return program + instance % instances * kinds;
 }
 
+bool is_server(const world &state, const channel &owned) {
+  const auto services = programs[state.processes[owned.process].program].services;
+  return std::ranges::any_of(services, &service::inbound);
+}
+
 void open_channels(world &state) {
   if (state.processes.empty()) return;
   deal_channels(state.nexuses, state.size.channels);
   for (std::uint32_t i = 0; i < state.nexuses.size(); ++i) populate(state, i);
-  for (const std::uint32_t index : state.flow_channels) {
-    channel &opened = state.channels[index];
-    flow_switch &carrier = state.switches[opened.flow_switch];
-    if (carrier.closed.closed == 0) {
-      // Each switch has seen someone who is gone.
-      remember_past(state, opened);
-      carrier.closed = opened.stack;
-      opened.stack = {};
-      opened.moved = {};
-    }
-    remember_past(state, opened);
-  }
+  for (const std::uint32_t index : state.flow_channels) remember_past(state, state.channels[index]);
 }
 
 void replace_channels(world &state, std::uint32_t milliseconds) {
+  constexpr std::uint32_t lasts = 600'000;
   const auto count = static_cast<std::uint32_t>(state.flow_channels.size());
-  const auto losses = std::min<std::uint64_t>(state.random.share(count, milliseconds, 60'000), count / 4 + 1);
-  for (std::uint64_t left = losses; left; --left) {
-    channel &lost = state.channels[state.flow_channels[state.random.below(count)]];
-    if (lost.state != channel::phase::open) continue;
-    lost.state = channel::phase::defunct;
-    lost.left = state.random.between(1500, 5000);
+  for (std::uint64_t left = state.random.share(count, milliseconds, lasts); left; --left) {
+    take_channel(state, state.channels[state.flow_channels[state.random.below(count)]]);
   }
   for (const std::uint32_t index : state.flow_channels) {
     channel &waiting = state.channels[index];
-    if (waiting.state == channel::phase::open) continue;
-    if (waiting.left > milliseconds) {
-      waiting.left -= milliseconds;
-    } else if (waiting.state == channel::phase::defunct) {
-      close_channel(state, waiting);
-      waiting.left = state.random.between(500, 3000);
-    } else {
-      reopen_channel(state, index);
+    if (waiting.state == channel::phase::open || waiting.due > state.elapsed) continue;
+    if (waiting.state == channel::phase::closed) {
+      if (!state.processes[waiting.process].crashed) reopen_channel(state, index);
+      continue;
     }
+    close_channel(state, waiting);
+    waiting.due = waiting.due == 0 ? never : state.elapsed + state.random.between(1000, 10'000);
   }
 }
 

@@ -4,16 +4,19 @@
 #include <charconv>
 #include <cmath>
 #include <cstdlib>
+#include <string_view>
 #include <utility>
 
 #include "common/text/output.h"
 #include "common/text/text.h"
+#include "lab/incidents.h"
 
 namespace lab {
 
 namespace {
 
 constexpr std::uint32_t most_records = 10'000'000;
+constexpr std::uint32_t longest = 86'400'000;  // milliseconds
 constexpr char records[] = "0 to 10000000";
 
 template <auto Field, std::uint64_t Most = most_records, std::uint64_t Least = 0>
@@ -25,16 +28,47 @@ bool take_number(std::string_view value, options &asked) {
   return number >= Least && number <= Most;
 }
 
-// Seconds, with decimals or without.
-bool take_every(std::string_view value, options &asked) {
+// Seconds, with decimals or without, in milliseconds.
+bool parse_seconds(std::string_view text, std::uint32_t least, std::uint32_t most,
+                   std::uint32_t &milliseconds) {
   double seconds = 0;
   const auto [end, error] =
-      std::from_chars(value.data(), value.data() + value.size(), seconds, std::chars_format::fixed);
-  if (error != std::errc() || end != value.data() + value.size()) return false;
+      std::from_chars(text.data(), text.data() + text.size(), seconds, std::chars_format::fixed);
+  if (error != std::errc() || end != text.data() + text.size()) return false;
   // In this order a number that is none is refused.
-  if (!(seconds * 1000 >= 10 && seconds * 1000 <= 3'600'000)) return false;
-  asked.every = static_cast<std::uint32_t>(std::lround(seconds * 1000));
+  if (!(seconds * 1000 >= least && seconds * 1000 <= most)) return false;
+  milliseconds = static_cast<std::uint32_t>(std::lround(seconds * 1000));
   return true;
+}
+
+template <auto Field, std::uint32_t Least, std::uint32_t Most>
+bool take_seconds(std::string_view value, options &asked) {
+  return parse_seconds(value, Least, Most, asked.*Field);
+}
+
+// NAME or NAME@SECONDS.
+bool take_incident(std::string_view word, options &asked) {
+  const std::size_t end = word.find('@');
+  const auto known = std::ranges::find(incidents, word.substr(0, end), &incident::name);
+  std::uint32_t begins = 0;
+  if (known == incidents.end()) return false;
+  if (end != word.npos && !parse_seconds(word.substr(end + 1), 0, longest, begins)) return false;
+  asked.incidents.push_back({&*known, begins});
+  return true;
+}
+
+// A name that stands in one line, as a kernel has it.
+bool take_host(std::string_view value, options &asked) {
+  constexpr std::size_t most = 64;
+  asked.host = value;
+  const auto is_text = [](char c) { return c > ' ' && c < 0x7f; };
+  return !asked.host.empty() && asked.host.size() <= most && std::ranges::all_of(asked.host, is_text);
+}
+
+int list_incidents() {
+  for (const incident &row : incidents) print<"%-16s %s\n">(row.name, row.story);
+  report.flush();
+  return EXIT_SUCCESS;
 }
 
 bool take_redact(std::string_view /*value*/, options &asked) {
@@ -66,7 +100,13 @@ constexpr option_row option_rows[] = {
      take_number<&options::seed, UINT64_MAX>},
     {in_simulate | in_run, "--interval", "MS", "10 to 3600000", "milliseconds between two snapshots (1000)",
      take_number<&options::interval, 3'600'000, 10>},
-    {in_capture, "--every", "SECONDS", "0.01 to 3600", "the time between two moments", take_every},
+    {in_worlds, "--host", "NAME", "1 to 64 printable characters", "what the machine is called", take_host},
+    {in_worlds, "--incident", "NAME[@S]", "a name of --incident list, and when", "let something go wrong",
+     take_incident},
+    {in_generate, "--after", "SECONDS", "0 to 86400", "how long it has run",
+     take_seconds<&options::after, 0, longest>},
+    {in_capture, "--every", "SECONDS", "0.01 to 3600", "the time between two moments",
+     take_seconds<&options::every, 10, 3'600'000>},
     {in_capture, "--count", "N", "1 to 10000000", "how many moments",
      take_number<&options::count, most_records, 1>},
     {in_capture, "--redact", "", "", "put substitutes for addresses and names", take_redact},
@@ -169,6 +209,10 @@ int run_command_line(int argc, char **argv) {
     refuse(argc > 1 ? "there is no command '" + std::string(word) + "'" : "a command is missing");
     return exit_status::usage;
   }
+  const bool makes_world = row->bit & in_worlds;
+  if (makes_world && argc == 4 && argv[2] == std::string_view("--incident") &&
+      argv[3] == std::string_view("list"))
+    return list_incidents();
   // In front of what is another command's.
   for (char **each = argv + 2; *each && *each != std::string_view("--"); ++each) {
     if (*each == std::string_view("--help")) return help(row->bit);

@@ -7,6 +7,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "lab/world.h"
 
@@ -16,8 +17,11 @@ namespace lab {
 struct options : sizes {
   std::uint64_t seed = 1;
   std::uint32_t interval = 1000;  // milliseconds between two snapshots
-  std::uint32_t every = 0;        // milliseconds between two captured moments; 0: there is one
-  std::uint32_t count = 0;        // captured moments, where there are several
+  std::uint32_t after = 0;  // milliseconds that a generated one has moved, in its incidents where it has any
+  std::vector<planned_incident> incidents;
+  std::string host;         // empty: the machine has no name of its own
+  std::uint32_t every = 0;  // milliseconds between two captured moments; 0: there is one
+  std::uint32_t count = 0;  // captured moments, where there are several
   bool redact = false;
   std::string directory;     // empty: none given
   char **command = nullptr;  // what stands behind "--", ended by a null entry

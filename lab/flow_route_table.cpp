@@ -36,12 +36,13 @@ void write_routes(const world &state, table_file &file) {
     record.sfr_refs = way.flows;
     record.sfr_local = interface_address(state.seed, carrier.ordinal, way.kind);
     record.sfr_remote = way.remote;
-    // It is resolved anew from time to time; shortly before, there is no one to send frames to.
+    // It is resolved anew shortly before it expires. A neighbour that does not answer has no address.
     const std::uint64_t age = state.elapsed / 1000 + random.below(lifetime);
-    record.sfr_expire = lifetime - static_cast<std::int64_t>(age % lifetime);
+    const bool has_mac = way.answers || !way.on_link;
+    record.sfr_expire = has_mac ? lifetime - static_cast<std::int64_t>(age % (lifetime - 60)) : 0;
     record.sfr_flags = way.on_link ? has_no_gateway : tv_stats_flow_route::has_gateway;
     if (!way.on_link) record.sfr_gateway = gateway_address(carrier.ordinal, way.kind != address_kind::ipv4);
-    if (record.sfr_expire > lifetime / 20) {
+    if (has_mac) {
       record.sfr_flags |= resolved | tv_stats_flow_route::has_mac;
       set_mac(state, record, carrier.ordinal, way.on_link ? i : none);
     }

@@ -2,8 +2,8 @@
 
 #include "common/tables/flow.h"
 
-#include "lab/flow_states.h"
 #include "lab/tables.h"
+#include "lab/world_parts.h"
 
 namespace lab {
 
@@ -25,14 +25,6 @@ std::uint32_t flags_of(const flow &source) {
   flags |= tracked;
   if (source.state == tcp::time_wait || source.state == tcp::closed) return flags | waits_for_close;
   return source.state > tcp::established ? flags | tells_close : flags;
-}
-
-// Measured where there is a connection; about the route's, a little different each time.
-std::uint32_t round_trip_time(const world &state, const flow &source, std::uint64_t side) {
-  if (!was_connected(source) || source.route == none) return 0;
-  random_source random(state.seed ^ side, source.id.bytes[3], source.id.bytes[5] + state.elapsed);
-  const std::uint32_t usual = state.routes[source.route].rtt;
-  return usual + random.below(usual / 4 + 1);
 }
 
 tv_flow_endpoint_stats end_of(const traffic &moved, std::uint32_t end_state, std::uint32_t rtt) {
@@ -67,8 +59,8 @@ void write_flows(const world &state, table_file &file) {
     record.sf_svc = source.use->service_class;
     record.sf_adv_idx = source.advisory;
     const two_way<std::uint32_t> ends = states_of(source);
-    record.sf_lstats = end_of(source.moved.out, ends.out, round_trip_time(state, source, 1));
-    record.sf_rstats = end_of(source.moved.in, ends.in, round_trip_time(state, source, 2));
+    record.sf_lstats = end_of(source.moved.out, ends.out, source.rtt);
+    record.sf_rstats = end_of(source.moved.in, ends.in, source.rtt - source.rtt / 16);
     file.put(record);
   }
 }

@@ -1,5 +1,6 @@
 // generate and simulate: a world in a directory.
 
+#include <algorithm>
 #include <cstdlib>
 #include <optional>
 
@@ -12,8 +13,23 @@
 
 namespace lab {
 
+simulation::simulation(const options &asked, own_directory directory)
+    : root_(std::move(directory)),
+      state_(make_world(asked, asked.seed)),
+      interval_(asked.interval),
+      host_(asked.host) {
+  state_.incidents = asked.incidents;
+  std::uint64_t until = asked.after;
+  for (const planned_incident &planned : asked.incidents) {
+    if (asked.after) until = std::max(until, planned.begins + asked.after);
+  }
+  while (state_.elapsed < until) {
+    advance(state_, static_cast<std::uint32_t>(std::min<std::uint64_t>(until - state_.elapsed, interval_)));
+  }
+}
+
 bool simulation::start() {
-  return root_.prepare() && root_.remove_processes() && root_.publish(state_);
+  return root_.prepare() && root_.remove_processes() && root_.put_host(host_) && root_.publish(state_);
 }
 
 bool simulation::keep_moving(const sigset_t &stop) {

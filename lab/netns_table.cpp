@@ -5,8 +5,8 @@
 #include <algorithm>
 #include <map>
 
-#include "lab/flow_states.h"
 #include "lab/tables.h"
+#include "lab/world_parts.h"
 
 namespace lab {
 
@@ -89,9 +89,18 @@ tv_stats_netns head_of(const world &state, std::size_t number) {
   return head;
 }
 
-tv_stats_netns_range range_of(std::uint16_t first, std::uint16_t last, const reservation &held) {
-  return {.first_port = first,
-          .last_port = last,
+// How many ephemeral ports someone holds of a namespace, in one piece.
+std::uint32_t reserved_ports(const world &state, std::size_t number) {
+  for (const flow_switch &carrier : state.switches) {
+    const std::uint32_t ordinal = state.nexuses[carrier.nexus].ordinal;
+    if (number == number_of(ordinal, address_kind::ipv4, false)) return carrier.reserved;
+  }
+  return 0;
+}
+
+tv_stats_netns_range range_of(std::uint32_t first, std::uint32_t last, const reservation &held) {
+  return {.first_port = static_cast<std::uint16_t>(first),
+          .last_port = static_cast<std::uint16_t>(last),
           .subsystem = held.subsystem,
           .bsd = held.bsd,
           .listeners = held.listeners};
@@ -112,7 +121,12 @@ void write_namespaces(const world &state, table_file &file) {
         held[number][known.first] += known.held;
       }
     }
-    for (const auto &[port, entry] : held[number]) ranges.push_back(range_of(port, 0, entry));
+    const std::uint32_t reserved = reserved_ports(state, number);
+    if (reserved) ranges.push_back(range_of(first_ephemeral, first_ephemeral + reserved - 1, {1, 0, 0}));
+    for (const auto &[port, entry] : held[number]) {
+      const bool is_within = port >= first_ephemeral && port < first_ephemeral + reserved;
+      if (!is_within) ranges.push_back(range_of(port, 0, entry));
+    }
     std::ranges::sort(ranges, {}, &tv_stats_netns_range::first_port);
     head.entry_count = static_cast<std::uint8_t>(std::min(ranges.size(), most_entries));
     file.put(head);

@@ -36,7 +36,7 @@ constexpr service player[] = {
     {udp_protocol, 5004, of_class("RV"), false, {100, 1200}, 280},
 };
 constexpr service resolver[] = {
-    {udp_protocol, 53, of_class("CTL"), false, {75, 150}, 20},
+    {udp_protocol, 53, of_class("CTL"), true, {150, 75}, 20},
     {tcp_protocol, 53, of_class("CTL"), true, {190, 80}, 5},
     {tcp_protocol, 853, of_class("CTL"), false, {120, 230}, 10},
 };

@@ -68,7 +68,19 @@ bool root_directory::put_process(std::int32_t pid, std::string_view name) {
   return file.commit();
 }
 
-bool root_directory::publish(const world &state) {
+bool root_directory::put_host(std::string_view name) {
+  const own_directory system = top_.enter(processes_name).enter("sys");
+  if (name.empty()) {
+    system.remove("kernel");
+    return true;
+  }
+  table_file file(system.make_below("kernel"), "hostname");
+  file.put(std::as_bytes(std::span(name.substr(0, 64))));  // as long as hosts have them
+  file.put('\n');
+  return file.commit();
+}
+
+bool root_directory::publish(world &state) {
   for (const std::uint32_t index : state.started) {
     const process &source = state.processes[index];
     if (!put_process(source.pid, programs[source.program].name)) return false;
@@ -81,6 +93,8 @@ bool root_directory::publish(const world &state) {
   for (const std::int32_t pid : state.ended) {
     if (!remove_name(top_.enter(processes_name), std::to_string(pid))) return false;
   }
+  state.started.clear();
+  state.ended.clear();
   return true;
 }
 

@@ -28,9 +28,12 @@ class root_directory {
   // Removes all process names, such as those of an earlier use.
   bool remove_processes();
 
+  // Gives the machine a name, or takes the one that it has where it is empty.
+  bool put_host(std::string_view name);
+
   // Publishes a whole world, or what changed in it since it was published last: the names of new processes
   // before the tables that mention them, tables one by one, then the end of processes.
-  bool publish(const world &state);
+  bool publish(world &state);
 
  private:
   own_directory top_;

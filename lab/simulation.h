@@ -12,8 +12,7 @@ namespace lab {
 
 class simulation {
  public:
-  simulation(const options &asked, own_directory directory)
-      : root_(std::move(directory)), state_(make_world(asked, asked.seed)), interval_(asked.interval) {}
+  simulation(const options &asked, own_directory directory);
 
   // Publishes the world, in place of any other that the directory shows. Like all here, returns false after a
   // message on standard error.
@@ -27,6 +26,7 @@ class simulation {
   root_directory root_;
   world state_;
   std::uint32_t interval_;
+  std::string host_;
 };
 
 }  // namespace lab

@@ -1,8 +1,10 @@
 #include "lab/world.h"
 
 #include <algorithm>
+#include <cstring>
 #include <iterator>
 
+#include "lab/incidents.h"
 #include "lab/programs.h"
 #include "lab/world_parts.h"
 
@@ -71,6 +73,12 @@ void register_providers(world &state) {
     const nexus &instance = state.nexuses[i];
     if (instance.kind == nexus_kind::multistack) state.multistacks[instance.ordinal] = i;
   }
+  for (const nexus &below : state.nexuses) {
+    if (below.kind != nexus_kind::net_if || below.ordinal >= state.multistacks.size()) continue;
+    const std::uint32_t above = state.multistacks[below.ordinal];
+    if (above != none)
+      state.nexuses[above].interface = static_cast<std::uint32_t>(&below - state.nexuses.data());
+  }
 }
 
 // Pipes without a name come and go with those who talk through them.
@@ -79,6 +87,23 @@ void replace_pipes(world &state, std::uint32_t milliseconds) {
     if (instance.kind != nexus_kind::scratch_pipe || !state.random.chance(milliseconds, 4000)) continue;
     instance.alive = !instance.alive;
     if (instance.alive) instance.id = state.random.identity();
+  }
+}
+
+void step(world &state, std::uint32_t milliseconds) {
+  replace_pipes(state, milliseconds);
+  replace_channels(state, milliseconds);
+  cause_trouble(state, milliseconds);  // the flows of what it takes end before it is closed
+  wander_routes(state);
+  replace_flows(state, milliseconds);
+  move_flows(state, milliseconds);
+  deliver(state, milliseconds);
+}
+
+void end_interval(world &state, std::uint32_t milliseconds) {
+  for (channel &port : state.channels) {
+    port.moved.out.end_interval(milliseconds);
+    port.moved.in.end_interval(milliseconds);
   }
 }
 
@@ -95,19 +120,26 @@ std::uint32_t interface_index(nexus_kind kind, std::uint32_t ordinal) {
   return kind == nexus_kind::bridge ? 5 + 2 * ordinal : 4 + 2 * ordinal;  // 1 to 3 are the system's own
 }
 
+std::uint64_t key_of(const uuid &id) {
+  std::uint64_t key;
+  std::memcpy(&key, id.bytes, sizeof key);
+  return key;
+}
+
 world make_world(const sizes &size, std::uint64_t seed) {
   constexpr std::uint32_t uptime = 5 * 3600 * 1000;
+  constexpr std::uint32_t second = 1000;
   world state{.size = size, .seed = seed, .random = random_source(seed)};
   start_processes(state);
   register_providers(state);
   open_channels(state);
-  move_traffic(state, uptime);
   open_flows(state);
-  for (channel &used : state.channels) {
-    used.moved.out.forget_rates();
-    used.moved.in.forget_rates();
-  }
-  move_traffic(state, 1000);
+  deliver(state, uptime);
+  end_interval(state, uptime);
+  // All states that there are last for a second: none is left.
+  move_flows(state, second);
+  deliver(state, second);
+  end_interval(state, second);
   return state;
 }
 
@@ -121,13 +153,14 @@ std::string registered_name(nexus_kind kind, std::uint32_t ordinal) {
 }
 
 void advance(world &state, std::uint32_t milliseconds) {
-  state.started.clear();
-  state.ended.clear();
-  state.elapsed += milliseconds;
-  replace_pipes(state, milliseconds);
-  replace_channels(state, milliseconds);
-  replace_flows(state, milliseconds);
-  move_traffic(state, milliseconds);
+  constexpr std::uint32_t longest = 250;
+  for (std::uint32_t left = milliseconds; left;) {
+    const std::uint32_t now = std::min(left, longest);
+    left -= now;
+    state.elapsed += now;
+    step(state, now);
+  }
+  end_interval(state, milliseconds);
 }
 
 }  // namespace lab
