@@ -12,6 +12,7 @@
 #include "common/tables/values.h"
 #include "completions/live_lists.h"
 #include "lab/command_line.h"
+#include "lab/incidents.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
 
@@ -98,12 +99,15 @@ completed_program tarvelctl() {
 
 completed_program tarvellab() {
   completed_program program{"tarvellab", false, {}};
+  std::string incidents = "list";
+  for (const lab::incident &row : lab::incidents) incidents.append(" ").append(row.name);
   for (const lab::command &row : lab::commands) {
     std::vector<completed_option> options;
     for (const lab::option_row &each : lab::known_options) {
       if (!(each.in & row.bit)) continue;
       const std::string name(each.name.substr(2));
-      options.push_back({"", name, !each.argument.empty(), "", each.meaning});
+      const std::string values = name == "incident" ? incidents : "";
+      options.push_back({"", name, !each.argument.empty(), values, each.meaning});
     }
     options.push_back({"", "help", false, "", "what there is to know"});
     program.commands.push_back({std::string(row.name), row.purpose, "", std::move(options)});

@@ -52,13 +52,14 @@ cases = [
 
 # The same of the lab.
 lab_options = """--providers --nexuses --channels --rings --flows --stacks --arenas --namespaces --processes --seed
-    --help""".split()
+    --host --incident --after --help""".split()
 lab_cases = [
     ("", "generate simulate run capture".split()),
     ("--", ["--help", "--version"]),
     ("capture --", ["--every", "--count", "--redact", "--help"]),
     ("generate k --", lab_options),
     ("capture --every ", []),
+    ("run --incident l", ["list", "lossy-link", "lookup-miss", "leak"]),
     ("simulate f", ["folder"]),
     ("run f", ["folder"]),
     ("run --flows 3 -- tarvelc", ["tarvelctl"]),
