@@ -13,27 +13,27 @@ namespace {
 constexpr std::uint32_t buffer_size = 2048;
 
 // The share of ring `number` among `rings`, so that the rings sum up to the channel.
-std::uint64_t part(std::uint64_t total, std::uint32_t number, std::uint32_t rings) {
+std::uint64_t share_of(std::uint64_t total, std::uint32_t number, std::uint32_t rings) {
   return total / rings + (number < total % rings);
 }
 
-std::uint32_t part(std::uint32_t total, std::uint32_t number, std::uint32_t rings) {
-  return static_cast<std::uint32_t>(part(std::uint64_t{total}, number, rings));
+std::uint32_t share_of(std::uint32_t total, std::uint32_t number, std::uint32_t rings) {
+  return static_cast<std::uint32_t>(share_of(std::uint64_t{total}, number, rings));
 }
 
 // What a ring moves, in operations of about `batch` slots. A packet takes a slot.
 ring_activity activity_of(const meter &moved, std::uint64_t key, std::uint32_t number, std::uint32_t rings) {
   const auto batch = static_cast<std::uint32_t>(3 + key % 6);
-  const std::uint64_t slots = part(moved.total.packets, number, rings);
+  const std::uint64_t slots = share_of(moved.total.packets, number, rings);
   return {.slots = slots,
-          .bytes = part(moved.total.bytes, number, rings),
+          .bytes = share_of(moved.total.bytes, number, rings),
           .count = (slots + batch - 1) / batch,
           .min_slots = slots > 0,
           .max_slots = static_cast<std::uint32_t>(std::min<std::uint64_t>(slots, 8 * batch)),
-          .slots_per_sec = part(moved.packets_per_second, number, rings),
-          .slots_per_sec_avg = part(moved.packets_average, number, rings),
-          .bytes_per_sec = part(moved.bytes_per_second, number, rings),
-          .bytes_per_sec_avg = part(moved.bytes_average, number, rings)};
+          .slots_per_sec = share_of(moved.packets_per_second, number, rings),
+          .slots_per_sec_avg = share_of(moved.packets_average, number, rings),
+          .bytes_per_sec = share_of(moved.bytes_per_second, number, rings),
+          .bytes_per_sec_avg = share_of(moved.bytes_average, number, rings)};
 }
 
 // What the process has put into a ring to send, or taken from one: `waiting` slots more or less than was
@@ -64,9 +64,9 @@ void put_rings(const meter &moved, std::uint64_t key, bool sent, std::uint64_t e
     const std::uint64_t waiting = moved.waiting;
     ring.sync = sync_of(moved, sent ? waiting : 0 - waiting, key, number, rings);
     ring.mem_total = channel::slots * buffer_size;
-    ring.mem_used = part(waiting, number, rings) * buffer_size;
-    ring.err_corrupted = part(errors / 16, number, rings);
-    ring.err_len_modified = part(errors - errors / 16, number, rings);
+    ring.mem_used = share_of(waiting, number, rings) * buffer_size;
+    ring.err_corrupted = share_of(errors / 16, number, rings);
+    ring.err_len_modified = share_of(errors - errors / 16, number, rings);
     file.put(ring);
   }
 }
