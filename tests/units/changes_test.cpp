@@ -213,7 +213,7 @@ TEST_F(changes, ALevelAmongCountersMayFallAndTooManyEntriesAreNone) {
   next(userstack_node, stack(9, 4));
   EXPECT_EQ(next(userstack_node, stack(2, 5)), "userstack same +1;");
   EXPECT_TRUE(next(userstack_node, stack(2, 3)).starts_with("userstack restarted -"));
-  for (const std::uint32_t count : {512, 513}) {
+  for (const std::uint32_t count : {512U, 513U}) {
     const std::string told = next(flow_adv_node, record(40 + 20 * 513).put(36, count, 4));
     EXPECT_EQ(told.find("entry entries511") != told.npos, count == 512);
   }
