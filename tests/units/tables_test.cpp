@@ -4,6 +4,7 @@
 
 #include "common/mib.h"
 #include "common/tables/channel.h"
+#include "common/tables/flow.h"
 #include "common/tables/key_index.h"
 #include "common/tables/provider.h"
 #include "common/tables/table_walk.h"
@@ -35,6 +36,10 @@ TEST(description, ATextEndsWhereItIsCut) {
     provider[128] = length;
     EXPECT_EQ(name->size_in(std::as_bytes(std::span(provider))), length == '\4' ? 4U : 5U);
   }
+}
+
+TEST(description, WhatIsPartOfAConditionalFieldDepends) {
+  EXPECT_TRUE(std::ranges::find(route_rows, "sfr_gateway", &row::part)->depends());
 }
 
 TEST(description, NoNumberIsTakenForASmallerOne) {
