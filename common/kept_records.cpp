@@ -208,8 +208,7 @@ std::size_t kept_records::slot_of(record_bytes key, std::uint64_t hash) const {
   std::size_t at = first_slot_of(hash);
   const auto is_other = [&](std::uint64_t slot) {
     const bool may_be_it = (slot ^ hash << position_bits) >> position_bits == 0;
-    return !may_be_it ||
-           !has_key((slot & position_mask) - 1, key);  // GCOVR_EXCL_BR_LINE: one in 16 million is another
+    return !may_be_it || !has_key((slot & position_mask) - 1, key);  // GCOVR_EXCL_BR_LINE: 1 in 2^24 differs
   };
   while (slots_[at] && is_other(slots_[at])) at = at + 1 == slots_.size() ? 0 : at + 1;
   return at;

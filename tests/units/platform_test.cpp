@@ -80,6 +80,7 @@ TEST_F(kernel_files, BelowARootNothingButItsOwnFilesIsOpened) {
     for (std::string name, told; words >> name >> told;) EXPECT_EQ(ask(name, 10), told) << name << of;
     EXPECT_EQ(ask("") + ask(std::string(5000, 'x')) + ask(long_name + ".a"), "ENOENTENOENT5");
   }
+  setenv("TARVEL_ROOT", root.c_str(), 1);
   rlimit all{};
   getrlimit(RLIMIT_NOFILE, &all);
   const int free = dup(STDERR_FILENO);
