@@ -1,0 +1,4 @@
+#include "export/command_line.h"
+namespace exporter {
+void print_statements() {}
+}  // namespace exporter
