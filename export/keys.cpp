@@ -101,7 +101,7 @@ class record_keys {
 
   key key_of(const row &field) const {
     return {.name = field.name,
-            .meaning = field.meaning,
+            .meaning = shown_meaning(field),
             .unit = field.unit,
             .form = form_of(field),
             .is_array = field.count > 1 || form_of(field) == value_form::flags,
@@ -148,6 +148,7 @@ class record_keys {
     const auto found = std::ranges::find(to, field.name, &key::name);
     if (field.kind != field_kind::address || found == to.end()) return false;
     found->ipv6 = (found + 1)->ipv6 = &field;
+    found->meaning = address_meaning;
     return true;
   }
 
@@ -200,6 +201,20 @@ void add_kinds(const table_description &table, const record_description &what,
 }
 
 }  // namespace
+
+integer_width width_of(const key &of) {
+  if (!of.field) return {32, false};
+  if (of.form == value_form::scope) return {16, false};
+  const bool is_signed = of.field->type == field_type::i32 || of.field->type == field_type::i64;
+  return {8U * of.field->size, is_signed};
+}
+
+std::vector<key> kind::all_keys() const {
+  std::vector<key> all = common_keys;
+  all.insert(all.end(), parent_keys.begin(), parent_keys.end());
+  all.insert(all.end(), keys.begin(), keys.end());
+  return all;
+}
 
 const std::vector<kind> &all_kinds() {
   static const std::vector<kind> kinds = [] {

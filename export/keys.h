@@ -27,6 +27,7 @@ enum class value_form : std::uint8_t {
   enumeration,
   flags,
   process,  // the name that the kernel gives for a pid
+  time,
   object,
 };
 
@@ -50,6 +51,13 @@ struct key {
   const field_condition *counts_if = nullptr;  // where they lie in the record: which of them say anything
 };
 
+// Of an integer.
+struct integer_width {
+  unsigned bits;
+  bool is_signed;
+};
+integer_width width_of(const key &of);
+
 // A kind of lines: one for each record of its sort, in the order of the table.
 struct kind {
   std::string_view name;
@@ -58,7 +66,13 @@ struct kind {
   const record_description *parent;  // the record that this one follows; null where it begins the table
   std::vector<key> parent_keys;      // what of the parent each line says, in front of its own keys
   std::vector<key> keys;
+
+  // All keys of its lines, the common ones first.
+  std::vector<key> all_keys() const;
 };
+
+// The version of all this: it grows when a key goes or changes its meaning.
+inline constexpr int schema_version = 1;
 
 // Every kind, in the order in which they are written. Those of one table stand together.
 const std::vector<kind> &all_kinds();

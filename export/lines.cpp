@@ -23,8 +23,6 @@ namespace exporter {
 
 namespace {
 
-constexpr int schema_version = 1;
-
 // "2026-11-23T16:19:21.042Z"
 std::string time_text(std::int64_t nanoseconds) {
   constexpr std::int64_t second = 1'000'000'000, millisecond = 1'000'000;
