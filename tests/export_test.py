@@ -26,7 +26,8 @@ DECISIVE = {
     "nexus_channel_list": (24, (16, "I", (0,))),
     "stats/flow": (320, (32, "I", NONE), (68, "i", PIDS), (76, "I", NONE), (81, "B", FAMILIES), (88, "I", SCOPED),
                    (92, "I", (0, 1)), (109, "B", FAMILIES), (116, "I", SCOPED), (136, "B", (6, 17, 0)),
-                   (144, "I", NONE), (140, "i", (0, 0x80090, 0x480190, -1, 0x300110)), (168, "I", (0, 10, 11, 20, 22, 23, 1 << 31)),
+                   (144, "I", NONE), (140, "i", (0, 0x80090, 0x480190, -1, 0x300110)),
+                   (168, "I", (0, 10, 11, 20, 22, 23, 1 << 31)),
                    (172, "I", (0, 1, 0xFFFFFFFF)), (152, "Q", ((1 << 64) - 1, 1 << 63, 0))),
     "stats/flow_adv": (40, (32, "i", PIDS), (36, "I", (0, 1, 5, 512, 513))),
     "stats/flow_owner": (128, (32, "I", NONE), (68, "i", PIDS), (76, "I", (0, 1, 256)), (80, "I", (0, 1 << 31))),
@@ -39,9 +40,9 @@ DECISIVE = {
 }
 BEHIND = {"nexus_provider_list": (256, "I", 16), "stats/flow_adv": (36, "I", 20), "stats/netns": (18, "B", 32)}
 HOSTILE = [bytes([each]) for each in range(256)] + [
-    b"plain", b"\xc3\xa9", b"\xe2\x82\xac", b"\xf0\x9f\x92\xa9", b"\xe2\x82", b"\xf0\x9f\x92", b"\xed\xa0\x80", b"\xc2\x85",
-    b"\xc0\xaf", b"\xe2\x80\xa8", b"\xf4\x90\x80\x80", b"\xe0\x9f\xbf", b"\xf0\x8f\xbf\xbf", b"\xed\x9f\xbf", b'","a":"',
-    b"\xf4\x8f\xbf\xbf"]
+    b"plain", b"\xc3\xa9", b"\xe2\x82\xac", b"\xf0\x9f\x92\xa9", b"\xe2\x82", b"\xf0\x9f\x92", b"\xed\xa0\x80",
+    b"\xc2\x85", b"\xc0\xaf", b"\xe2\x80\xa8", b"\xf4\x90\x80\x80", b"\xe0\x9f\xbf", b"\xf0\x8f\xbf\xbf",
+    b"\xed\x9f\xbf", b'","a":"', b"\xf4\x8f\xbf\xbf"]
 
 
 def refuse(what):
