@@ -1,16 +1,19 @@
 // Writes a completion script: its body, with the programs' own tables in place of the line "# TABLES".
 //
-// usage: generate_completions bash|zsh|fish tarvelctl|tarvellab BODY, or, for tests, generate_completions
-// words
+// usage: generate_completions bash|zsh|fish PROGRAM BODY, or, for tests, generate_completions words
 
+#include <algorithm>
 #include <cstdio>
 #include <fstream>
+#include <iterator>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "common/tables/values.h"
 #include "completions/live_lists.h"
+#include "export/command_line.h"
 #include "lab/command_line.h"
 #include "tarvelctl/command.h"
 #include "tarvelctl/netstat_options.h"
@@ -96,20 +99,47 @@ completed_program tarvelctl() {
   return program;
 }
 
-completed_program tarvellab() {
-  completed_program program{"tarvellab", false, {}};
-  for (const lab::command &row : lab::commands) {
+// A program with tables of commands and options. `values` are those of its commands that take words.
+template <class Command, class Option>
+completed_program companion(const char *name, std::span<const Command> commands,
+                            std::span<const Option> known_options, const std::string &values) {
+  completed_program program{name, false, {}};
+  for (const Command &row : commands) {
     std::vector<completed_option> options;
-    for (const lab::option_row &each : lab::known_options) {
+    for (const Option &each : known_options) {
       if (!(each.in & row.bit)) continue;
-      const std::string name(each.name.substr(2));
-      options.push_back({"", name, !each.argument.empty(), "", each.meaning});
+      const bool is_letter = !each.name.starts_with("--");
+      const std::string word(each.name.substr(is_letter ? 1 : 2));
+      options.push_back(
+          {is_letter ? word : "", is_letter ? "" : word, !each.argument.empty(), "", each.meaning});
     }
     options.push_back({"", "help", false, "", "what there is to know"});
-    program.commands.push_back({std::string(row.name), row.purpose, "", std::move(options)});
+    const std::string words = row.arguments.empty() ? "" : values;
+    program.commands.push_back({std::string(row.name), row.purpose, words, std::move(options)});
   }
   return program;
 }
+
+completed_program tarvellab() {
+  return companion("tarvellab", lab::commands, lab::known_options, "");
+}
+
+std::string table_names() {
+  std::string names;
+  for (const exporter::kind &each : exporter::all_kinds()) {
+    names.append(names.empty() ? "" : " ").append(each.name);
+  }
+  return names;
+}
+
+completed_program tarvelexport() {
+  return companion("tarvelexport", exporter::commands, exporter::known_options, table_names());
+}
+
+constexpr struct {
+  std::string_view name;
+  completed_program (*make)();
+} programs[] = {{"tarvelctl", tarvelctl}, {"tarvellab", tarvellab}, {"tarvelexport", tarvelexport}};
 
 void print_bash(const completed_program &program) {
   std::printf("declare -gA _%s_options=(\n", program.name);
@@ -239,11 +269,13 @@ bool print_script(const char *body, Print print_tables) {
 int main(int argc, char **argv) {
   for (const auto &form : forms) {
     if (argc != (form.head ? 4 : 2) || form.name != argv[1]) continue;
-    const bool is_lab = form.head && argv[2] == std::string_view("tarvellab");
-    const completed_program program = is_lab ? tarvellab() : tarvelctl();
+    const auto *const row =
+        std::ranges::find_if(programs, [&](const auto &each) { return !form.head || each.name == argv[2]; });
+    if (row == std::end(programs)) break;
+    const completed_program program = row->make();
     if (!form.head) form.print(program);
     const bool made = !form.head || print_script(argv[3], [&] {
-      if (!is_lab) print_live_lists(form.head, form.tail);
+      if (program.joins_values) print_live_lists(form.head, form.tail);
       form.print(program);
     });
     const bool written = std::fflush(stdout) == 0 && !std::ferror(stdout);

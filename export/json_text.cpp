@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <cstring>
 
+#include "common/text/guard.h"
 #include "common/text/print.h"
 
 namespace exporter {
@@ -47,20 +48,26 @@ char *put(char *to, std::string_view bytes) {
   return to + bytes.size();
 }
 
-char *put_escaped(char *to, unsigned char code) {
+char *put_escaped(char *to, unsigned code) {
   static constexpr char digits[] = "0123456789abcdef";
-  to = put(to, "\\u00");
-  *to++ = digits[code >> 4];
-  *to++ = digits[code & 0xf];
+  to = put(to, "\\u");
+  for (int shift = 12; shift >= 0; shift -= 4) *to++ = digits[code >> shift & 0xf];
   return to;
+}
+
+// The code of a character of at most three bytes.
+unsigned code_of(std::string_view character) {
+  unsigned code =
+      static_cast<unsigned char>(character[0]) & (0xffU >> (character.size() + (character.size() > 1)));
+  for (const char byte : character.substr(1)) code = code << 6 | (static_cast<unsigned char>(byte) & 0x3fU);
+  return code;
 }
 
 char *put_sequence(char *to, std::string_view bytes, bool is_character) {
   if (!is_character) return put(to, "\xef\xbf\xbd");
-  const auto code = static_cast<unsigned char>(bytes.back());
+  const unsigned code = bytes.size() <= 3 ? code_of(bytes) : 0x10000;
+  if (format::is_hidden(code)) return put_escaped(to, code);  // also what a terminal would obey
   if (code == '"' || code == '\\') *to++ = '\\';
-  const bool is_c1 = bytes.size() == 2 && bytes[0] == '\xc2' && code < 0xa0;
-  if (is_c1 || (bytes.size() == 1 && (code < 0x20 || code == 0x7f))) return put_escaped(to, code);
   return put(to, bytes);
 }
 

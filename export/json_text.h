@@ -16,8 +16,8 @@ constexpr std::size_t quoted_size(std::size_t size) {
 }
 
 // Appends a text in quotation marks. It ends at the first NUL, or after `size` bytes. What is not UTF-8
-// becomes U+FFFD, one for as many bytes as a character could have begun with; control characters, quotation
-// marks and backslashes are escaped. May write up to format::slack bytes behind what it appends.
+// becomes U+FFFD, one for as many bytes as a character could have begun with; quotation marks, backslashes
+// and all that a terminal might obey are escaped. May write up to format::slack bytes behind what it appends.
 char *put_quoted(char *to, const char *text, std::size_t size);
 
 // The same as a text of its own.
