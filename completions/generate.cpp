@@ -177,7 +177,8 @@ std::string zsh_option(const completed_option &each, std::string_view word, bool
   spec.append(word);
   if (each.takes_value && joins_values) spec.append(word.size() > 2 ? "=" : "+");
   if (!each.meaning.empty()) spec.append("[").append(each.meaning).append("]");
-  return each.takes_value ? spec.append(zsh_action(each.name, each.values)) : spec;
+  return each.takes_value ? spec.append(zsh_action(each.name.empty() ? each.letter : each.name, each.values))
+                          : spec;
 }
 
 void print_zsh(const completed_program &program) {

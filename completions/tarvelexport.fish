@@ -13,5 +13,5 @@ complete -c tarvelexport -f
 complete -c tarvelexport -n __tarvelexport_wants_command -l help -d 'what there is to know'
 complete -c tarvelexport -n __tarvelexport_wants_command -l version
 # TABLES
-complete -c tarvelexport -n '__tarvelexport_runs json' -s o -F
-complete -c tarvelexport -n '__tarvelexport_runs json' -l capture -F
+complete -c tarvelexport -n '__tarvelexport_runs json' -s o -r -F
+complete -c tarvelexport -n '__tarvelexport_runs json' -l capture -r -F

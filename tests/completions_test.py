@@ -83,7 +83,7 @@ command = """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed); }
 tarvellab() { tarvelctl "$@"; }; tarvelexport() { tarvelctl "$@"; }; PS1=
 """
 start_ups = {
-    "bash": ("--noprofile --rcfile ../.bashrc -i", """. $MADE/tarvelctl.bash; . $MADE/tarvellab.bash; . $MADE/tarvelexport.bash
+    "bash": ("--noprofile --rcfile ../.bashrc -i", """for each in ctl lab export; do . $MADE/tarvel$each.bash; done
 PROMPT_COMMAND='printf "<%s>" ready'
 bind 'set bell-style none' '"\\C-g": insert-completions'"""),
     "zsh": ("-di", """precmd() { printf '<%s>' ready }; unsetopt beep prompt_cr prompt_sp

@@ -13,9 +13,9 @@ expected = """bin/tarvelctl bin/tarvelexport bin/tarvellab share/bash-completion
     share/doc/tarvelctl/changelog.Debian.gz share/doc/tarvelctl/copyright
     share/doc/tarvelctl/from-symptom-to-command.md share/fish/vendor_completions.d/tarvelctl.fish
     share/fish/vendor_completions.d/tarvelexport.fish share/fish/vendor_completions.d/tarvellab.fish
-    share/man/man1/tarvelctl.1.gz share/man/man1/tarvelexport.1.gz share/man/man1/tarvellab.1.gz share/man/man5/tarvel-tables.5.gz
-    share/zsh/vendor-completions/_tarvelctl share/zsh/vendor-completions/_tarvelexport
-    share/zsh/vendor-completions/_tarvellab""".split()
+    share/man/man1/tarvelctl.1.gz share/man/man1/tarvelexport.1.gz share/man/man1/tarvellab.1.gz
+    share/man/man5/tarvel-tables.5.gz share/zsh/vendor-completions/_tarvelctl
+    share/zsh/vendor-completions/_tarvelexport share/zsh/vendor-completions/_tarvellab""".split()
 
 
 def run(*words):
