@@ -1,16 +1,19 @@
 // Writes a completion script: its body, with the programs' own tables in place of the line "# TABLES".
 //
-// usage: generate_completions bash|zsh|fish tarvelctl|tarvellab BODY, or, for tests, generate_completions
-// words
+// usage: generate_completions bash|zsh|fish PROGRAM BODY, or, for tests, generate_completions words
 
+#include <algorithm>
 #include <cstdio>
 #include <fstream>
+#include <iterator>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "common/tables/values.h"
 #include "completions/live_lists.h"
+#include "export/command_line.h"
 #include "lab/command_line.h"
 #include "lab/incidents.h"
 #include "tarvelctl/command.h"
@@ -97,23 +100,51 @@ completed_program tarvelctl() {
   return program;
 }
 
-completed_program tarvellab() {
-  completed_program program{"tarvellab", false, {}};
-  std::string incidents = "list";
-  for (const lab::incident &row : lab::incidents) incidents.append(" ").append(row.name);
-  for (const lab::command &row : lab::commands) {
+// A program with tables of commands and options. `words` are those of its commands that take some, `values`
+// those of one of its options.
+template <class Command, class Option>
+completed_program companion(const char *name, std::span<const Command> commands,
+                            std::span<const Option> known_options, const std::string &words,
+                            std::string_view option = {}, const std::string &values = "") {
+  completed_program program{name, false, {}};
+  for (const Command &row : commands) {
     std::vector<completed_option> options;
-    for (const lab::option_row &each : lab::known_options) {
+    for (const Option &each : known_options) {
       if (!(each.in & row.bit)) continue;
-      const std::string name(each.name.substr(2));
-      const std::string values = name == "incident" ? incidents : "";
-      options.push_back({"", name, !each.argument.empty(), values, each.meaning});
+      const bool is_letter = !each.name.starts_with("--");
+      const std::string word(each.name.substr(is_letter ? 1 : 2));
+      options.push_back({is_letter ? word : "", is_letter ? "" : word, !each.argument.empty(),
+                         each.name == option ? values : "", each.meaning});
     }
     options.push_back({"", "help", false, "", "what there is to know"});
-    program.commands.push_back({std::string(row.name), row.purpose, "", std::move(options)});
+    program.commands.push_back(
+        {std::string(row.name), row.purpose, row.arguments.empty() ? "" : words, std::move(options)});
   }
   return program;
 }
+
+completed_program tarvellab() {
+  std::string incidents = "list";
+  for (const lab::incident &row : lab::incidents) incidents.append(" ").append(row.name);
+  return companion("tarvellab", lab::commands, lab::known_options, "", "--incident", incidents);
+}
+
+std::string table_names() {
+  std::string names;
+  for (const exporter::kind &each : exporter::all_kinds()) {
+    names.append(names.empty() ? "" : " ").append(each.name);
+  }
+  return names;
+}
+
+completed_program tarvelexport() {
+  return companion("tarvelexport", exporter::commands, exporter::known_options, table_names());
+}
+
+constexpr struct {
+  std::string_view name;
+  completed_program (*make)();
+} programs[] = {{"tarvelctl", tarvelctl}, {"tarvellab", tarvellab}, {"tarvelexport", tarvelexport}};
 
 void print_bash(const completed_program &program) {
   std::printf("declare -gA _%s_options=(\n", program.name);
@@ -151,7 +182,8 @@ std::string zsh_option(const completed_option &each, std::string_view word, bool
   spec.append(word);
   if (each.takes_value && joins_values) spec.append(word.size() > 2 ? "=" : "+");
   if (!each.meaning.empty()) spec.append("[").append(each.meaning).append("]");
-  return each.takes_value ? spec.append(zsh_action(each.name, each.values)) : spec;
+  return each.takes_value ? spec.append(zsh_action(each.name.empty() ? each.letter : each.name, each.values))
+                          : spec;
 }
 
 void print_zsh(const completed_program &program) {
@@ -243,11 +275,13 @@ bool print_script(const char *body, Print print_tables) {
 int main(int argc, char **argv) {
   for (const auto &form : forms) {
     if (argc != (form.head ? 4 : 2) || form.name != argv[1]) continue;
-    const bool is_lab = form.head && argv[2] == std::string_view("tarvellab");
-    const completed_program program = is_lab ? tarvellab() : tarvelctl();
+    const auto *const row =
+        std::ranges::find_if(programs, [&](const auto &each) { return !form.head || each.name == argv[2]; });
+    if (row == std::end(programs)) break;
+    const completed_program program = row->make();
     if (!form.head) form.print(program);
     const bool made = !form.head || print_script(argv[3], [&] {
-      if (!is_lab) print_live_lists(form.head, form.tail);
+      if (program.joins_values) print_live_lists(form.head, form.tail);
       form.print(program);
     });
     const bool written = std::fflush(stdout) == 0 && !std::ferror(stdout);

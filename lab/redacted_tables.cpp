@@ -96,6 +96,7 @@ constexpr struct {
     {field_kind::counter, keep},
     {field_kind::flags, keep},
     {field_kind::enumeration, keep},
+    {field_kind::boolean, keep},
     {field_kind::pid, keep},
     {field_kind::process, redact_process},
     {field_kind::interface, redact_interface},

@@ -6,7 +6,7 @@ cd "$(dirname "${BASH_SOURCE[0]}")/.." || exit
 
 build_packages=(g++ cmake ninja-build uuid-dev libgtest-dev libgmock-dev netbase python3)
 package_packages=(dpkg-dev file)
-test_packages=(clang-14 libclang-rt-14-dev zsh fish "${package_packages[@]}")
+test_packages=(clang-14 libclang-rt-14-dev zsh fish jq "${package_packages[@]}")
 cross_packages=(g++-aarch64-linux-gnu qemu-user)
 lint_packages=(clang-format clang-tidy flake8 shellcheck mandoc)
 

@@ -1,7 +1,6 @@
 // The front end: global options, the choice of a command, the watch loop, the ways out.
 
 #include <fcntl.h>
-#include <signal.h>
 #include <strings.h>
 #include <time.h>
 #include <unistd.h>
@@ -13,6 +12,7 @@
 #include <string_view>
 #include <vector>
 
+#include "common/text/interrupt.h"
 #include "common/text/memory.h"
 #include "common/text/output.h"
 #include "common/text/output_helpers.h"
@@ -28,18 +28,6 @@ namespace {
 [[noreturn]] void finish() {
   report.close();
   std::exit(EXIT_SUCCESS);
-}
-
-// The way out on SIGINT, which may come at any instruction: whole lines that are printed are written, and the
-// status is 0.
-void interrupted(int /*signal*/) {
-  const int error = report.abandon();
-  if (!error) _exit(EXIT_SUCCESS);
-  const char *const known = strerrordesc_np(error);  // strerror() allocates where it knows none
-  const auto unknown = format::text_of<"Unknown error %d", 32>(error);
-  const std::string_view reason = known ? known : unknown.view();
-  diagnostics.write_at_once(format::text_of<"write error: %.60s\n", 80>(reason).view());
-  _exit(exit_status::output_failed);
 }
 
 [[noreturn]] void usage() {
@@ -127,9 +115,7 @@ int run_on_copy(command_handler handler, int argc, char **argv) {
 }  // namespace
 
 void run_command_line(int argc, char **argv) {
-  struct sigaction action {};
-  action.sa_handler = interrupted;
-  sigaction(SIGINT, &action, nullptr);
+  end_on_interrupt();
   attach_standard_outputs();
   make_new_fail_fast();
   unsetenv("POSIXLY_CORRECT");  // for the option parser, options would end at the first operand

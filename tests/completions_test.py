@@ -68,17 +68,27 @@ lab_cases = [
     ("run -- tarvelctl tree " + ids[1][:35], ids),
 ]
 
+export_cases = [
+    ("", ["json", "schema"]),
+    ("json -", ["-o", "--every", "--count", "--host", "--capture", "--help"]),
+    ("json flow flow_", ["flow_advisory", "flow_owner", "flow_route", "flow_switch"]),
+    ("json -o wi", ["with blanks.log"]),
+    ("json --capture f", ["folder"]),
+    ("json --every ", []),
+    ("schema --c", ["--clickhouse"]),
+]
+
 # How a shell is started, and what it reads then. Control-G inserts everything that could stand there, the command
 # writes down how the shell reads the line then, and the shell says when it is ready for the next.
 command = """tarvelctl() { (IFS=@; printf '%s\\n' "$*" >>../typed); }
-tarvellab() { tarvelctl "$@"; }; PS1=
+tarvellab() { tarvelctl "$@"; }; tarvelexport() { tarvelctl "$@"; }; PS1=
 """
 start_ups = {
-    "bash": ("--noprofile --rcfile ../.bashrc -i", """. $MADE/tarvelctl.bash; . $MADE/tarvellab.bash
+    "bash": ("--noprofile --rcfile ../.bashrc -i", """for each in ctl lab export; do . $MADE/tarvel$each.bash; done
 PROMPT_COMMAND='printf "<%s>" ready'
 bind 'set bell-style none' '"\\C-g": insert-completions'"""),
     "zsh": ("-di", """precmd() { printf '<%s>' ready }; unsetopt beep prompt_cr prompt_sp
-for each in ctl lab; do cp $MADE/tarvel$each.zsh ../_tarvel$each; done
+for each in ctl lab export; do cp $MADE/tarvel$each.zsh ../_tarvel$each; done
 fpath=($PWD/.. $fpath); autoload -U compinit; compinit -u -d ../dump
 zle -C all-matches complete-word _generic; bindkey '^G' all-matches
 zstyle ':completion:all-matches:*' insert yes
@@ -118,7 +128,7 @@ class Completions(Case):
 
     def listed(self, lines):
         """What fish says could stand at the end of each line."""
-        ask = """source $MADE/tarvelctl.fish; source $MADE/tarvellab.fish
+        ask = """source $MADE/tarvelctl.fish; source $MADE/tarvellab.fish; source $MADE/tarvelexport.fish
             for line in $argv; complete -C "$line"; printf '\\0'; end"""
         fish = ["fish", "--no-config", "-c", ask, *lines]
         answer = subprocess.check_output(fish, stderr=subprocess.STDOUT, text=True, timeout=60, **self.options)
@@ -139,6 +149,7 @@ class Completions(Case):
     def test_EveryWordIsCompletedAndNothingIsRun(self):
         self.check(cases)
         self.check(lab_cases, "tarvellab")
+        self.check(export_cases, "tarvelexport")
         if shutil.which("fish"):
             meant = {ids[1]: "nexus_provider x", ids[2]: "nexus of touchhurttouchhurttouchhurt",
                      "--redact": "put substitutes for addresses and names"}

@@ -1,10 +1,11 @@
 """Tests that the manual says what the programs and the record formats are."""
+import json
 import re
 import subprocess
 import unittest
 
 from records import RECORDS, TABLES
-from runs import build, tarvellab, top
+from runs import build, tarvelexport, tarvellab, top
 
 tool, lab, tables, readme = (
     (top / name).read_text().replace(r"\&", "").replace(r"\-", "-")
@@ -83,6 +84,27 @@ class Manual(unittest.TestCase):
         commands, options = re.findall(r"^  tarvellab (\w+)", usage, re.M), set(re.findall(r"--[a-z]+", usage))
         self.assertTrue(commands and options)
         self.assertEqual((re.findall(r"^\.It Cm (\w+)", lab, re.M), options_in(lab)), (commands, options))
+
+    def test_ExportHasItsOptionsAndEveryKeyInItsPlace(self):
+        said, known = subprocess.run([tarvelexport, "--help"], capture_output=True, text=True).stdout, {}
+        options = set(re.findall(r"^  (-[a-z-]+)", said, re.M)) | {"--help", "--version"}
+        page = (top / "docs/tarvelexport.1").read_text()
+        self.assertEqual(options, set(re.findall(r"^\.It (-[a-z-]+)", re.sub("Fl Fl ", "--", page).replace("Fl ", "-"),
+                                                 re.M)))
+
+        def names(keys):
+            return [key["key"] for key in keys]
+
+        for kind in json.loads(subprocess.check_output([tarvelexport, "schema"]))["kinds"]:
+            known[kind["kind"]] = names(kind["keys"])[4:]
+            known.update({" ".join(names(key["keys"])): names(key["keys"]) for key in kind["keys"]
+                          if "keys" in key and len(key["keys"]) < 20})
+        text = re.sub(r"\s+", " ", re.sub(r"^\.Va |[ ,;.]*$", "", page, flags=re.M))
+        kinds = dict(re.findall(r"^\.It Cm (\w+)\n((?:\.Va .*\n)+)", page, re.M))
+        for kind, keys in known.items():
+            with self.subTest(kind=kind):
+                shown = kinds.get(kind)
+                self.assertEqual(re.findall(r"\b(?!Va\b)\w+", shown), keys) if shown else self.assertIn(kind, text)
 
     def test_TablesAndRecordsAreWhatTheProgramReads(self):
         self.assertEqual(sections(tables).keys(), TABLES.keys())

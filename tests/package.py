@@ -8,13 +8,14 @@ import tempfile
 
 from runs import build, top
 
-expected = """bin/tarvelctl bin/tarvellab share/bash-completion/completions/tarvelctl
-    share/bash-completion/completions/tarvellab
+expected = """bin/tarvelctl bin/tarvelexport bin/tarvellab share/bash-completion/completions/tarvelctl
+    share/bash-completion/completions/tarvelexport share/bash-completion/completions/tarvellab
     share/doc/tarvelctl/changelog.Debian.gz share/doc/tarvelctl/copyright
     share/doc/tarvelctl/from-symptom-to-command.md share/fish/vendor_completions.d/tarvelctl.fish
-    share/fish/vendor_completions.d/tarvellab.fish
-    share/man/man1/tarvelctl.1.gz share/man/man1/tarvellab.1.gz share/man/man5/tarvel-tables.5.gz
-    share/zsh/vendor-completions/_tarvelctl share/zsh/vendor-completions/_tarvellab""".split()
+    share/fish/vendor_completions.d/tarvelexport.fish share/fish/vendor_completions.d/tarvellab.fish
+    share/man/man1/tarvelctl.1.gz share/man/man1/tarvelexport.1.gz share/man/man1/tarvellab.1.gz
+    share/man/man5/tarvel-tables.5.gz share/zsh/vendor-completions/_tarvelctl
+    share/zsh/vendor-completions/_tarvelexport share/zsh/vendor-completions/_tarvellab""".split()
 
 
 def run(*words):
@@ -39,7 +40,7 @@ with tempfile.TemporaryDirectory(prefix="package_test") as scratch:
     run(*dpkg, "--install", package)
     installed = sorted(str(path.relative_to(root / "usr")) for path in root.glob("usr/**/*") if not path.is_dir())
     assert installed == expected, installed
-    for program in "tarvelctl", "tarvellab":
+    for program in "tarvelctl", "tarvelexport", "tarvellab":
         check_has(run("readelf", "--wide", "--segments", "--dynamic", "--dyn-syms", root / "usr/bin" / program),
                   "GNU_RELRO", "BIND_NOW", "__stack_chk_fail", "__snprintf_chk")
 

@@ -23,7 +23,7 @@ from records import Kernel, load
 
 build = pathlib.Path(sys.argv.pop(1)).resolve()
 top = pathlib.Path(__file__).parents[1]
-tarvelctl, tarvellab = str(build / "tarvelctl"), str(build / "tarvellab")
+tarvelctl, tarvellab, tarvelexport = (str(build / name) for name in ("tarvelctl", "tarvellab", "tarvelexport"))
 load(build / "tests/describe")
 
 signal.signal(signal.SIGINT, signal.SIG_DFL)  # what is started neither ignores it nor, while it starts, catches it

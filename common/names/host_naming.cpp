@@ -65,14 +65,6 @@ std::string_view short_name(std::string_view name) {
   return name.substr(0, dot);
 }
 
-// The kernel embeds the scope of these addresses in bytes 2 and 3.
-bool may_embed_scope(const ipv6_address &address) {
-  const std::uint8_t *bytes = address.bytes;
-  if (bytes[0] == 0xfe) return (bytes[1] & 0xc0) == 0x80;
-  const unsigned scope = bytes[1] & 0x0f;
-  return bytes[0] == 0xff && (scope == 1 || scope == 2);
-}
-
 // What the rendering depends on: the scope, and which kind of address carries it.
 std::uint32_t scope_key(const ipv6_address &address, unsigned scope) {
   const bool is_multicast = address.bytes[0] == 0xff;
@@ -131,12 +123,8 @@ bool is_unspecified(const Address &address) {
 }  // namespace
 
 ipv6_host_text host_naming::numeric(const ipv6_address &address) {
-  unsigned scope = 0;
-  ipv6_address plain = address;
-  if (may_embed_scope(address)) {
-    scope = static_cast<unsigned>(address.bytes[2] << 8 | address.bytes[3]);
-    plain.bytes[2] = plain.bytes[3] = 0;
-  }
+  const unsigned scope = address.embedded_scope();
+  const ipv6_address plain = address.without_scope();
   ipv6_host_text text;
   text.end_at(plain.append_to(text.chars));
   if (scope == 0) return text;
@@ -198,7 +186,7 @@ endpoint_text host_naming::ipv6_endpoint_name(const ipv6_address &address, std::
   if (name == "tcp6") protocol = "tcp";
   if (name == "udp6") protocol = "udp";
   endpoint_text text;
-  char *const end = numerical_ && !is_unspecified(address) && !may_embed_scope(address)
+  char *const end = numerical_ && !is_unspecified(address) && !address.may_embed_scope()
                         ? std::min(address.append_to(text.chars), text.chars + numerical_host_limit)
                         : put_host(text, ipv6_host_name(address), numerical_);
   put_service(text, end, port, protocol, numerical_);

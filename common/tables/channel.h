@@ -148,7 +148,7 @@ inline constexpr char ring_stat_enable_node[] = "kern.tarvel.ring_stat_enable";
 inline constexpr row ring_stat_enable_rows[] = {{.field = "enabled",
                                                  .size = 1,
                                                  .type = field_type::u8,
-                                                 .kind = field_kind::number,
+                                                 .kind = field_kind::boolean,
                                                  .name = "enabled",
                                                  .meaning = "not 0: ring statistics are collected"}};
 inline constexpr record_description ring_stat_enable_description =

@@ -36,6 +36,7 @@ enum class field_kind : std::uint8_t {
   counter,      // so far, modulo 2^64
   flags,        // bits with names
   enumeration,  // a number with a name
+  boolean,      // not 0: yes
   pid,          // a process
   process,      // the name of one
   interface,    // the name of an interface

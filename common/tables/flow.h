@@ -251,8 +251,8 @@ inline constexpr auto owner_rows = [] {
               ROW(sfo_proc_name).is(process, "process", "name of the owner"),
               ROW(sfo_pid).is(pid, "pid", "process id of the owner").identifying(),
               ROW(sfo_nx_port).is(number, "port", "port of the nexus").identifying(),
-              ROW(sfo_pid_bound).is(number, "pid_bound", "not 0: bound to the process id"),
-              ROW(sfo_destroyed).is(number, "destroyed", "not 0: destroyed"), ROW(reserved_84));
+              ROW(sfo_pid_bound).is(boolean, "pid_bound", "not 0: bound to the process id"),
+              ROW(sfo_destroyed).is(boolean, "destroyed", "not 0: destroyed"), ROW(reserved_84));
 }();
 inline constexpr record_description owner_description =
     describe<tv_stats_flow_owner>("tv_stats_flow_owner", "flow_owner", owner_rows);

@@ -71,25 +71,28 @@ inline constexpr auto provider_rows = [] {
   using record = nexus_provider_record;
   using enum field_kind;
   constexpr row length = ROW(parameters.name_length).is(number, "name_length", "bytes of the name, up to 64");
-  return join(
-      ROW(provider_uuid).is(identifier, "provider", "UUID of the provider"), ROW(reserved_16),
-      ROW(parameters.name).is(name, "name", "name of the provider").cut_to(length), length,
-      ROW(parameters.type).is(enumeration, "type", "kind of nexus").of(nexus_types),
-      ROW(parameters.reserved_72),
-      ROW(parameters.flags).is(flags, "anonymous", "flags of the provider").of(provider_flag_names),
-      ROW(parameters.format).is(number, "format", "format, as the kernel keeps it"),
-      ROW(parameters.tx_rings).is(number, "tx_rings", "transmit rings of an instance"),
-      ROW(parameters.rx_rings).is(number, "rx_rings", "receive rings of an instance"),
-      ROW(parameters.tx_slots).is(number, "tx_slots", "slots of a transmit ring"),
-      ROW(parameters.rx_slots).is(number, "rx_slots", "slots of a receive ring"),
-      ROW(parameters.buf_size).is(number, "buf_size", "bytes of a buffer").in("bytes"),
-      ROW(parameters.meta_size).is(number, "meta_size", "bytes of a buffer's metadata").in("bytes"),
-      ROW(parameters.reserved_112),
-      ROW(parameters.pipes).is(number, "pipes", "pipes, as the kernel keeps them"),
-      ROW(parameters.subtype).is(enumeration, "subtype", "kind of flow switch").of(flow_switch_subtypes),
-      ROW(parameters.mhints).is(number, "mhints", "memory hints"),
-      ROW(parameters.ifindex).is(number, "ifindex", "index of the interface"), ROW(parameters.reserved_132),
-      ROW(instance_count).is(number, "instances", "instances that follow"), ROW(reserved_260));
+  constexpr row type = ROW(parameters.type).is(enumeration, "type", "kind of nexus").of(nexus_types);
+  return join(ROW(provider_uuid).is(identifier, "provider", "UUID of the provider"), ROW(reserved_16),
+              ROW(parameters.name).is(name, "name", "name of the provider").cut_to(length), length, type,
+              ROW(parameters.reserved_72),
+              ROW(parameters.flags).is(flags, "anonymous", "flags of the provider").of(provider_flag_names),
+              ROW(parameters.format).is(number, "format", "format, as the kernel keeps it"),
+              ROW(parameters.tx_rings).is(number, "tx_rings", "transmit rings of an instance"),
+              ROW(parameters.rx_rings).is(number, "rx_rings", "receive rings of an instance"),
+              ROW(parameters.tx_slots).is(number, "tx_slots", "slots of a transmit ring"),
+              ROW(parameters.rx_slots).is(number, "rx_slots", "slots of a receive ring"),
+              ROW(parameters.buf_size).is(number, "buf_size", "bytes of a buffer").in("bytes"),
+              ROW(parameters.meta_size).is(number, "meta_size", "bytes of a buffer's metadata").in("bytes"),
+              ROW(parameters.reserved_112),
+              ROW(parameters.pipes).is(number, "pipes", "pipes, as the kernel keeps them"),
+              ROW(parameters.subtype)
+                  .is(enumeration, "subtype", "kind of flow switch")
+                  .of(flow_switch_subtypes)
+                  .where(type, nexus_types.number("flow-switch")),
+              ROW(parameters.mhints).is(number, "mhints", "memory hints"),
+              ROW(parameters.ifindex).is(number, "ifindex", "index of the interface"),
+              ROW(parameters.reserved_132),
+              ROW(instance_count).is(number, "instances", "instances that follow"), ROW(reserved_260));
 }();
 inline constexpr follower provider_followers[] = {
     {"instances", row_at(provider_rows, "instance_count"), &instance_description}};

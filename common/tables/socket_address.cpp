@@ -93,6 +93,18 @@ char *ipv6_address::append_to(char *to) const {
   return to;
 }
 
+bool ipv6_address::may_embed_scope() const {
+  if (bytes[0] == 0xfe) return (bytes[1] & 0xc0) == 0x80;
+  const unsigned scope = bytes[1] & 0x0f;
+  return bytes[0] == 0xff && (scope == 1 || scope == 2);
+}
+
+ipv6_address ipv6_address::without_scope() const {
+  ipv6_address plain = *this;
+  if (may_embed_scope()) plain.bytes[2] = plain.bytes[3] = 0;
+  return plain;
+}
+
 format::small_text<18> link_layer_address_text(const std::uint8_t (&address)[6]) {
   const auto byte = [&address](std::size_t i) { return static_cast<unsigned>(address[i]); };
   return format::text_of<"%02x:%02x:%02x:%02x:%02x:%02x", 18>(byte(0), byte(1), byte(2), byte(3), byte(4),

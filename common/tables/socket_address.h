@@ -28,6 +28,14 @@ struct ipv6_address {
 
   static constexpr std::size_t text_size = 45;
   char *append_to(char *to) const;
+
+  // Whether the kernel embeds a scope in bytes 2 and 3 of such an address, most significant byte first; 0:
+  // none.
+  bool may_embed_scope() const;
+  unsigned embedded_scope() const {
+    return may_embed_scope() ? static_cast<unsigned>(bytes[2] << 8 | bytes[3]) : 0;
+  }
+  ipv6_address without_scope() const;
 };
 
 // The six bytes of a link layer's address as "02:00:5e:10:00:01".

@@ -35,12 +35,6 @@ character first_character(std::span<const char> text) {
   return code < smallest[size] || is_surrogate || code > 0x10ffff ? stray : character{code, size};
 }
 
-bool is_hidden(char32_t code) {
-  return code < 0x20 || (code >= 0x7f && code < 0xa0) ||  // C0, DEL, C1
-         (code >= 0x2028 && code <= 0x202e) ||            // separators, embeddings and overrides
-         (code >= 0x2066 && code <= 0x2069);              // isolates
-}
-
 guard ask_for_guard() {
   const locale_t locale = newlocale(LC_CTYPE_MASK, "", nullptr);
   if (!locale) return guard::bytes;
@@ -50,6 +44,12 @@ guard ask_for_guard() {
 }
 
 }  // namespace
+
+bool is_hidden(char32_t code) {
+  return code < 0x20 || (code >= 0x7f && code < 0xa0) ||  // C0, DEL, C1
+         (code >= 0x2028 && code <= 0x202e) ||            // separators, embeddings and overrides
+         (code >= 0x2066 && code <= 0x2069);              // isolates
+}
 
 guard terminal_guard() {
   static const guard answer = ask_for_guard();

@@ -11,9 +11,9 @@ namespace {
 
 constexpr const char *types[] = {"u8",  "u16",  "net16", "u32",   "u64",   "i32",
                                  "i64", "text", "uuid",  "bytes", "record"};
-constexpr const char *kinds[] = {"unread", "identifier",  "number", "gauge",   "counter",
-                                 "flags",  "enumeration", "pid",    "process", "interface",
-                                 "name",   "address",     "mac",    "nested"};
+constexpr const char *kinds[] = {"unread",    "identifier",  "number",  "gauge", "counter",
+                                 "flags",     "enumeration", "boolean", "pid",   "process",
+                                 "interface", "name",        "address", "mac",   "nested"};
 
 static_assert(std::size(types) == static_cast<std::size_t>(field_type::record) + 1);
 static_assert(std::size(kinds) == static_cast<std::size_t>(field_kind::nested) + 1);
