@@ -202,7 +202,7 @@ class Replay(CaptureCase):
             self.assertEqual(seen.out, f"tarvellab: {self.directory}/{name}/proc/?: no part of a capture\n")
 
 
-KEPT = "identifier", "number", "gauge", "counter", "flags", "enumeration", "pid"
+KEPT = "identifier", "number", "gauge", "counter", "flags", "enumeration", "boolean", "pid"
 WORDS = {"process": {b"process"}, "name": {b"provider", b"arena", b"region"}, "interface": {b"en", b"bridge"}}
 # Fields of tables, and what they hold, each with what stands in its place.
 SUBSTITUTES = """
