@@ -135,7 +135,7 @@ bool parse(const command &row, char **argument, options &asked) {
   }
   // The kinds lie in their order.
   std::ranges::sort(asked.kinds);
-  asked.kinds.erase(std::ranges::unique(asked.kinds).begin(), asked.kinds.end());
+  asked.kinds.erase(std::unique(asked.kinds.begin(), asked.kinds.end()), asked.kinds.end());
   return fits_together(asked);
 }
 
