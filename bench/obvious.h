@@ -68,8 +68,7 @@ struct channel {
   uint32_t flags;
   int32_t pid, fd;
   uint32_t port, tx_rings, rx_rings;
-  uint8_t unread[8];
-  struct ring rings[];
+  uint8_t unread[8];  // then the rings
 };
 
 static inline size_t channel_size(const struct channel *channel) {

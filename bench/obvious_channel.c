@@ -68,7 +68,7 @@ static void print_channel(const char *root, const struct channel *channel) {
     print_header();
     has_header = 1;
   }
-  const struct ring *ring = channel->rings;
+  const struct ring *ring = (const struct ring *)(channel + 1);
   for (uint32_t i = 0; i < channel->tx_rings; i++) print_ring("TX", ring++);
   for (uint32_t i = 0; i < channel->rx_rings; i++) print_ring("RX", ring++);
   printf("\n");

@@ -209,8 +209,7 @@ value_step::writer writer_of(const key &of, value_step::writer usual) {
 }  // namespace
 
 char *put_plain(char *to, std::string_view text) {
-  std::memcpy(to, text.data(), text.size());
-  return to + text.size();
+  return std::copy(text.begin(), text.end(), to);
 }
 
 value_step step_of(const key &of, process_texts &processes) {
