@@ -31,7 +31,8 @@ class Kernels(LabCase):
             self.check(kernel)
             with self.subTest(options):
                 self.assertEqual(hashlib.sha256(repr(made).encode()).hexdigest()[:16], expected)
-        self.assertEqual(files(self.simulated("--seed 7", 0).root), files(generate(self.directory / "k", "--seed", 7).root))
+        made = generate(self.directory / "made", "--seed", 7)
+        self.assertEqual(files(self.simulated("--seed 7", 0).root), files(made.root))
 
     def test_NothingStandsOrMovesOnNothing(self):
         for size in "providers", "nexuses", "channels", "processes", "flows":
@@ -49,14 +50,15 @@ class Kernels(LabCase):
         self.assertLessEqual(kernel.pids() - {0}, {int(path.parent.name) for path in kernel.root.glob("proc/*/comm")})
 
     def test_WrongWordsAreUsageErrors(self):
-        wrong = """nothing|run|run --|run a b -- true|generate ''|generate a --|generate a --flows -1|generate a --flows 1x
+        wrong = """
+nothing|run|run --|run a b -- true|generate ''|generate a --|generate a --flows -1|generate a --flows 1x
 |generate a --flows 10000001|generate --seed 1|generate a --flows 99999999999|generate a --seed x
 |generate a --seed 18446744073709551616|generate a --interval 50|generate a --every 1|generate a --count 1
 |generate a --redact|generate a --incident nope|generate a --incident leak@x|generate a --incident leak@-1
-|generate a --host ''|generate a --after 86401|simulate a --after 1|simulate a --interval 9|simulate a --interval 3600001
-|simulate a --redact|capture|capture a b|capture a --host b|capture --redact|capture --every 1 a|capture --count 2 a
-|capture a --count 2 --every|capture --every 1 --count 0 a|capture --every 1 --count 10000001 a
-|capture --every 1 --count a""".replace("\n", "").split("|")
+|generate a --host ''|generate a --after 86401|simulate a --after 1|simulate a --interval 9
+|simulate a --interval 3600001|simulate a --redact|capture|capture a b|capture a --host b|capture --redact
+|capture --every 1 a|capture --count 2 a|capture a --count 2 --every|capture --every 1 --count 0 a
+|capture --every 1 --count 10000001 a|capture --every 1 --count a""".replace("\n", "").split("|")
         wrong += [f"capture a --count 2 --every {each}" for each in "0 0.009 3600.01 -1 nan inf 1e1 1s ''".split()]
         for words in wrong:
             seen = self.lab(words)
