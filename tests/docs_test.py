@@ -7,16 +7,13 @@ Tabs are shown as blanks. A simulation moves: where a command makes one, a numbe
 a page run one after the other in an empty folder and end with status 0; messages count as printed. Pages of the manual
 see the lab's kernel, and nothing is run of a block from where root, "# ", has the word.
 """
+import contextlib
 import os
-import pathlib
 import re
 import signal
-import subprocess
-import tempfile
-import time
-import unittest
 
-from runs import build, tarvellab, top
+from records import Kernel
+from runs import Case, build, generate, top, wait_for
 
 pages = [top / "README.md", top / "CONTRIBUTING.md", *sorted((top / "docs").glob("*.*"))]
 number = r" *\b\d+(?:\.\d+)?[KMGT]?B?\b"
@@ -42,47 +39,45 @@ def pattern(shown, moves):
     return re.compile(first + middle + (skip + others[-1] if others else ""))
 
 
-class Docs(unittest.TestCase):
-    def run_command(self, command, folder, env, expected=None):
+class Docs(Case):
+    def run_command(self, command, kernel, folder, expected=None):
         """What the command prints. If that is expected of it, it is interrupted when it has printed so much."""
         def printed():
-            return re.sub(" +$", "", (folder / "out").read_text().expandtabs(), flags=re.M)
+            return re.sub(" +$", "", run.out.expandtabs(), flags=re.M)
 
-        with open(folder / "out", "w") as out:
-            process = subprocess.Popen(["bash", "-c", command], cwd=folder / "cwd", env=env, stdin=subprocess.DEVNULL,
-                                       stdout=out, stderr=out)
-        self.addCleanup(process.kill)
+        run = self.start(["-c", command], "/bin/bash", kernel, merged=True, cwd=folder / "cwd",
+                         environment={"LC_ALL": "C.UTF-8"})
         if expected:
-            end = time.monotonic() + 30
-            while not expected.fullmatch(printed()) and time.monotonic() < end:
-                time.sleep(0.1)
-            process.send_signal(signal.SIGINT)
-        self.assertEqual(process.wait(30), 0, printed())
+            with contextlib.suppress(AssertionError):  # whatever it prints is looked at below
+                wait_for(lambda: expected.fullmatch(printed()), 30)
+        self.assertEqual(run.end(signal.SIGINT if expected else None).status, 0, printed())
         return printed()
 
-    def check_page(self, page, folder):
+    def check_page(self, page):
+        kernel = Kernel(self.directory / page.name / "kernel")
+        folder = kernel.root.parent
         for name in "cwd", "tmp":
-            (folder / name).mkdir()
-        env = {**os.environ, "PATH": f"{build}:{os.environ['PATH']}", "TMPDIR": f"{folder}/tmp", "LC_ALL": "C.UTF-8"}
-        env.pop("TARVEL_ROOT", None)
-        if page.suffix != ".md":
-            subprocess.run([tarvellab, "generate", folder / "kernel"], check=True)
-            env["TARVEL_ROOT"] = str(folder / "kernel")
+            (folder / name).mkdir(parents=True)
+        kernel.environment |= {"PATH": f"{build}:{os.environ['PATH']}", "TMPDIR": f"{folder}/tmp"}
+        if page.suffix == ".md":
+            kernel.environment.pop("TARVEL_ROOT")
+        else:
+            generate(kernel.root)
         for command, shown in commands(page):
             if export := re.fullmatch(r"(?:export )?(\w+)=([\w/]+)", command):
-                env[export[1]] = export[2]
+                kernel.environment[export[1]] = export[2]
                 continue
             with self.subTest(page=page.name, command=command):
                 endless = shown.endswith("^C\n")
                 expected = pattern(shown.removesuffix("^C\n"), "tarvellab run -" in command)
-                printed = self.run_command(command, folder, env, expected if endless else None)
+                printed = self.run_command(command, kernel, folder, expected if endless else None)
                 self.assertTrue(expected.fullmatch(printed), "It prints:\n" + printed[:20000])
         self.assertEqual(list((folder / "tmp").iterdir()), [])
 
     def test_CommandsPrintWhatThePagesShow(self):
         self.assertTrue([*commands(top / "README.md")])
         for page in pages:
-            self.check_page(page, pathlib.Path(self.enterContext(tempfile.TemporaryDirectory())))
+            self.check_page(page)
 
     def test_LinksLeadSomewhere(self):
         for page in pages:

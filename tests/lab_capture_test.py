@@ -5,10 +5,9 @@ import shutil
 import signal
 import time
 
-from records import RECORDS, TABLES, Kernel, make, walk
-from runs import LabCase, files, generate, limit_files, preloaded, remove, tarvellab, top, wait_for
+from records import NODES, RECORDS, TABLES, Kernel, make, walk
+from runs import LabCase, files, generate, hidden, limit_files, preloaded, remove, tarvellab, top, wait_for
 
-NODES = "proc/sys/kern/tarvel/"
 FLOW, NAME = NODES + "stats/flow", "proc/94/comm"
 DATE = "%Y-%m-%dT%H:%M:%SZ"
 HOST = os.uname().nodename
@@ -127,7 +126,7 @@ class Capture(CaptureCase):
             seen, count = run.end(), len(self.moments()) + 1
             self.assertEqual(seen[::2], (COUNTS.format(count, 1000, 12 * count, 12 * count, 0, 0), 1))
             self.assertRegex(seen.err, f"^{NOTE}{err}$")
-            self.assertEqual([path for path in files(self.saved.root) if "/." in path], [])
+            self.assertEqual(hidden(self.saved.root), [])
             shutil.rmtree(self.saved.root)
 
 

@@ -10,10 +10,9 @@ import shlex
 import shutil
 import signal
 
-from records import TABLES
-from runs import LabCase, files, generate, limit_files, preloaded, remove, tarvellab, wait_for
+from records import NODES, TABLES
+from runs import LabCase, files, generate, hidden, limit_files, preloaded, remove, tarvellab, wait_for
 
-NODES = "proc/sys/kern/tarvel/"
 # Options of kernels, how many intervals they have moved, and a digest of all their files. On every machine and with
 # every compiler it is the same; a change of the simulated world renews it.
 DIGESTS = (("", 90, "161d6e404628d8e7"), ("--stacks 0 --arenas 0 --namespaces 0", 0, "547c0a3f9895bffd"),
@@ -24,25 +23,16 @@ DIGESTS = (("", 90, "161d6e404628d8e7"), ("--stacks 0 --arenas 0 --namespaces 0"
            ("--channels 400 --nexuses 60 --processes 1", 2, "82afa6ef2e0ef613"))
 
 
-def hidden(root):
-    return [path for path in files(root) if "/." in path]
-
-
 class Kernels(LabCase):
-    def simulated(self, options, intervals):
-        """The kernel so many intervals later, each of which comes 300 ms late."""
-        waits = preloaded("no_entropy", WAITS=str(intervals + 1), LATE="300")
-        seen = self.lab(f"simulate kernel --seed 7 {options}", environment=waits)
-        self.assertEqual(seen, ("simulating in kernel\n", "", 0))
-        return self.kernel
-
     def test_SameSeedSameKernelAndNothingOfAnother(self):
         for options, intervals, expected in DIGESTS:
-            made = files(self.simulated(options, intervals).root)
-            self.check(self.kernel)
+            kernel = self.simulated(f"--seed 7 {options}", intervals, late=300)
+            made = files(kernel.root)
+            self.check(kernel)
             with self.subTest(options):
                 self.assertEqual(hashlib.sha256(repr(made).encode()).hexdigest()[:16], expected)
-        self.assertEqual(files(self.simulated("", 0).root), files(generate(self.directory / "k", "--seed", 7).root))
+        made = generate(self.directory / "made", "--seed", 7)
+        self.assertEqual(files(self.simulated("--seed 7", 0).root), files(made.root))
 
     def test_NothingStandsOrMovesOnNothing(self):
         for size in "providers", "nexuses", "channels", "processes", "flows":
@@ -61,11 +51,12 @@ class Kernels(LabCase):
 
     def test_WrongWordsAreUsageErrors(self):
         wrong = """
-|nothing|run|run --|run a --flows 1 -- true|run a b -- true|generate|generate a b|generate ''|generate a --
-|generate a --flows|generate a --flows -1|generate a --flows 1x|generate a --flows 10000001|generate --seed 1
-|generate a --flows 99999999999|generate a --seed x|generate a --seed 18446744073709551616|generate a --rings 1025
-|generate a --interval 50|generate a --every 1|generate a --count 1|generate a --redact|simulate a --interval 9
-|simulate a --interval 3600001|simulate a --redact|capture|capture a b|capture a --seed 1|capture --redact
+nothing|run|run --|run a b -- true|generate ''|generate a --|generate a --flows -1|generate a --flows 1x
+|generate a --flows 10000001|generate --seed 1|generate a --flows 99999999999|generate a --seed x
+|generate a --seed 18446744073709551616|generate a --interval 50|generate a --every 1|generate a --count 1
+|generate a --redact|generate a --incident nope|generate a --incident leak@x|generate a --incident leak@-1
+|generate a --host ''|generate a --after 86401|simulate a --after 1|simulate a --interval 9
+|simulate a --interval 3600001|simulate a --redact|capture|capture a b|capture a --host b|capture --redact
 |capture --every 1 a|capture --count 2 a|capture a --count 2 --every|capture --every 1 --count 0 a
 |capture --every 1 --count 10000001 a|capture --every 1 --count a""".replace("\n", "").split("|")
         wrong += [f"capture a --count 2 --every {each}" for each in "0 0.009 3600.01 -1 nan inf 1e1 1s ''".split()]
@@ -183,7 +174,7 @@ class Run(LabCase):
 
     def run_lab(self, *words, program=tarvellab, **options):
         options["environment"] = {"TMPDIR": str(self.temporary), **options.get("environment", {})}
-        return self.start(["run", *words], program, **{"cwd": self.directory, **options})
+        return self.start(["run", *words], program, **options)
 
     def wait_until_nothing_is_left(self):
         mark = f"TMPDIR={self.temporary}"

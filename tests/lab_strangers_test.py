@@ -6,10 +6,9 @@ import signal
 import subprocess
 import unittest
 
-from records import Kernel, make
+from records import NODES, Kernel, make
 from runs import LabCase, files, generate, tarvellab
 
-NODES = "proc/sys/kern/tarvel/"
 STRANGER = 65534
 MAKING = "generate {}", "simulate {}", "run {} -- true"
 ALL = *MAKING, "capture {}", "capture --redact {}"

@@ -1,7 +1,7 @@
 """provider, also called list-providers."""
 
 from records import make
-from runs import Case, text
+from runs import Case
 
 LIST = "nexus_provider_list"
 ID, INSTANCE = "FEDCBA98-7654-3210-0123-456789ABCDEF", "01000000-0000-0000-0000-00000000000A"
@@ -31,10 +31,3 @@ class Provider(Case):
         self.expect(table, ("provider", "provider -- -D"), "".join(listing))
         detailed = "provider -D", "provider -DD", "provider --d", "provider x -D", "LIST-PROVIDERS --details"
         self.expect(table, detailed, "".join(row.replace("\n", "\n" + RINGS, 1) for row in listing))
-
-    def test_CharactersAreThoseOfTheLocaleIfThereIsOne(self):
-        name = "\u00c4nd gr\u00f6\u00dfe\u20ac\033[31m\u202e".encode()
-        by_byte = text(b"\xc3?nd gr\xc3\xb6\xc3?e\xe2?\xac?[31m\xe2?\xae")
-        for locale, shown in ("C.UTF-8", "\u00c4nd gr\u00f6\u00dfe\u20ac?[31m???"), ("no_WHERE.UTF-8", by_byte):
-            self.expect({LIST: provider(name, len(name))}, "provider", f"user-pipe {shown} {ID}\n", to="terminal",
-                        environment={"LC_ALL": locale})

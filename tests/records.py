@@ -10,6 +10,7 @@ import pathlib
 import subprocess
 import uuid
 
+NODES = "proc/sys/kern/tarvel/"  # below the root of a kernel
 TABLES, RECORDS = {}, {}  # by name: the record that a table is a sequence of, and what is known of a record
 
 
@@ -116,7 +117,7 @@ class Kernel:
         self.environment = {**os.environ, "TARVEL_ROOT": str(root)}
 
     def path(self, table):
-        return self.root / "proc/sys/kern/tarvel" / table
+        return self.root / NODES / table
 
     def table(self, name):
         return self.path(name).read_bytes()
@@ -136,9 +137,6 @@ class Kernel:
 
     def records(self, name):
         return walk(TABLES[name], self.table(name))
-
-    def channels(self):
-        return [channel for group in self.records("nexus_channel_list") for channel in group["channels"]]
 
     def pids(self):
         records = (record for name in TABLES for record in self.records(name))

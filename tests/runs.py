@@ -119,6 +119,10 @@ def files(root):
     return {str(p.relative_to(root)): p.read_bytes() for p in sorted(pathlib.Path(root).rglob("*")) if p.is_file()}
 
 
+def hidden(root):
+    return [path for path in files(root) if "/." in path]
+
+
 def remove(path):
     """Whatever it is. What a link leads to stays."""
     shutil.rmtree(path) if path.is_dir() and not path.is_symlink() else path.unlink()
@@ -200,8 +204,14 @@ class Case(unittest.TestCase):
 
 
 class LabCase(Case):
-    """The lab, which sees `self.kernel` as its kernel, and stands in the folder of the test unless told otherwise."""
+    """The lab, which sees `self.kernel` as its kernel."""
 
     def lab(self, line, **options):
         """What a run of it leaves behind."""
-        return self.start(line, tarvellab, **{"cwd": self.directory, **options}).end()
+        return self.start(line, tarvellab, **options).end()
+
+    def simulated(self, options, intervals, late=0):
+        """The kernel so many intervals later, each of which comes so many ms late."""
+        waits = preloaded("no_entropy", WAITS=str(intervals + 1), LATE=str(late))
+        self.assertEqual(self.lab(f"simulate kernel {options}", environment=waits), ("simulating in kernel\n", "", 0))
+        return self.kernel

@@ -2,13 +2,9 @@
 
 #include "common/changes.h"
 
-#include <filesystem>
-
 #include "tests/units/units.h"
 
 namespace {
-
-namespace fs = std::filesystem;
 
 constexpr std::int64_t second = 1'000'000'000;
 
@@ -34,25 +30,17 @@ record channel(const char *id, std::uint32_t tx, std::uint32_t rx) {
   return record(48).put(0, id).put(32, tx, 4).put(36, rx, 4);
 }
 
-class changes : public testing::Test {
+class changes : public kernel_files {
  protected:
-  changes() { setenv("TARVEL_ROOT", mkdtemp(root.data()), 1); }
-  ~changes() override {
-    unsetenv("TARVEL_ROOT");
-    fs::remove_all(root);
-  }
-
-  void put(std::string node, const std::string &content) const {
+  void put_table(std::string node, const std::string &content) const {
     std::ranges::replace(node, '.', '/');
-    const fs::path path = root + "/proc/sys/" + node;
-    fs::create_directories(path.parent_path());
-    std::ofstream(path) << content;
+    put("sys/" + node, content);
   }
 
   // What became of the records of a table, which is read at this time: what each is, of which part of which
   // record, its fate, what its counters counted, if anything, how many have no difference, and a rate.
   std::string next(const char *node, const std::string &content, std::int64_t at = 0) {
-    put(node, content);
+    put_table(node, content);
     const table_description *const wanted[] = {
         std::ranges::find(all_tables, std::string_view(node), &table_description::node)};
     moment now = read_moment(wanted);
@@ -76,7 +64,6 @@ class changes : public testing::Test {
   }
   std::string flows(const std::string &content, std::int64_t at = 0) { return next(flow_node, content, at); }
 
-  std::string root = "/tmp/tarvelctl-test-XXXXXX";
   earlier_moment kept;
   std::string last;  // record visited
 };
@@ -236,8 +223,8 @@ TEST_F(changes, WhatIsNotReadIsNotGone) {
 TEST_F(changes, AMomentSaysWhatCouldNotBeReadAndWhen) {
   const capture said(diagnostics);
   const std::int64_t before = time(nullptr) * second;
-  put(flow_node, flow(1));
-  put(ring_stat_enable_node, "123");
+  put_table(flow_node, flow(1));
+  put_table(ring_stat_enable_node, "123");
   const moment now = read_moment();
   EXPECT_EQ(said.text() + now.host, "");
   EXPECT_EQ(now.tables.size(), std::size(all_tables));
@@ -250,7 +237,7 @@ TEST_F(changes, AMomentSaysWhatCouldNotBeReadAndWhen) {
   const std::string longest(256, 'h');
   for (const auto &[host, told] :
        {std::pair{"a\33b\nc"s, "a\33b"s}, {"b\0c"s, "b"}, {longest, longest}, {longest + "h", ""}}) {
-    put("kernel.hostname", host);
+    put("sys/kernel/hostname", host);
     EXPECT_EQ(read_moment({}).host, told);
   }
   EXPECT_EQ(read_moment({}).find(table_of(flow_node)), nullptr);

@@ -115,15 +115,6 @@ TEST(output, AbandonedItGoesOnUpToItsLastWholeLine) {
   EXPECT_TRUE(writes.empty());
 }
 
-TEST(output, AbandonedItSaysWhatKeptItFromWriting) {
-  for (const auto &[outcome, told] : {std::pair{ENOSPC, ENOSPC}, {-0, EIO}, {EPIPE, 0}}) {
-    const capture captured(report);
-    print<"line\n">();
-    writes = {outcome};
-    EXPECT_EQ(report.abandon(), told);
-  }
-}
-
 // In the middle of a flush that reaches beyond the last whole line, there is nothing to add.
 TEST(output, AbandonedInAFlushOfHalfALineWritesNothing) {
   const capture captured(report);

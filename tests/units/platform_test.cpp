@@ -7,7 +7,6 @@
 #include "common/channel_snapshot.h"
 #include "common/text/output_helpers.h"
 #include "platform/root.h"
-#include "platform/sysctl.h"
 #include "tests/units/units.h"
 
 // Files of the live kernel that fail or are long, under names of variables, and a machine without /proc.

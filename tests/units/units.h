@@ -53,7 +53,7 @@ class kernel_files : public testing::Test {
  protected:
   kernel_files() { setenv("TARVEL_ROOT", mkdtemp(root.data()), 1); }
   ~kernel_files() override {
-    EXPECT_EQ(count_descriptors(), before);
+    EXPECT_EQ(count_descriptors(), descriptors);
     unsetenv("TARVEL_ROOT");
     fs::remove_all(root);
   }
@@ -61,7 +61,7 @@ class kernel_files : public testing::Test {
     fs::create_directories(fs::path(root + "/proc/" + path).parent_path());
     std::ofstream(root + "/proc/" + path) << text;
   }
-  const std::ptrdiff_t before = count_descriptors();
+  const std::ptrdiff_t descriptors = count_descriptors();
   std::string root = "/tmp/tarvelctl-test-XXXXXX";
 };
 
